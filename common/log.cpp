@@ -1,0 +1,70 @@
+#include "common/log.h"
+
+#include <syslog.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdarg>
+#include <cstdio>
+#include <system_error>
+
+namespace quivra {
+
+namespace fileindex {
+std::int32_t log_level = kLogLevelDebug;
+}
+
+namespace {
+
+std::string Format(const char* format, va_list arguments) {
+    va_list measured;
+    va_copy(measured, arguments);
+    const int length = std::vsnprintf(nullptr, 0, format, measured);
+    va_end(measured);
+    if (length <= 0) {
+        return std::string();
+    }
+    std::string text(static_cast<std::size_t>(length), '\0');
+    std::vsnprintf(text.data(), text.size() + 1, format, arguments);
+    return text;
+}
+
+}  // namespace
+
+void LogError(LogSite site, const char* format, ...) {
+    const int saved_errno = errno;
+    va_list arguments;
+    va_start(arguments, format);
+    const std::string text = Format(format, arguments);
+    va_end(arguments);
+    const std::string tail =
+        saved_errno == 0 ? std::string() : " [err: " + SystemErrorText(saved_errno) + "]";
+    syslog(LOG_ERR, "%s:%d (%d, %u) %s%s", site.unit, site.line, getpid(), geteuid(), text.c_str(),
+           tail.c_str());
+    errno = 0;
+}
+
+void LogTrace(LogSite site, const char* format, ...) {
+    const int saved_errno = errno;
+    va_list arguments;
+    va_start(arguments, format);
+    const std::string text = Format(format, arguments);
+    va_end(arguments);
+    syslog(LOG_ERR, "%s:%d %s", site.unit, site.line, text.c_str());
+    errno = saved_errno;
+}
+
+void LogFailure(LogSite site, const char* condition, const std::string& reason) {
+    LogError(site, "Failed [%s], reason: %s", condition, reason.c_str());
+}
+
+void Fail(LogSite site, const char* condition, const Error& error) {
+    LogFailure(site, condition, error.reason);
+    throw error;
+}
+
+std::string SystemErrorText(int error_number) {
+    return std::generic_category().message(error_number);
+}
+
+}  // namespace quivra

@@ -1,0 +1,36 @@
+#pragma once
+
+#include <json/json.h>
+
+#include <string>
+
+/// What kind of consumer a monitor registration belongs to.
+enum MonitorQueueType {
+    MONITOR_QUEUE_TYPE_APPLICATION = 1,
+};
+
+namespace KESTO {
+namespace KESTOTIFYD {
+
+/// A registration with the file monitor: which folders' changes go to which queue file. The
+/// description is {"queue": PATH, "config": {"path": [FULL PATH...], "mask": 65478,
+/// "ignore": ["@eaDir"]}}.
+class MonitorQueue {
+  public:
+    explicit MonitorQueue(const Json::Value& description);
+    const Json::Value& Description() const;
+
+    /// Adds the registration or replaces the one of the same queue and application. False on
+    /// failure, with errno telling why.
+    static bool Upsert(const MonitorQueue& queue, const std::string& app, MonitorQueueType type);
+
+    /// Removes a registration; one that does not exist is removed successfully.
+    static bool Delete(const std::string& queue_path, const std::string& app,
+                       MonitorQueueType type);
+
+  private:
+    Json::Value description_;
+};
+
+}  // namespace KESTOTIFYD
+}  // namespace KESTO

@@ -1,0 +1,35 @@
+#include <kesto/error.h>
+
+#include "platform/standalone/error_state.h"
+
+namespace kesto {
+namespace {
+
+struct ErrorState {
+    int code = 0;
+    const char* file = "";
+    int line = 0;
+};
+
+thread_local ErrorState last_error;
+
+}  // namespace
+
+int SetError(int code, const char* file, int line) {
+    last_error = {code, file, line};
+    return -1;
+}
+
+}  // namespace kesto
+
+int KLIBCErrGet() {
+    return kesto::last_error.code;
+}
+
+const char* KLIBCErrorGetFile() {
+    return kesto::last_error.file;
+}
+
+int KLIBCErrorGetLine() {
+    return kesto::last_error.line;
+}
