@@ -1,6 +1,8 @@
 # libfileindex.so: the product. Its sources are added by the folders that hold them.
 set_target_properties(fileindex PROPERTIES VERSION ${PROJECT_VERSION} SOVERSION
                                            ${PROJECT_VERSION_MAJOR})
+target_include_directories(fileindex INTERFACE $<BUILD_INTERFACE:${PROJECT_SOURCE_DIR}>
+                                               $<INSTALL_INTERFACE:include/quivra>)
 target_link_libraries(fileindex PUBLIC PkgConfig::JSONCPP kesto::interface
                       PRIVATE kestoplatform Threads::Threads)
 add_library(quivra::fileindex ALIAS fileindex)
