@@ -1,0 +1,40 @@
+# "cpack" (generator DEB) makes one Debian package a component.
+set(FILEINDEX_PACKAGE_library libfileindex${PROJECT_VERSION_MAJOR})
+set(FILEINDEX_PACKAGE_development libfileindex-dev)
+set(FILEINDEX_PACKAGE_programs fileindex)
+add_subdirectory(packaging)
+
+set(CPACK_GENERATOR DEB)
+set(CPACK_PACKAGE_NAME fileindex)
+set(CPACK_PACKAGE_VENDOR "The libfileindex authors")
+set(CPACK_PACKAGE_CONTACT "The libfileindex authors <fileindex@localhost>")
+set(CPACK_PACKAGE_DESCRIPTION_SUMMARY "${PROJECT_DESCRIPTION}")
+set(CPACK_PACKAGING_INSTALL_PREFIX /usr)
+set(CPACK_COMPONENTS_ALL library development programs)
+set(CPACK_DEB_COMPONENT_INSTALL ON)
+set(CPACK_STRIP_FILES ON)
+
+set(CPACK_DEBIAN_FILE_NAME DEB-DEFAULT)
+set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS ON)
+set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS_PRIVATE_DIRS
+    ${PROJECT_BINARY_DIR} ${PROJECT_BINARY_DIR}/platform/standalone)
+set(CPACK_DEBIAN_PACKAGE_GENERATE_SHLIBS ON)
+set(CPACK_DEBIAN_ENABLE_COMPONENT_DEPENDS ON)
+set(CPACK_COMPONENT_DEVELOPMENT_DEPENDS library)
+set(CPACK_COMPONENT_PROGRAMS_DEPENDS library)
+
+foreach(component library development programs)
+    string(TOUPPER ${component} key)
+    set(CPACK_DEBIAN_${key}_PACKAGE_NAME ${FILEINDEX_PACKAGE_${component}})
+endforeach()
+set(CPACK_DEBIAN_LIBRARY_PACKAGE_SECTION libs)
+set(CPACK_DEBIAN_DEVELOPMENT_PACKAGE_SECTION libdevel)
+set(CPACK_DEBIAN_DEVELOPMENT_PACKAGE_DEPENDS libjsoncpp-dev)
+set(CPACK_DEBIAN_PROGRAMS_PACKAGE_SECTION utils)
+set(CPACK_COMPONENT_LIBRARY_DESCRIPTION "File indexing: the library and its platform")
+set(CPACK_COMPONENT_DEVELOPMENT_DESCRIPTION "File indexing: headers and build files")
+set(CPACK_COMPONENT_PROGRAMS_DESCRIPTION "File indexing: the daemons and the front end")
+set(CPACK_DEBIAN_PROGRAMS_PACKAGE_CONTROL_EXTRA
+    ${PROJECT_SOURCE_DIR}/packaging/debian/postinst ${PROJECT_SOURCE_DIR}/packaging/debian/prerm
+    ${PROJECT_SOURCE_DIR}/packaging/debian/postrm ${PROJECT_SOURCE_DIR}/packaging/debian/conffiles)
+include(CPack)
