@@ -1,0 +1,77 @@
+#pragma once
+
+#include <functional>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "common/export.h"
+#include "fileindex/event.h"
+#include "fileindex/op.h"
+
+namespace quivra::fileindex {
+
+/// Folds the events of one queue file into the shortest list of operations that brings the index
+/// up to date: a file that was created and modified twice is indexed once, a directory that is
+/// indexed again makes what is pending below it pointless, pending work follows a rename.
+///
+/// A tree lives for one pass: it is built, processed once and dropped. Dropping it frees all its
+/// nodes and ops, except ops that somebody kept (and their nodes up to the root, so that the path
+/// is still known). It takes no lock, reads the file only while it is built, and is not safe for
+/// concurrent use.
+class QUIVRA_EXPORT OPTree {
+  public:
+    /// Reads the queue file as BuildTree does.
+    explicit OPTree(const std::string& queue_path);
+    ~OPTree();
+    OPTree(const OPTree&) = delete;  // nodes and ops are known by their identity
+    OPTree& operator=(const OPTree&) = delete;
+
+    /// Inserts every line of the queue file. A bad line is logged and skipped. Throws Error 502
+    /// when the file cannot be opened or read.
+    void BuildTree();
+
+    /// Inserts one event, which is not kept. Throws Error 9999 when its path, or the old path of a
+    /// rename, is not a canonical absolute path.
+    void InsertEvent(const std::shared_ptr<Event>& event);
+
+    /// The node of a full path, created with its ancestors. Throws Error 9999 unless the path has
+    /// one leading "/", no doubled and no trailing one.
+    std::shared_ptr<OPNode> GetNodeByPath(const std::string& path);
+
+    /// Coalesce one incoming op with the ops that are pending on the node and, unless it was
+    /// dropped on the way, attach it. The op's kind is set by the handler. Several handlers may
+    /// take the same op in turn: it never coalesces with itself and is attached once.
+    void HandleCreate(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
+    void HandleModify(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
+    void HandleDelete(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
+    void HandleAttr(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
+    void HandleUpdateCfg(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
+    /// Also cancels everything but renames below the node.
+    void HandleReindex(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
+    /// Moves what is pending at and below the op's old path to the node's. Throws Error 9999, and
+    /// changes nothing, when the old path is not a canonical absolute path.
+    void HandleRename(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
+
+    /// Hands every surviving op to `fn`, in the order in which they were first queued; after a
+    /// queue crash, one OP_REINDEX_ALL on the root instead. Returns how many ops the queue gave,
+    /// those dropped on the way included (1 after a crash). What `fn` throws passes through.
+    int ProcessOP(const std::function<void(std::shared_ptr<OP>)>& fn);
+
+    /// Calls `fn` for every node of the subtree as it is at the start of the call, parents before
+    /// children, children in the order of their creation; `fn` may change the tree.
+    void TraverseNodeDescendant(const std::shared_ptr<OPNode>& node,
+                                const std::function<void(std::shared_ptr<OPNode>)>& fn,
+                                bool skip_self);
+
+    bool crashed = false;                  ///< the queue lost events
+    std::string queue_path;                ///< the file that the tree was built from
+    std::shared_ptr<OPNode> root;          ///< has the empty name and no parent
+    std::vector<std::shared_ptr<OP>> ops;  ///< every op ever attached, in that order
+
+  private:
+    struct Empty {};
+    OPTree(Empty, const std::string& queue_path);
+};
+
+}  // namespace quivra::fileindex
