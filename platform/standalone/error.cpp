@@ -15,8 +15,8 @@ thread_local ErrorState last_error;
 
 }  // namespace
 
-int SetError(int code, const char* file, int line) {
-    last_error = {code, file, line};
+int SetError(int code, std::source_location where) {
+    last_error = {code, where.file_name(), static_cast<int>(where.line())};
     return -1;
 }
 

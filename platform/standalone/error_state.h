@@ -1,9 +1,11 @@
 #pragma once
 
+#include <source_location>
+
 namespace kesto {
 
-/// Records the failure that <kesto/error.h> reports for this thread, and answers -1, so that a
-/// failing call reads `return SetError(code, __FILE__, __LINE__)`. `file` must be a literal.
-int SetError(int code, const char* file, int line);
+/// Records the failure that <kesto/error.h> reports for this thread, with the caller's place, and
+/// answers -1, so that a failing call reads `return SetError(code)`. Leaves errno alone.
+int SetError(int code, std::source_location where = std::source_location::current());
 
 }  // namespace kesto

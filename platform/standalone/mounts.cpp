@@ -1,0 +1,75 @@
+#include "platform/standalone/mounts.h"
+
+#include <fcntl.h>
+#include <libmount/libmount.h>
+#include <sys/stat.h>
+
+#include <memory>
+
+namespace kesto {
+namespace {
+
+constexpr const char* kMountTable = "/proc/self/mountinfo";
+
+using Table = std::unique_ptr<libmnt_table, void (*)(libmnt_table*)>;
+
+Table ReadTable() {
+    return {mnt_new_table_from_file(kMountTable), mnt_unref_table};
+}
+
+/// The mount that holds the path, from the table; null when it is not found.
+libmnt_fs* FindMount(const Table& table, const struct statx& status) {
+    libmnt_fs* found = nullptr;
+    const std::unique_ptr<libmnt_iter, void (*)(libmnt_iter*)> iterator(
+        mnt_new_iter(MNT_ITER_BACKWARD), mnt_free_iter);
+    const auto id = static_cast<int>(status.stx_mnt_id);
+    while (mnt_table_next_fs(table.get(), iterator.get(), &found) == 0) {
+        if (mnt_fs_get_id(found) == id) {
+            return found;
+        }
+    }
+    return nullptr;
+}
+
+/// Before Linux 5.8 only the table knows which paths are mount roots.
+int IsInTable(const char* path) {
+    const Table table = ReadTable();
+    if (table == nullptr) {
+        return -1;
+    }
+    // The table holds resolved paths.
+    const std::unique_ptr<char, void (*)(void*)> resolved(realpath(path, nullptr), std::free);
+    return resolved == nullptr
+               ? -1
+               : mnt_table_find_target(table.get(), resolved.get(), MNT_ITER_BACKWARD) != nullptr;
+}
+
+}  // namespace
+
+int IsMountRoot(const char* path) {
+    struct statx status {};
+    if (statx(AT_FDCWD, path, AT_SYMLINK_NOFOLLOW | AT_NO_AUTOMOUNT, STATX_TYPE, &status) != 0) {
+        return -1;
+    }
+    if (S_ISLNK(status.stx_mode)) {
+        return 0;
+    }
+    if ((status.stx_attributes_mask & STATX_ATTR_MOUNT_ROOT) == 0) {
+        return IsInTable(path);
+    }
+    return (status.stx_attributes & STATX_ATTR_MOUNT_ROOT) != 0;
+}
+
+std::string FileSystemNameOf(const char* path) {
+    struct statx status {};
+    if (statx(AT_FDCWD, path, AT_NO_AUTOMOUNT, STATX_MNT_ID, &status) != 0 ||
+        (status.stx_mask & STATX_MNT_ID) == 0) {
+        return {};
+    }
+    const Table table = ReadTable();
+    libmnt_fs* mount = table == nullptr ? nullptr : FindMount(table, status);
+    const char* name = mount == nullptr ? nullptr : mnt_fs_get_fstype(mount);
+    return name == nullptr ? std::string() : name;
+}
+
+}  // namespace kesto

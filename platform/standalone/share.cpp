@@ -1,0 +1,164 @@
+#include <kesto/error.h>
+#include <kesto/filesystem.h>
+#include <kesto/share.h>
+#include <kesto/user.h>
+
+#include <algorithm>
+#include <cstring>
+#include <string>
+#include <string_view>
+
+#include "platform/standalone/error_state.h"
+#include "platform/standalone/paths.h"
+#include "platform/standalone/shares_conf.h"
+
+namespace kesto {
+namespace {
+
+/// Copies a text with its NUL into the caller's buffer.
+bool CopyText(std::string_view text, char* out, int size) {
+    if (size <= 0 || text.size() >= static_cast<std::size_t>(size)) {
+        return false;
+    }
+    std::copy(text.begin(), text.end(), out);
+    out[text.size()] = '\0';
+    return true;
+}
+
+template <std::size_t kSize>
+void CopyField(std::string_view text, char (&out)[kSize]) {
+    CopyText(text, out, static_cast<int>(kSize));  // what is too long made no share
+}
+
+/// 1 when the path is, or lies in, the directory `name` in the root of its share, 0 when not,
+/// negative when the shares cannot be read.
+int IsInShareDirectory(const char* path, const char* name) {
+    const auto shares = LoadShares();
+    if (shares == nullptr) {
+        return -1;
+    }
+    const ShareConf* share = FindShareOfPath(*shares, path);
+    return share != nullptr && IsAtOrBelow(path, share->path + "/" + name);
+}
+
+int ReadFlag(const KESTOShare* share, int KESTOShare::*field, int* flag) {
+    if (share == nullptr || flag == nullptr) {
+        return SetError(KESTO_ERR_BAD_ARGUMENT);
+    }
+    *flag = share->*field;
+    return 0;
+}
+
+/// The right that "NAME:rw NAME:ro" gives the user.
+KESTOSharePrivilege ListedPrivilege(std::string_view users, std::string_view user) {
+    while (!users.empty()) {
+        const std::size_t end = std::min(users.find_first_of(" \t,"), users.size());
+        const std::string_view entry = users.substr(0, end);
+        const std::size_t colon = entry.rfind(':');
+        if (colon != std::string_view::npos && entry.substr(0, colon) == user) {
+            const std::string_view right = entry.substr(colon + 1);
+            return right == "rw"   ? KESTO_SHARE_PRIV_WRITE
+                   : right == "ro" ? KESTO_SHARE_PRIV_READ
+                                   : KESTO_SHARE_PRIV_NONE;
+        }
+        users.remove_prefix(std::min(end + 1, users.size()));
+    }
+    return KESTO_SHARE_PRIV_NONE;
+}
+
+}  // namespace
+}  // namespace kesto
+
+using kesto::SetError;
+
+int KESTOShareGet(const char* name, KESTOShare** share) {
+    *share = nullptr;
+    const auto shares = kesto::LoadShares();
+    if (shares == nullptr) {
+        return -1;
+    }
+    const kesto::ShareConf* found = kesto::FindShare(*shares, name);
+    if (found == nullptr) {
+        return SetError(KESTO_ERR_NO_SUCH_SHARE);
+    }
+    auto* record = new KESTOShare{};
+    kesto::CopyField(found->name, record->szName);
+    kesto::CopyField(found->path, record->szPath);
+    kesto::CopyField(found->users, record->szUsers);
+    record->ftp_privilege = found->ftp_privilege;
+    record->read_only = found->read_only;
+    record->hide_unreadable = found->hide_unreadable;
+    record->encryption = found->encryption;
+    record->encrypted = found->encrypted;
+    record->recycle = found->recycle;
+    *share = record;
+    return 0;
+}
+
+void KESTOShareFree(KESTOShare* share) {
+    delete share;
+}
+
+int KESTOShareNamePathGet(const char* full_path, char* name, int name_size, char* path,
+                          int path_size) {
+    const auto shares = kesto::LoadShares();
+    if (shares == nullptr) {
+        return -1;
+    }
+    const kesto::ShareConf* share = kesto::FindShareOfPath(*shares, full_path);
+    if (share == nullptr) {
+        return SetError(KESTO_ERR_NO_SUCH_SHARE);
+    }
+    if (!kesto::CopyText(share->name, name, name_size) ||
+        !kesto::CopyText(share->path, path, path_size)) {
+        return SetError(KESTO_ERR_BUFFER_TOO_SMALL);
+    }
+    return 0;
+}
+
+int KESTOShareUserPrivGet(const char* user, const KESTOShare* share) {
+    if (share == nullptr) {
+        return SetError(KESTO_ERR_BAD_ARGUMENT);
+    }
+    const int admin = KLIBGroupIsAdminGroupMem(user, 0);
+    if (admin != 0) {
+        return admin < 0 ? admin : KESTO_SHARE_PRIV_WRITE;
+    }
+    return kesto::ListedPrivilege(share->szUsers, user);
+}
+
+int KESTOShareIsShareRecycle(const char* path) {
+    return kesto::IsInShareDirectory(path, "#recycle");
+}
+
+int KLIBFhsPathInSnapshot(const char* path, int* flag) {
+    const int is_in = kesto::IsInShareDirectory(path, "#snapshot");
+    *flag = is_in == 1;
+    return is_in < 0 ? is_in : 0;
+}
+
+int KESTOEAIsHiddenDir(const char* name) {
+    static constexpr const char* kHiddenNames[] = {"@eaDir", "#recycle", "#snapshot", "@tmp"};
+    return std::any_of(std::begin(kHiddenNames), std::end(kHiddenNames),
+                       [&](const char* hidden) { return std::strcmp(hidden, name) == 0; });
+}
+
+int KLIBShareHideUnreadableGet(const KESTOShare* share, int* flag) {
+    return kesto::ReadFlag(share, &KESTOShare::hide_unreadable, flag);
+}
+
+int KLIBShareIsEncryptionGet(const KESTOShare* share, int* flag) {
+    return kesto::ReadFlag(share, &KESTOShare::encryption, flag);
+}
+
+int KLIBShareIsEncryptedGet(const KESTOShare* share, int* flag) {
+    return kesto::ReadFlag(share, &KESTOShare::encrypted, flag);
+}
+
+int KLIBShareIsReadOnlyGet(const KESTOShare* share, int* flag) {
+    return kesto::ReadFlag(share, &KESTOShare::read_only, flag);
+}
+
+int KLIBShareRecycleStatusGet(const KESTOShare* share, int* flag) {
+    return kesto::ReadFlag(share, &KESTOShare::recycle, flag);
+}
