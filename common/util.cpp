@@ -60,6 +60,11 @@ bool StringStartWith(const std::string& s, const std::string& prefix) {
     return s.compare(0, prefix.size(), prefix) == 0;
 }
 
+bool IsPathWithin(std::string_view path, std::string_view ancestor) {
+    return path.starts_with(ancestor) &&
+           (path.size() == ancestor.size() || path[ancestor.size()] == '/');
+}
+
 std::string Basename(const std::string& path) {
     return path.substr(path.rfind('/') + 1);  // npos + 1 is 0: the whole string
 }

@@ -4,6 +4,7 @@
 
 #include <cstddef>
 #include <string>
+#include <string_view>
 
 #include "common/export.h"
 
@@ -28,6 +29,10 @@ QUIVRA_EXPORT bool IsMountPoint(const std::string& path);
 
 /// A plain prefix test: no component boundary. An empty prefix is always there.
 QUIVRA_EXPORT bool StringStartWith(const std::string& s, const std::string& prefix);
+
+/// Whether `path` is `ancestor` or lies below it: /a/b is within /a, /ab is not. Neither path ends
+/// in "/"; the empty ancestor stands for the root directory.
+QUIVRA_EXPORT bool IsPathWithin(std::string_view path, std::string_view ancestor);
 
 /// The part behind the last "/"; the whole string when there is none.
 QUIVRA_EXPORT std::string Basename(const std::string& path);

@@ -2,6 +2,7 @@
 
 #include <json/json.h>
 
+#include <cstddef>
 #include <cstdint>
 #include <functional>
 #include <memory>
@@ -81,8 +82,10 @@ struct QUIVRA_EXPORT OPNode : std::enable_shared_from_this<OPNode> {
     std::vector<std::shared_ptr<OP>> ops;           ///< in the order in which they were attached
 
   private:
+    friend class OPTree;
     class ChildIndex;
     std::unique_ptr<ChildIndex> index_;  ///< beside `children`, once these are many
+    std::size_t settled_ = 0;            ///< how many leading `ops` will never coalesce again
 };
 
 /// "Node[NAME]: " and a line end; then each of its ops on a line of its own, indented by two.

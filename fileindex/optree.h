@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstddef>
 #include <functional>
 #include <memory>
 #include <string>
@@ -10,6 +11,8 @@
 #include "fileindex/op.h"
 
 namespace quivra::fileindex {
+
+enum class Incoming;
 
 /// Folds the events of one queue file into the shortest list of operations that brings the index
 /// up to date: a file that was created and modified twice is indexed once, a directory that is
@@ -72,6 +75,28 @@ class QUIVRA_EXPORT OPTree {
   private:
     struct Empty {};
     OPTree(Empty, const std::string& queue_path);
+
+    void Insert(const Event& event);
+    /// The op of the last event once more, when no list took it: most events of a busy file add
+    /// none.
+    std::shared_ptr<OP> NewOP(const std::shared_ptr<OPNode>& node);
+    /// Sets the incoming op's kind; makes it OP_NONE when a pending op covers it.
+    void Coalesce(OPNode& node, OP& op, FileIndexOP kind, Incoming incoming);
+    /// The position of the first op on the node that can still coalesce. What comes before it is
+    /// cancelled or a rename for good, and never looked at again: a file that is saved by renaming
+    /// gathers renames.
+    static std::size_t SkipSettled(OPNode& node, const OP& incoming);
+    void Attach(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
+    template <typename Predicate>
+    static void MoveOPs(OPNode& from, const std::shared_ptr<OPNode>& to, const Predicate& moves);
+    void MoveDescendants(const std::shared_ptr<OPNode>& old_top, std::size_t old_length,
+                         const std::string& new_path, const OP& rename);
+
+    std::size_t consumed_ = 0;
+    std::shared_ptr<OP> unused_op_;
+    /// Queues name many files of one directory in a row: where the last look-up ended.
+    std::shared_ptr<OPNode> last_directory_;
+    std::string last_directory_path_;
 };
 
 }  // namespace quivra::fileindex
