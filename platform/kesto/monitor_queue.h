@@ -4,6 +4,11 @@
 
 #include <string>
 
+/// Where registrations are kept, for the monitor that carries them out: one file each, "*.json",
+/// replaced atomically, holding {"app": NAME, "type": MonitorQueueType, "queue": PATH,
+/// "config": {...}}. Other names in it are files being written.
+#define KESTO_MONITOR_DIRECTORY "/var/lib/kesto/monitor"
+
 /// What kind of consumer a monitor registration belongs to.
 enum MonitorQueueType {
     MONITOR_QUEUE_TYPE_APPLICATION = 1,
@@ -20,8 +25,9 @@ class MonitorQueue {
     explicit MonitorQueue(const Json::Value& description);
     const Json::Value& Description() const;
 
-    /// Adds the registration or replaces the one of the same queue and application. False on
-    /// failure, with errno telling why.
+    /// Adds the registration or replaces the one of the same queue and application. It is on
+    /// disk then. False on failure, with errno telling why: EINVAL for a description without
+    /// "queue" or "config".
     static bool Upsert(const MonitorQueue& queue, const std::string& app, MonitorQueueType type);
 
     /// Removes a registration; one that does not exist is removed successfully.

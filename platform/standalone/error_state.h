@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cerrno>
 #include <source_location>
 
 namespace kesto {
@@ -7,5 +8,18 @@ namespace kesto {
 /// Records the failure that <kesto/error.h> reports for this thread, with the caller's place, and
 /// answers -1, so that a failing call reads `return SetError(code)`. Leaves errno alone.
 int SetError(int code, std::source_location where = std::source_location::current());
+
+/// Gives errno its old value back at the end of a scope: a call that succeeds must not leave the
+/// errno of a try that did not matter, which would turn up in the caller's next log line.
+class KeepErrno {
+  public:
+    KeepErrno() = default;
+    ~KeepErrno() { errno = saved_; }
+    KeepErrno(const KeepErrno&) = delete;
+    KeepErrno& operator=(const KeepErrno&) = delete;
+
+  private:
+    const int saved_ = errno;
+};
 
 }  // namespace kesto

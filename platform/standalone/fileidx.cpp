@@ -82,11 +82,10 @@ int Compose(const char* share_path, const char* name, char* out, int out_size) {
     if (out_size <= 0 || path.size() >= static_cast<std::size_t>(out_size)) {
         return SetError(KESTO_ERR_BUFFER_TOO_SMALL);
     }
-    const int saved_errno = errno;
+    const KeepErrno keep_errno;
     if (PrepareDirectory(share_path) == Place::kUnsafe) {
         return SetError(KESTO_ERR_UNSAFE_PLACE);
     }
-    errno = saved_errno;
     path.copy(out, path.size());
     out[path.size()] = '\0';
     return 0;

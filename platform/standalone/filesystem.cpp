@@ -38,6 +38,7 @@ int KESTOACLPermGet(const char* path) {
     if (faccessat(AT_FDCWD, path, F_OK, AT_EACCESS) != 0) {
         return kesto::SetError(KESTO_ERR_SYSTEM);
     }
+    const kesto::KeepErrno keep_errno;
     // The kernel weighs POSIX ACLs, capabilities and read-only mounts in.
     int mask = 0;
     mask |= faccessat(AT_FDCWD, path, R_OK, AT_EACCESS) == 0 ? KESTO_ACL_PERM_READ : 0;

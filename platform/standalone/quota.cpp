@@ -18,6 +18,7 @@ constexpr unsigned long long kQuotaBlock = 1024;
 /// Whether the effective user's quota on the file system leaves that much. It does where no quota
 /// is set or none can be asked for (a kernel before 5.14 included).
 bool IsWithinQuota(int fd, unsigned long long bytes) {
+    const KeepErrno keep_errno;
     dqblk quota{};
     if (syscall(SYS_quotactl_fd, fd, QCMD(Q_GETQUOTA, USRQUOTA), geteuid(), &quota) != 0) {
         return true;

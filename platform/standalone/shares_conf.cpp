@@ -258,14 +258,17 @@ std::shared_ptr<const ShareList> LoadShares() {
         return cache.shares;
     }
     cache.state.reset();
+    const int saved_errno = errno;
     errno = 0;
     std::shared_ptr<const ShareList> shares = ReadShares(cache);
     if (shares == nullptr && (errno == ENOENT || errno == ENOTDIR)) {
-        return std::make_shared<const ShareList>();
+        shares = std::make_shared<const ShareList>();
     }
     if (shares == nullptr) {
         syslog(LOG_ERR, "%s cannot be read: %s", kSharesPath, std::strerror(errno));
         SetError(KESTO_ERR_SYSTEM);
+    } else {
+        errno = saved_errno;
     }
     return shares;
 }

@@ -13,9 +13,10 @@ namespace {
 constexpr std::size_t kMaxEntrySize = 16U << 20;  // a group of very many members
 
 /// Calls one of the getpw*_r and getgr*_r functions with a buffer that grows until the entry fits,
-/// and gives `use` the entry. False with errno set when there is none (0) or the lookup failed.
+/// and gives `use` the entry. False when there is none or, with errno set, when the lookup failed.
 template <typename Entry, typename Lookup, typename Use>
 bool WithEntry(const Lookup& lookup, const Use& use) {
+    const int saved_errno = errno;
     std::vector<char> buffer(1024);
     while (true) {
         Entry entry{};
@@ -24,7 +25,7 @@ bool WithEntry(const Lookup& lookup, const Use& use) {
         if (error == ERANGE && buffer.size() < kMaxEntrySize) {
             buffer.resize(buffer.size() * 2);
         } else if (error != EINTR) {
-            errno = error;
+            errno = error != 0 ? error : saved_errno;
             if (found != nullptr) {
                 use(*found);
             }

@@ -1,0 +1,24 @@
+#include <kesto/process.h>
+
+#include <cstdarg>
+
+#include "platform/standalone/run_program.h"
+
+int KLIBCExecl(const char* program, int flags, ...) {
+    std::vector<std::string> arguments;
+    va_list list;
+    va_start(list, flags);
+    while (const char* argument = va_arg(list, const char*)) {
+        arguments.emplace_back(argument);
+    }
+    va_end(list);
+    return kesto::RunProgram(program, arguments);
+}
+
+int KLIBCExec(const char* program, const char* const* argv) {
+    std::vector<std::string> arguments;
+    for (; *argv != nullptr; ++argv) {
+        arguments.emplace_back(*argv);
+    }
+    return kesto::RunProgram(program, arguments);
+}
