@@ -1,0 +1,56 @@
+#include "programs/fileindexctl/application.h"
+
+#include <exception>
+#include <ostream>
+
+#include "common/error.h"
+#include "programs/fileindexctl/command_line.h"
+#include "programs/fileindexctl/error_text.h"
+#include "programs/fileindexctl/text.h"
+
+namespace quivra::ctl {
+namespace {
+
+int Complain(Session& session, const std::string& sentence, int status) {
+    session.err << "fileindexctl: " << EscapeControl(sentence) << "\n";
+    return status;
+}
+
+/// Help and version go to the output; everything else that the parser throws is a wrong call.
+int AnswerParser(CommandLine& line, Session& session, const CLI::Error& error) {
+    if (error.get_exit_code() == static_cast<int>(CLI::ExitCodes::Success)) {
+        return line.Root().exit(error, session.out, session.err);
+    }
+    return Complain(session, std::string(error.what()) + "; see 'fileindexctl --help'", kWrongCall);
+}
+
+int RunAction(const Action& action, Session& session) {
+    try {
+        return action(session);
+    } catch (const Error& error) {
+        return Complain(session, DescribeError(session.doing, error), kFailure);
+    } catch (const Failure& failure) {
+        return Complain(session, failure.what(), kFailure);
+    } catch (const WrongCall& wrong_call) {
+        return Complain(session, wrong_call.what(), kWrongCall);
+    } catch (const std::exception& error) {
+        return Complain(session, "cannot " + session.doing + ": " + error.what(), kFailure);
+    }
+}
+
+}  // namespace
+
+int Run(const std::vector<std::string>& arguments, Session& session) {
+    CommandLine line;
+    try {
+        const Action action = line.Parse(arguments);
+        session.json = line.WantsJson();
+        return RunAction(action, session);
+    } catch (const CLI::Error& error) {
+        return AnswerParser(line, session, error);
+    } catch (const WrongCall& wrong_call) {
+        return Complain(session, wrong_call.what(), kWrongCall);
+    }
+}
+
+}  // namespace quivra::ctl

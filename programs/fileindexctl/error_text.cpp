@@ -1,0 +1,93 @@
+#include "programs/fileindexctl/error_text.h"
+
+#include <algorithm>
+#include <array>
+
+namespace quivra::ctl {
+namespace {
+
+/// Where the reason of an error tells more than the table can.
+enum class Reason { kLeaveOut, kTell };
+
+struct ErrorText {
+    int code;
+    const char* cause;
+    const char* remedy;
+    Reason reason;
+};
+
+/// Every code that the library throws of itself, and the search daemon's where a user can do
+/// something about them.
+constexpr std::array kErrorTexts = {
+    ErrorText{Error::kBadArgument, "a value is missing or wrong", "check the names and paths given",
+              Reason::kTell},
+    ErrorText{Error::kSystemCallFailed, "a system call or a daemon failed",
+              "check with 'fileindexctl status' that the daemons run, and see the system log",
+              Reason::kTell},
+    ErrorText{Error::kCredentialsFailed, "the rights of root could not be taken",
+              "run the command as root", Reason::kTell},
+    ErrorText{Error::kLoadFailed, "a configuration file is damaged",
+              "repair it, or move it away to start without it", Reason::kTell},
+    ErrorText{Error::kSaveFailed, "a configuration file could not be written",
+              "run the command as root and check the space on the system volume", Reason::kTell},
+    ErrorText{Error::kLockFailed, "another program holds the lock for too long",
+              "try again later, as root", Reason::kTell},
+    ErrorText{Error::kNoSuchShare, "there is no such share",
+              "see 'fileindexctl share list' for the shares of /etc/kesto/shares.conf",
+              Reason::kLeaveOut},
+    ErrorText{Error::kTooManyFolders, "the limit of 1000 indexed folders is reached",
+              "delete some, or index a folder above them", Reason::kLeaveOut},
+    ErrorText{Error::kDuplicateFolder, "it is already indexed",
+              "use 'fileindexctl folder set' to change it", Reason::kLeaveOut},
+    ErrorText{Error::kNoSuchFolder, "it is not among the indexed folders",
+              "see 'fileindexctl folder list' for them", Reason::kLeaveOut},
+    ErrorText{Error::kPathNotIndexable, "it may not be indexed",
+              "'fileindexctl why' tells the reason", Reason::kLeaveOut},
+    ErrorText{Error::kMalformedEvent, "the change queue holds a damaged line",
+              "it is skipped when the queue is processed; try again then", Reason::kTell},
+    ErrorText{Error::kChannelFailed, "the search daemon does not answer",
+              "start it with 'service kestoelasticd start'", Reason::kTell},
+    ErrorText{Error::kParseFailed, "the file could not be read",
+              "check that it exists and the disk is sound", Reason::kTell},
+    ErrorText{Error::kQueryWithoutData, "the search daemon answered without data",
+              "restart it with 'service kestoelasticd restart'", Reason::kTell},
+    ErrorText{Error::kSpaceNotEnough, "there is no space left for the index",
+              "free space on the share's volume", Reason::kTell},
+    ErrorText{Error::kDaemonOutOfMemory, "the search daemon is short of memory",
+              "try again in a few minutes", Reason::kTell},
+    ErrorText{Error::kDaemonBusy, "the search daemon is moving or compacting the index",
+              "try again in a few minutes", Reason::kTell},
+    ErrorText{Error::kPathLookupFailed, "the path is not canonical",
+              "give it absolute, without '.', '..', doubled or trailing '/'", Reason::kTell},
+};
+
+const ErrorText* Find(int code) {
+    const auto* const it =
+        std::find_if(kErrorTexts.begin(), kErrorTexts.end(),
+                     [code](const ErrorText& text) { return text.code == code; });
+    return it == kErrorTexts.end() ? nullptr : it;
+}
+
+}  // namespace
+
+std::string DescribeError(const std::string& doing, const Error& error) {
+    const ErrorText* text = Find(error.code);
+    std::string sentence = "cannot " + doing + ": ";
+    if (text == nullptr) {
+        sentence += error.reason.empty() ? "the search daemon refused it" : error.reason;
+        sentence += "; see the search daemon's log";
+    } else {
+        sentence += text->cause;
+        if (text->reason == Reason::kTell && !error.reason.empty()) {
+            sentence += " (" + error.reason + ")";
+        }
+        sentence += std::string("; ") + text->remedy;
+    }
+    return sentence + " [" + std::to_string(static_cast<int>(error.code)) + "]";
+}
+
+bool HasErrorText(int code) {
+    return Find(code) != nullptr;
+}
+
+}  // namespace quivra::ctl

@@ -1,0 +1,140 @@
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <memory>
+#include <ostream>
+
+#include "common/json.h"
+#include "common/lock_file.h"
+#include "common/log.h"
+#include "common/unique_fd.h"
+#include "common/util.h"
+#include "fileindex/event.h"
+#include "fileindex/util.h"
+#include "programs/fileindexctl/command_line.h"
+#include "programs/fileindexctl/paths.h"
+#include "sdk/share.h"
+
+namespace quivra::ctl {
+namespace {
+
+struct Kind {
+    const char* name;
+    unsigned int event;
+};
+
+constexpr std::array kKinds = {
+    Kind{"create", fileindex::EVENT_CREATE}, Kind{"modify", fileindex::EVENT_MODIFY},
+    Kind{"delete", fileindex::EVENT_DELETE}, Kind{"attr", fileindex::EVENT_ATTR},
+    Kind{"rename", fileindex::EVENT_RENAME}, Kind{"reindex", fileindex::EVENT_REINDEX},
+};
+
+struct Options {
+    std::string path;
+    std::string kind;
+    std::string from;
+    bool is_dir = false;
+};
+
+std::string ShareOf(const std::string& full_path) {
+    std::string name;
+    std::string root;
+    fileindex::GetShareNamePathByFullPath(name, root, full_path);
+    return name;
+}
+
+/// Adds whole lines only: the end of a line that a crash cut off is closed first, and a write that
+/// fails half-way is taken back. The caller holds the queue's lock.
+void AppendLine(const std::string& queue, std::string line) {
+    const UniqueFd fd(open(queue.c_str(), O_RDWR | O_APPEND | O_CREAT | O_CLOEXEC, 0644));
+    struct stat status {};
+    if (!fd.IsValid() || fstat(fd.Get(), &status) != 0) {
+        throw Failure("cannot write to " + queue + ": " + SystemErrorText(errno));
+    }
+    char last = '\n';
+    if (status.st_size > 0 && pread(fd.Get(), &last, 1, status.st_size - 1) == 1 && last != '\n') {
+        line.insert(0, "\n");
+    }
+    line += "\n";
+    if (!WriteAll(fd.Get(), line.data(), line.size())) {
+        const std::string reason = SystemErrorText(errno);
+        (void)!ftruncate(fd.Get(), status.st_size);
+        throw Failure("cannot write to " + queue + ": " + reason);
+    }
+}
+
+Json::Value MakeEvent(const Options& options, const std::string& path, const std::string& from) {
+    const auto* const kind =
+        std::find_if(kKinds.begin(), kKinds.end(),
+                     [&options](const Kind& known) { return options.kind == known.name; });
+    Json::Value event(Json::objectValue);
+    event["event"] = kind->event;
+    event["is_dir"] = options.is_dir;
+    event["path"] = path;
+    event["path_old"] = from;
+    event["data"] = Json::Value();
+    return event;
+}
+
+int Add(const Options& options, Session& session) {
+    if ((options.kind == "rename") == options.from.empty()) {
+        throw WrongCall(options.from.empty() ? "a rename needs --from OLD"
+                                             : "--from goes with --kind rename only");
+    }
+    const std::string path = CanonicalPath(options.path);
+    const std::string from = options.from.empty() ? std::string() : CanonicalPath(options.from);
+    session.doing = "queue the change of " + path;
+    const std::string share = ShareOf(path);
+    if (!from.empty() && ShareOf(from) != share) {
+        throw Failure("cannot queue the rename: " + from + " lies in another share than " + path +
+                      "; queue a delete there and a create here");
+    }
+    const std::string queue = sdk::SDKShare(share).GetQueuePath();
+    const Json::Value event = MakeEvent(options, path, from);
+    {
+        const LockFile lock(queue, true);
+        AppendLine(queue, toString(event));
+    }
+    if (session.json) {
+        Json::Value result(Json::objectValue);
+        result["share"] = share;
+        result["queue"] = queue;
+        result["event"] = event;
+        session.out << toString(result) << "\n";
+    } else {
+        session.out << "Queued for share " << session.Shown(share) << ": " << options.kind << " "
+                    << session.Shown(path) << "\n";
+    }
+    return kSuccess;
+}
+
+}  // namespace
+
+void AddEventCommands(CommandLine& line) {
+    const std::string examples =
+        "  fileindexctl event add /volume1/photo/a.jpg --kind modify\n"
+        "  fileindexctl event add /volume1/photo/new --kind rename --from /volume1/photo/old "
+        "--dir\n"
+        "  fileindexctl event add /volume1/photo --kind reindex --dir";
+    CLI::App& group = line.AddGroup("event", "Tell the indexer of changes by hand", examples);
+    CLI::App& add = line.AddCommand(
+        group, "add", "Append a change to the queue of the share that holds the path", examples);
+    auto options = std::make_shared<Options>();
+    std::vector<std::string> kinds;
+    for (const Kind& kind : kKinds) {
+        kinds.emplace_back(kind.name);
+    }
+    add.add_option("PATH", options->path, "Full path; a relative one starts here")->required();
+    add.add_option("--kind", options->kind, "What happened")
+        ->required()
+        ->check(CLI::IsMember(kinds));
+    add.add_option("--from", options->from, "For a rename: the old path");
+    add.add_flag("--dir", options->is_dir, "It is a directory");
+    line.OnCommand(add, [options](Session& session) { return Add(*options, session); });
+}
+
+}  // namespace quivra::ctl

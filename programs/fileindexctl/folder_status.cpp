@@ -1,0 +1,23 @@
+#include "programs/fileindexctl/folder_status.h"
+
+#include "common/error.h"
+
+namespace quivra::ctl {
+
+Json::Value FolderStatus(const fileindex::Folder& folder) {
+    Json::Value status(Json::objectValue);
+    try {
+        folder.GetStatus(status);
+    } catch (const Error& error) {
+        status["text"] = "error";
+        status["desc"] = error.what();
+    }
+    return status;
+}
+
+std::string StatusText(const Json::Value& status) {
+    const std::string description = status["desc"].asString();
+    return status["text"].asString() + (description.empty() ? "" : ": " + description);
+}
+
+}  // namespace quivra::ctl

@@ -1,0 +1,331 @@
+#include <algorithm>
+#include <limits>
+#include <memory>
+#include <ostream>
+#include <vector>
+
+#include "common/json.h"
+#include "common/util.h"
+#include "fileindex/elastic/elastic_control.h"
+#include "programs/fileindexctl/command_line.h"
+#include "programs/fileindexctl/error_text.h"
+#include "programs/fileindexctl/search_query.h"
+#include "programs/fileindexctl/shares.h"
+#include "programs/fileindexctl/text.h"
+
+namespace quivra::ctl {
+namespace {
+
+constexpr unsigned int kDefaultLimit = 20;
+constexpr unsigned int kNoLimit = std::numeric_limits<unsigned int>::max();
+/// Marks around the words found. File contents hardly ever hold these characters, and where they
+/// do, a wrong word is bold.
+constexpr char kMarkBegin = '\x02';
+constexpr char kMarkEnd = '\x03';
+/// Where a line worth showing may come from, the best first.
+constexpr std::array kHighlightFields = {"KESTOMDTextContent", "KESTOMDTitle",
+                                         "KESTOMDDescription", "KESTOMDComment",
+                                         "KESTOMDKeywords",    "KESTOMDAuthors"};
+
+struct Options {
+    std::string share;
+    std::string sort;
+    unsigned int limit = kDefaultLimit;
+    unsigned int offset = 0;
+    bool limit_given = false;
+    bool paths = false;
+    bool null = false;
+};
+
+struct SortOrder {
+    std::string field;  ///< empty: by relevance
+    bool descending = false;
+};
+
+struct Results {
+    std::vector<Json::Value> hits;
+    Json::UInt64 total = 0;
+    std::vector<std::string> failures;  ///< a sentence for each share that was not searched
+};
+
+SortOrder ParseSort(const std::string& sort) {
+    if (sort.empty() || sort == "relevance") {
+        return {};
+    }
+    const bool descending = sort[0] == '-';
+    const std::string name = sort.substr(descending ? 1 : 0);
+    Field field;
+    if (!FindField(field, name)) {
+        throw WrongCall("there is no field '" + name +
+                        "' to sort by; see 'fileindexctl search --help'");
+    }
+    // The name's own field is made for finding parts; sorting goes by the whole name.
+    return {name == "name" ? "KESTOMDFSName" : field.name, descending};
+}
+
+Json::Value MakeRequest(const Json::Value& qsl, const Options& options, const SortOrder& order,
+                        bool json) {
+    Json::Value request(Json::objectValue);
+    request["qsl"] = qsl;
+    if (!order.field.empty()) {
+        Json::Value& sort = request["sort"].append(Json::Value(Json::objectValue));
+        sort["field"] = order.field;
+        sort["order"] = order.descending ? "desc" : "asc";
+    }
+    if (!json) {
+        request["fields"].append("KESTOMDPath");
+        if (!order.field.empty() && order.field != "KESTOMDPath") {
+            request["fields"].append(order.field);
+        }
+    }
+    if (!options.paths) {
+        Json::Value& highlight = request["highlight"];
+        for (const char* field : kHighlightFields) {
+            highlight["fields"].append(field);
+        }
+        highlight["pre"] = json ? "<b>" : std::string(1, kMarkBegin);
+        highlight["post"] = json ? "</b>" : std::string(1, kMarkEnd);
+        highlight["length"] = 160;
+    }
+    return request;
+}
+
+/// Whether `a` comes before `b`. Hits without the field come last, whatever the direction.
+bool ComesBefore(const Json::Value& a, const Json::Value& b, const SortOrder& order) {
+    const Json::Value& x = a[order.field];
+    const Json::Value& y = b[order.field];
+    if (x.isNull() || y.isNull()) {
+        return !x.isNull() && y.isNull();
+    }
+    const Json::Value& smaller = order.descending ? y : x;
+    const Json::Value& larger = order.descending ? x : y;
+    if (x.isNumeric() && y.isNumeric()) {
+        return smaller.asDouble() < larger.asDouble();
+    }
+    return isJsonType<std::string>(x) && isJsonType<std::string>(y) &&
+           smaller.asString() < larger.asString();
+}
+
+/// One list from the lists of the shares. Relevance is no number that could be compared between
+/// indexes, so the best of each share come first, then the second best.
+std::vector<Json::Value> Merge(std::vector<Json::Value>& lists, const SortOrder& order) {
+    std::vector<Json::Value> merged;
+    std::vector<Json::ArrayIndex> next(lists.size(), 0);
+    while (true) {
+        std::size_t best = lists.size();
+        for (std::size_t i = 0; i < lists.size(); ++i) {
+            if (next[i] == lists[i].size()) {
+                continue;
+            }
+            const bool better = best == lists.size() ||
+                                (order.field.empty() ? next[i] < next[best]
+                                                     : ComesBefore(lists[i][next[i]],
+                                                                   lists[best][next[best]], order));
+            best = better ? i : best;
+        }
+        if (best == lists.size()) {
+            return merged;
+        }
+        merged.push_back(std::move(lists[best][next[best]++]));
+    }
+}
+
+/// Searches each share. A share whose index is not there (yet) or fails does not hide what the
+/// others hold; a daemon that is away fails the search.
+Results Search(const std::vector<std::string>& shares, Json::Value request, const Options& options,
+               const SortOrder& order, Session& session) {
+    const bool single = shares.size() == 1;
+    const Json::UInt64 wanted = static_cast<Json::UInt64>(options.offset) + options.limit;
+    if (single) {
+        request["offset"] = options.offset;
+    }
+    if (options.limit != kNoLimit) {
+        request["limit"] = single ? options.limit : static_cast<Json::UInt>(wanted);
+    }
+    Results results;
+    std::vector<Json::Value> lists;
+    for (const std::string& share : shares) {
+        session.doing = "search share " + share;
+        Json::Value reply;
+        try {
+            fileindex::elastic::IndexQuery(reply, share, request);
+        } catch (const Error& error) {
+            if (error.code == Error::kChannelFailed || single) {
+                throw;
+            }
+            results.failures.push_back(DescribeError(session.doing, error));
+            continue;
+        }
+        if (!reply["data"].isArray() || !reply["total"].isIntegral()) {
+            throw Error(Error::kQueryWithoutData, toString(reply));
+        }
+        results.total += reply["total"].asUInt64();
+        lists.push_back(std::move(reply["data"]));
+    }
+    results.hits = Merge(lists, order);
+    if (!single) {
+        const auto begin = results.hits.begin();
+        const std::size_t size = results.hits.size();
+        results.hits.erase(begin,
+                           begin + static_cast<long>(std::min<std::size_t>(options.offset, size)));
+        results.hits.resize(std::min<std::size_t>(results.hits.size(), options.limit));
+    }
+    return results;
+}
+
+/// The line as it is shown: on one line, safe for a terminal and there with the words in bold.
+std::string ShownHighlight(const std::string& text, const Session& session) {
+    std::string line;
+    std::string part;
+    const auto flush = [&](const char* style) {
+        line += session.Shown(part);
+        part.clear();
+        line += session.out_is_terminal ? style : "";
+    };
+    for (const char c : text) {
+        if (c == kMarkBegin) {
+            flush("\x1b[1m");
+        } else if (c == kMarkEnd) {
+            flush("\x1b[0m");
+        } else {
+            part += c == '\n' || c == '\r' || c == '\t' ? ' ' : c;
+        }
+    }
+    flush("\x1b[0m");
+    return line;
+}
+
+void PrintHit(const Json::Value& hit, const Options& options, Session& session) {
+    const std::string path = hit["KESTOMDPath"].asString();
+    if (options.paths) {
+        session.out << (options.null ? path : session.Shown(path)) << (options.null ? '\0' : '\n');
+        return;
+    }
+    session.out << session.Shown(path) << "\n";
+    for (const char* field : kHighlightFields) {
+        const Json::Value& text = hit["highlight"][field];
+        if (text.isString() && !text.asString().empty()) {
+            session.out << "    " << ShownHighlight(text.asString(), session) << "\n";
+            return;
+        }
+    }
+}
+
+void PrintJson(const Results& results, const Options& options, Session& session) {
+    Json::Value document(Json::objectValue);
+    Json::Value& hits = document["hits"] = Json::Value(Json::arrayValue);
+    for (const Json::Value& hit : results.hits) {
+        hits.append(hit);
+    }
+    document["total"] = results.total;
+    document["offset"] = options.offset;
+    session.out << toString(document) << "\n";
+}
+
+void TellAbout(const Results& results, const Options& options, Session& session) {
+    for (const std::string& failure : results.failures) {
+        session.err << "fileindexctl: " << EscapeControl(failure) << "\n";
+    }
+    if (results.total == 0) {
+        session.err << "Nothing found.\n";
+    } else if (results.hits.empty()) {
+        session.err << "Nothing from offset " << options.offset << " on: " << results.total
+                    << " in all.\n";
+    } else if (options.offset + results.hits.size() < results.total) {
+        session.err << results.hits.size() << " of " << results.total << ", --limit for more\n";
+    }
+}
+
+int SearchCommand(Options options, const std::vector<std::string>& words, Session& session) {
+    if (options.null) {
+        options.paths = true;
+    }
+    if (options.limit == 0 || (options.paths && !options.limit_given)) {
+        options.limit = kNoLimit;
+    }
+    const SortOrder order = ParseSort(options.sort);
+    const Json::Value request = MakeRequest(MakeQuery(words), options, order, session.json);
+    session.doing = "find the shares to search";
+    const std::vector<std::string> shares =
+        options.share.empty() ? SearchableShares() : std::vector<std::string>{options.share};
+    if (shares.empty()) {
+        throw Failure(
+            "nothing is indexed yet; choose a folder with 'fileindexctl folder add PATH'");
+    }
+    const Results results = Search(shares, request, options, order, session);
+    if (session.json) {
+        PrintJson(results, options, session);
+    } else {
+        for (const Json::Value& hit : results.hits) {
+            PrintHit(hit, options, session);
+        }
+    }
+    session.out.flush();
+    TellAbout(results, options, session);
+    return results.hits.empty() ? kFailure : kSuccess;
+}
+
+}  // namespace
+
+std::vector<std::string> TakeSearchWords(CommandLine& line,
+                                         const std::vector<std::string>& arguments) {
+    if (arguments.empty() || arguments[0] != "search") {
+        return arguments;
+    }
+    const CLI::App& command = *line.Root().get_subcommand("search");
+    std::vector<std::string> rest = {"search"};
+    bool only_words = false;
+    for (std::size_t i = 1; i < arguments.size(); ++i) {
+        const std::string& argument = arguments[i];
+        if (only_words || (!StringStartWith(argument, "--") && argument != "-h")) {
+            line.words.push_back(argument);
+        } else if (argument == "--") {
+            only_words = true;
+        } else {
+            rest.push_back(argument);
+            const CLI::Option* option = command.get_option_no_throw(argument);
+            if (option != nullptr && option->get_items_expected_min() > 0 &&
+                i + 1 < arguments.size()) {
+                rest.push_back(arguments[++i]);
+            }
+        }
+    }
+    return rest;
+}
+
+void AddSearchCommand(CommandLine& line) {
+    CLI::App& command = line.AddCommand(
+        line.Root(), "search", "Find files by name, content and metadata: every word has to match",
+        "  fileindexctl search sunset beach\n"
+        "  fileindexctl search 'annual report' -draft ext:pdf modified:>2024-01-01\n"
+        "  fileindexctl search name:invoice 'size:1M..20M' --sort -size --limit 50\n"
+        "  fileindexctl search 'author:\"Ada Lovelace\"' --share books --json\n"
+        "  fileindexctl search --null ext:tmp | xargs -0 rm --\n\n"
+        "Words:\n"
+        "  word        in the content, the metadata or a part of the name\n"
+        "  -word       not there\n"
+        "  \"- a:b\"     in quotes: taken as it stands (quote it for the shell, too)\n"
+        "  field:value in this field; numbers and dates: > >= < <= or LOW..HIGH\n\n"
+        "Fields:\n" +
+            FieldHelp());
+    auto options = std::make_shared<Options>();
+    auto words = std::make_shared<std::vector<std::string>>();
+    command.add_option("QUERY", *words, "The words to find");
+    command.add_option("--share", options->share, "Search this share only");
+    CLI::Option* limit =
+        command.add_option("--limit", options->limit,
+                           "The largest number of hits (20; with --paths all); 0 stands for all");
+    command.add_option("--offset", options->offset, "Leave out that many hits at the front");
+    command.add_option("--sort", options->sort,
+                       "Sort by a field, with - in front from the largest on; else the most "
+                       "relevant come first");
+    command.add_flag("--paths", options->paths, "Print nothing but all paths, one a line");
+    command.add_flag("--null", options->null,
+                     "Like --paths, each path ended by a NUL byte: safe for every name");
+    line.OnCommand(command, [options, limit, &line](Session& session) {
+        options->limit_given = limit->count() > 0;
+        return SearchCommand(*options, line.words, session);
+    });
+}
+
+}  // namespace quivra::ctl
