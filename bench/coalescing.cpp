@@ -1,0 +1,164 @@
+// How fast a queue becomes a tree. The floor is what no implementation can do without: parsing the
+// same lines, in memory, with the bare JSON reader. Debug lines are switched off, as in a host that
+// lowered log_level.
+//
+//   coalescing [LINES]     (default 1000000)
+
+#include <json/json.h>
+#include <malloc.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <chrono>
+#include <cstdio>
+#include <cstdlib>
+#include <fstream>
+#include <functional>
+#include <memory>
+#include <random>
+#include <string>
+#include <vector>
+
+#include "common/log.h"
+#include "fileindex/optree.h"
+
+namespace {
+
+using quivra::fileindex::OPTree;
+using Lines = std::vector<std::string>;
+
+constexpr int kRepetitions = 5;
+constexpr std::size_t kMaxMemoryPerFile = 512;
+
+std::string Line(unsigned int bits, const std::string& path, const std::string& old = "") {
+    std::string line = R"({"event":)" + std::to_string(bits) + R"(,"is_dir":)" +
+                       (old.empty() ? "false" : "true") + R"(,"path":")" + path + '"';
+    return line + (old.empty() ? "" : R"(,"path_old":")" + old + '"') + '}';
+}
+
+/// A file of a tree with 100 directories of 10 directories each.
+std::string TreePath(std::size_t i) {
+    return "/volume1/photo/album " + std::to_string(i % 100) + "/part " +
+           std::to_string(i / 100 % 10) + "/IMG_" + std::to_string(20240000 + i) + ".jpeg";
+}
+
+Lines BusyTree(std::size_t count) {
+    constexpr unsigned int kBits[] = {0x40, 0x2, 0x2, 0x4, 0x80};
+    std::mt19937 random(1);
+    Lines lines(count);
+    for (std::string& line : lines) {
+        line = Line(kBits[random() % 5], TreePath(random() % (count / 10)));
+    }
+    return lines;
+}
+
+Lines OneDirectory(std::size_t count) {
+    Lines lines(count);
+    for (std::size_t i = 0; i < count; ++i) {
+        lines[i] =
+            Line(0x40, "/volume1/photo/camera/IMG_" + std::to_string(20240000 + i) + ".jpeg");
+    }
+    return lines;
+}
+
+Lines PendingTree(std::size_t count) {
+    Lines lines(count);
+    for (std::size_t i = 0; i < count; ++i) {
+        lines[i] = Line(0x2, TreePath(i));
+    }
+    return lines;
+}
+
+double Seconds(const std::function<void()>& work) {
+    const auto start = std::chrono::steady_clock::now();
+    work();
+    return std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
+}
+
+double ParseSeconds(const Lines& lines) {
+    Json::CharReaderBuilder builder;
+    builder["collectComments"] = false;
+    const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
+    return Seconds([&] {
+        for (const std::string& line : lines) {
+            Json::Value value;
+            if (!reader->parse(line.data(), line.data() + line.size(), &value, nullptr)) {
+                std::abort();
+            }
+        }
+    });
+}
+
+struct Result {
+    double floor = 1e9;  ///< seconds
+    double total = 1e9;  ///< seconds to read the file, build the tree, process it and drop it
+    std::size_t memory = 0;
+    int surviving = 0;
+};
+
+Result Measure(const Lines& lines) {
+    char path[] = "/tmp/coalescing.XXXXXX";
+    const int fd = mkstemp(path);
+    std::ofstream file(path);
+    for (const std::string& line : lines) {
+        file << line << '\n';
+    }
+    file.close();
+    Result result;
+    for (int i = 0; i < kRepetitions; ++i) {
+        result.floor = std::min(result.floor, ParseSeconds(lines));
+        result.total = std::min(result.total, Seconds([&] {
+                                    const std::size_t before = mallinfo2().uordblks;
+                                    OPTree tree(path);
+                                    result.memory = mallinfo2().uordblks - before;
+                                    result.surviving = 0;
+                                    tree.ProcessOP([&](auto) { ++result.surviving; });
+                                }));
+    }
+    close(fd);
+    unlink(path);
+    return result;
+}
+
+Result Report(const char* name, const Lines& lines) {
+    const Result result = Measure(lines);
+    std::printf("%-44s %8zu lines %8d ops  floor %7.1f ms  total %7.1f ms  ratio %.2f\n", name,
+                lines.size(), result.surviving, result.floor * 1e3, result.total * 1e3,
+                result.total / result.floor);
+    return result;
+}
+
+void ReportGrowth(const char* name, Lines (*make)(std::size_t), std::size_t count) {
+    const Result small = Report(name, make(count / 10));
+    const Result large = Report(name, make(count));
+    std::printf("    growth from a tenth: %.1f times (floor %.1f); at most 11 wanted\n",
+                large.total / small.total, large.floor / small.floor);
+}
+
+void ReportMemory(const char* name, const Lines& lines) {
+    const Result result = Measure(lines);
+    std::printf("%-44s %zu bytes per pending file; at most %zu wanted\n", name,
+                result.memory / static_cast<std::size_t>(result.surviving), kMaxMemoryPerFile);
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+    const std::size_t count = argc > 1 ? std::strtoul(argv[1], nullptr, 10) : 1000000;
+    quivra::fileindex::log_level = 6;
+    std::printf("floor: the bare parse of the same lines; best of %d runs; ratio 1.30 wanted\n",
+                kRepetitions);
+    ReportGrowth("busy files of a tree, ten lines for each", BusyTree, count);
+    ReportGrowth("distinct files of one directory", OneDirectory, count);
+
+    Lines lines = PendingTree(count / 10);
+    Report("pending files", lines);
+    lines.push_back(Line(0x100, "/volume1/photo 2", "/volume1/photo"));
+    Report("a directory rename above them", lines);
+    lines.back() = Line(0x10000, "/volume1/photo");
+    Report("a reindex above them", lines);
+
+    ReportMemory("memory, files of a tree", PendingTree(count));
+    ReportMemory("memory, files of one directory", OneDirectory(count));
+    return 0;
+}

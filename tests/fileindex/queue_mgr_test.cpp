@@ -1,0 +1,168 @@
+#include "fileindex/queue_mgr.h"
+
+#include <gtest/gtest.h>
+#include <poll.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include "common/lock_file.h"
+#include "tests/fileindex/queue_support.h"
+
+namespace quivra::fileindex {
+namespace {
+
+class QueueMgrTest : public QueueTest {
+  protected:
+    std::vector<std::string> Process(bool use_tmp, int count) {
+        std::vector<std::string> ops;
+        const auto collect = [&](const std::shared_ptr<OP>& op) { ops.push_back(Printed(op)); };
+        EXPECT_EQ(QueueMgr(queue_).ProcessOP(collect, use_tmp), count);
+        return ops;
+    }
+    bool Exists(const std::string& suffix) const {
+        return std::filesystem::exists(queue_ + suffix);
+    }
+
+    using Ops = std::vector<std::string>;
+};
+
+TEST_F(QueueMgrTest, PassMovesTheQueueAsideAndKeepsTheCopy) {
+    Write(queue_, {Line(EVENT_CREATE, "/a"), Line(EVENT_MODIFY, "/a")});
+    EXPECT_EQ(Process(false, 2), Ops{"[02] /a"});
+    EXPECT_TRUE(Exists("") && !Exists(".tmp"));
+    EXPECT_EQ(Process(true, 2), Ops{"[02] /a"});
+    EXPECT_TRUE(!Exists("") && Exists(".tmp"));
+    EXPECT_EQ(Process(false, 0), Ops{});
+
+    // The copy comes first again, whatever has been queued meanwhile, until it is deleted.
+    Write(queue_, {Line(EVENT_DELETE, "/b")});
+    EXPECT_EQ(Process(true, 2), Ops{"[02] /a"});
+    EXPECT_EQ(Process(false, 1), Ops{"[01] /b"});
+    QueueMgr manager(queue_);
+    EXPECT_EQ(manager.DeleteTmp(), 0);
+    EXPECT_EQ(manager.DeleteTmp(), -1);
+    EXPECT_EQ(Process(true, 1), Ops{"[01] /b"});
+    EXPECT_EQ(manager.DeleteTmp(), 0);
+    EXPECT_EQ(Process(true, 0), Ops{});
+    EXPECT_FALSE(Exists("")) << "looking at an absent queue made one";
+}
+
+TEST_F(QueueMgrTest, FailedPassLeavesTheCopy) {
+    Write(queue_, {Line(EVENT_CREATE, "/a")});
+    QueueMgr manager(queue_);
+    const auto fail = [](auto) { throw Error(1401, "busy"); };
+    EXPECT_EQ(ErrorOf([&] { manager.ProcessOP(fail, true); }),
+              std::make_pair(1401, std::string("busy")));
+    EXPECT_EQ(Process(true, 1), Ops{"[02] /a"});
+}
+
+TEST_F(QueueMgrTest, FailedRenameLeavesTheQueue) {
+    Write(queue_, {Line(EVENT_CREATE, "/a")});
+    std::filesystem::create_directories(queue_ + ".tmp/in the way");
+    EXPECT_EQ(ErrorOf([&] { QueueMgr(queue_).PrepareTmpQueue(); }),
+              std::make_pair(502, std::string("rename failed, reason=Is a directory")));
+    const auto lines = fake::LogLinesWith(
+        "Failed [0 > rename(queue_path_.c_str(), queue_path_tmp_.c_str())], reason: rename failed");
+    ASSERT_EQ(lines.size(), 1U);
+    EXPECT_TRUE(lines[0].starts_with("queue_mgr:136 ("));
+    EXPECT_EQ(Process(false, 1), Ops{"[02] /a"});
+}
+
+TEST_F(QueueMgrTest, WaitsForAWriter) {
+    Write(queue_, {Line(EVENT_CREATE, "/a")});
+    auto writer = std::make_unique<LockFile>(queue_, true);
+    fake::OnSleep([&](auto) {
+        Write(queue_, {Line(EVENT_CREATE, "/a"), Line(EVENT_CREATE, "/b")});
+        writer.reset();
+    });
+    EXPECT_EQ(Process(true, 2), (Ops{"[02] /a", "[02] /b"}));
+}
+
+TEST_F(QueueMgrTest, NoEventIsLostBetweenWritersAndPasses) {
+    constexpr int kWriters = 3;
+    constexpr int kLines = 200;
+    fake::OnSleep([](auto) { poll(nullptr, 0, 1); });
+    for (int writer = 0; writer < kWriters; ++writer) {
+        if (fork() == 0) {
+            for (int i = 0; i < kLines; ++i) {
+                const LockFile lock(queue_, true);
+                std::ofstream(queue_, std::ios::app)
+                    << Line(EVENT_CREATE, "/" + std::to_string(writer * kLines + i)) << '\n';
+            }
+            _exit(0);
+        }
+    }
+    QueueMgr manager(queue_);
+    std::set<std::string> seen;
+    const auto pass = [&] {
+        manager.ProcessOP([&](const std::shared_ptr<OP>& op) { seen.insert(Printed(op)); }, true);
+        manager.DeleteTmp();
+    };
+    int running = kWriters;
+    while (running > 0) {
+        pass();
+        running -= waitpid(-1, nullptr, WNOHANG) > 0 ? 1 : 0;
+    }
+    pass();
+    EXPECT_EQ(seen.size(), static_cast<std::size_t>(kWriters * kLines));
+}
+
+TEST_F(QueueMgrTest, TellsWhatIsPending) {
+    const struct {
+        std::string line;
+        const char* path;
+        bool processing;
+        bool reindex;
+    } rows[] = {
+        {Line(EVENT_CREATE, "/v/s/dir/file"), "/v/s/dir", true, false},
+        {Line(EVENT_CREATE, "/v/s/dir2/file"), "/v/s/dir", false, false},
+        {Line(EVENT_CREATE, "/v/s/dir"), "/v/s/dir", true, false},
+        {Line(EVENT_CREATE, "/v/s"), "/v/s/dir", false, false},
+        {Line(EVENT_RENAME, "/w/x", "/v/s/dir/x"), "/v/s/dir", true, false},
+        {Line(EVENT_REINDEX, "/v/s/dir"), "/v/s/dir/sub", false, true},
+        {Line(EVENT_REINDEX, "/v/s/dir"), "/v/s/dir", true, true},
+        {Line(EVENT_REINDEX, "/v/s/dir/sub2"), "/v/s/dir/sub", false, false},
+        {Line(EVENT_REINDEX | EVENT_ATTR, "/v/s/dir"), "/v/s/dir/sub", false, false},
+    };
+    for (const auto& row : rows) {
+        for (const bool in_copy : {false, true}) {
+            Write(queue_ + (in_copy ? ".tmp" : ""), {row.line});
+            if (in_copy) {
+                Write(queue_, {Line(EVENT_CREATE, "/other")});
+            }
+            const QueueMgr manager(queue_);
+            EXPECT_EQ(manager.IsFullPathProcessing(row.path), row.processing) << row.line;
+            EXPECT_EQ(manager.IsFullPathHasReindex(row.path), row.reindex) << row.line;
+            std::filesystem::remove(queue_ + ".tmp");
+        }
+    }
+}
+
+TEST_F(QueueMgrTest, QuestionsStopAtTheFirstMatchOrBadLine) {
+    QueueMgr manager(queue_);
+    EXPECT_FALSE(manager.IsFullPathProcessing("/a"));
+    Write(queue_, {Line(EVENT_REINDEX, "/a"), "bad", Line(EVENT_REINDEX, "/b")});
+    EXPECT_TRUE(manager.IsFullPathProcessing("/a"));
+    EXPECT_EQ(ErrorOf([&] { manager.IsFullPathProcessing("/b"); }),
+              std::make_pair(906, std::string("Malformed event_raw: bad")));
+    EXPECT_EQ(ErrorOf([&] { manager.IsFullPathHasReindex("/b"); }).first, 906);
+}
+
+TEST_F(QueueMgrTest, UnreadableFileRaises) {
+    if (geteuid() != 0) {
+        GTEST_SKIP() << "needs another user";
+    }
+    Write(queue_, {Line(EVENT_REINDEX, "/a")});
+    std::filesystem::permissions(queue_, std::filesystem::perms::none);
+    std::filesystem::permissions(directory_, std::filesystem::perms(0755));
+    ASSERT_EQ(seteuid(65534), 0);
+    const auto [code, reason] = ErrorOf([&] { QueueMgr(queue_).IsFullPathHasReindex("/a"); });
+    ASSERT_EQ(seteuid(0), 0);
+    EXPECT_EQ(code, 502);
+    EXPECT_EQ(reason, "Failed to open queue, reason=Permission denied");
+    EXPECT_EQ(fake::LogLinesWith("Failed [!input_stream], reason: Failed to open queue").size(),
+              1U);
+}
+
+}  // namespace
+}  // namespace quivra::fileindex
