@@ -9,6 +9,7 @@
 #include "common/lock_file.h"
 #include "common/log.h"
 #include "common/util.h"
+#include "fileindex/folder_mgr.h"
 #include "fileindex/queue_reader.h"
 
 namespace quivra::fileindex {
@@ -80,6 +81,8 @@ int QueueMgr::ProcessOP(const std::function<void(std::shared_ptr<OP>)>& fn, bool
 }
 
 bool QueueMgr::IsFullPathProcessing(const std::string& full_path) const {
+    // Not consulted: who asks learns here when the configured folders cannot be read.
+    const FolderMgr folder_mgr;
     const auto touches = [&](const Event& event) {
         return IsPathWithin(event.path, full_path) || IsPathWithin(event.path_old, full_path);
     };

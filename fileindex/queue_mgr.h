@@ -42,7 +42,8 @@ class QUIVRA_EXPORT QueueMgr {
 
     /// Whether a pending event touches the path or anything below it. Reads queue and working copy
     /// without the lock, so an event appended meanwhile may be missed. Throws Error 502 when one
-    /// cannot be read, and the error of the first malformed line before a match.
+    /// cannot be read, the error of the first malformed line before a match, and what FolderMgr
+    /// throws when the set of folders cannot be read.
     bool IsFullPathProcessing(const std::string& full_path) const;
 
     /// Whether a reindex of the path or of one of its ancestors is pending: an event that has that

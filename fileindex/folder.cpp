@@ -1,0 +1,127 @@
+#include "fileindex/folder.h"
+
+#include <ctime>
+
+#include "common/error.h"
+#include "common/json.h"
+#include "common/log.h"
+#include "fileindex/queue_mgr.h"
+#include "fileindex/status_mgr.h"
+#include "fileindex/util.h"
+#include "sdk/share.h"
+
+namespace quivra::fileindex {
+namespace {
+
+bool IsPausedNow(const StatusMgr& status) {
+    const std::int64_t resume_time = status.GetPauseInfo();
+    return resume_time == kPausedWithoutEnd || time(nullptr) < resume_time;
+}
+
+}  // namespace
+
+Folder::Folder(const std::string& path, const std::string& name, bool document, bool audio,
+               bool video, bool photo, bool paused)
+    : path_(path),
+      name_(name),
+      document_(document),
+      audio_(audio),
+      video_(video),
+      photo_(photo),
+      paused_(paused) {}
+
+Folder::Folder(const Json::Value& data) {
+    GetJsonValue<std::string>(path_, data, "path", true);
+    GetJsonValue<std::string>(name_, data, "name", true);
+    GetJsonValue<bool>(document_, data, "document", true);
+    GetJsonValue<bool>(audio_, data, "audio", true);
+    GetJsonValue<bool>(video_, data, "video", true);
+    GetJsonValue<bool>(photo_, data, "photo", true);
+    GetJsonValue<bool>(paused_, data, "paused", false);
+    GetJsonValue<std::string>(volume_to_be_clean_, data, "volume_to_be_clean", false);
+}
+
+const std::string& Folder::GetShare() const {
+    if (share_.empty()) {
+        GetShareNameByPath(share_, path_);
+    }
+    return share_;
+}
+
+void Folder::SetShare(const std::string& share) {
+    path_ = ReplacePathShare(path_, share, GetShare());
+    share_ = share;
+}
+
+const std::string& Folder::GetFullPath() const {
+    if (full_path_.empty()) {
+        fileindex::GetFullPath(full_path_, path_);
+    }
+    return full_path_;
+}
+
+Json::Value Folder::GetData() const {
+    Json::Value data;
+    data["path"] = path_;
+    data["name"] = name_;
+    data["document"] = document_;
+    data["audio"] = audio_;
+    data["video"] = video_;
+    data["photo"] = photo_;
+    data["paused"] = paused_;
+    data["volume_to_be_clean"] = volume_to_be_clean_;
+    return data;
+}
+
+Json::Value Folder::GetIndexCfg() const {
+    Json::Value cfg;
+    cfg["document"] = document_;
+    cfg["audio"] = audio_;
+    cfg["video"] = video_;
+    cfg["photo"] = photo_;
+    return cfg;
+}
+
+bool Folder::IsIndexing() const {
+    const sdk::SDKShare share(GetShare());
+    return QueueMgr(share.GetQueuePath()).IsFullPathProcessing(GetFullPath());
+}
+
+void Folder::GetStatus(Json::Value& out) const {
+    const StatusMgr status;
+    if (!out.isObject()) {
+        out = Json::Value(Json::objectValue);
+    }
+    if (!CanPathBeIndexed(path_)) {
+        out["text"] = "error";
+        out["desc"] = "invalid_path";
+    } else if ((status.GetShareStatus(GetShare()) & kShareNeedReindex) != 0) {
+        out["text"] = "need_reindex";
+    } else if (!IsIndexing()) {
+        out["text"] = "finished";
+    } else {
+        out["text"] = IsPausedNow(status) ? "paused" : "processing";
+    }
+}
+
+Json::Value Folder::GetDataWithAdditional(const Json::Value& additionals) const {
+    Json::Value data = GetData();
+    if (!additionals.isArray()) {
+        Fail({"folder.cpp", 45}, "!addiitionals.isArray()",
+             Error(Error::kBadArgument, toString(additionals)));
+    }
+    for (const Json::Value& it : additionals) {
+        if (!it.isString()) {
+            Fail({"folder.cpp", 48}, "!it.isString()", Error(Error::kBadArgument, toString(it)));
+        }
+        const std::string name = it.asString();
+        if (name != "status") {
+            Fail({"folder.cpp", __LINE__}, "\"status\" != it.asString()",
+                 Error(Error::kBadArgument, "Unknown additioal: " + name));
+        }
+        GetStatus(data["additional"]["status"]);
+    }
+    return data;
+}
+
+}  // namespace quivra::fileindex

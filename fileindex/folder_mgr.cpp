@@ -1,0 +1,219 @@
+#include "fileindex/folder_mgr.h"
+
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <iterator>
+#include <utility>
+
+#include "common/error.h"
+#include "common/json.h"
+#include "common/log.h"
+#include "common/util.h"
+#include "fileindex/util.h"
+#include "sdk/credentials.h"
+
+namespace quivra::fileindex {
+namespace {
+
+using FolderPtr = FolderMgr::FolderPtr;
+
+/// Component-wise: /v/s/a covers itself and /v/s/a/b, not /v/s/ab. Compares in place, since every
+/// question about a path asks it of every folder.
+bool Covers(const Folder& folder, const std::string& full_path) {
+    const std::string& root = folder.GetFullPath();
+    return full_path.starts_with(root) &&
+           (full_path.size() == root.size() || full_path[root.size()] == '/');
+}
+
+bool (*OrderBy(const std::string& key))(const FolderPtr&, const FolderPtr&) {
+    if (key == "document") {
+        return [](const FolderPtr& a, const FolderPtr& b) {
+            return a->GetDocument() < b->GetDocument();
+        };
+    }
+    if (key == "audio") {
+        return [](const FolderPtr& a, const FolderPtr& b) { return a->GetAudio() < b->GetAudio(); };
+    }
+    if (key == "video") {
+        return [](const FolderPtr& a, const FolderPtr& b) { return a->GetVideo() < b->GetVideo(); };
+    }
+    if (key == "photo") {
+        return [](const FolderPtr& a, const FolderPtr& b) { return a->GetPhoto() < b->GetPhoto(); };
+    }
+    if (key == "path") {
+        return [](const FolderPtr& a, const FolderPtr& b) { return a->GetPath() < b->GetPath(); };
+    }
+    return [](const FolderPtr& a, const FolderPtr& b) { return a->GetName() < b->GetName(); };
+}
+
+}  // namespace
+
+FolderMgr::FolderMgr() {
+    Json::Value folders(Json::arrayValue);
+    if (IsFileExist(kFileIndexFoldersCfgPath) && !fromFile(folders, kFileIndexFoldersCfgPath)) {
+        Fail({"folder_mgr.cpp", 39},
+             "IsFileExist(kFileIndexFoldersCfgPath) && "
+             "!folders.fromFile(kFileIndexFoldersCfgPath)",
+             Error(Error::kLoadFailed,
+                   std::string("Cannot load json: ") + kFileIndexFoldersCfgPath));
+    }
+    if (!folders.isArray()) {
+        Fail({"folder_mgr.cpp", __LINE__}, "!folders.isArray()",
+             Error(Error::kBadArgument, "Not an array" + AppendData(folders)));
+    }
+    folders_.reserve(folders.size());
+    for (const Json::Value& folder : folders) {
+        folders_.push_back(std::make_shared<Folder>(folder));
+    }
+}
+
+void FolderMgr::Save() const {
+    Json::Value folders(Json::arrayValue);
+    for (const FolderPtr& folder : folders_) {
+        folders.append(folder->GetData());
+    }
+    const sdk::SDKCredentials as_root("root");
+    if (!toFile(folders, kFileIndexFoldersCfgPath)) {
+        Fail({"folder_mgr.cpp", 229}, "!folders.toFile(kFileIndexFoldersCfgPath)",
+             Error(Error::kSaveFailed,
+                   std::string("Failed to save json: ") + kFileIndexFoldersCfgPath));
+    }
+    if (chmod(kFileIndexFoldersCfgPath, 0644) == -1) {
+        const std::string reason = "chmod failed, reason=" + SystemErrorText(errno);
+        Fail({"folder_mgr.cpp", 231}, "-1 == chmod(kFileIndexFoldersCfgPath, 0644)",
+             Error(Error::kSystemCallFailed, reason));
+    }
+}
+
+void FolderMgr::Get(FolderPtr& out, const std::string& path) const {
+    const auto it = std::find_if(folders_.begin(), folders_.end(), [&](const FolderPtr& folder) {
+        return folder->GetPath() == path;
+    });
+    if (it == folders_.end()) {
+        Fail({"folder_mgr.cpp", 101}, "it == folders_.end()", Error(Error::kNoSuchFolder, path));
+    }
+    out = *it;
+}
+
+bool FolderMgr::HasFolder(const std::string& path) const {
+    return std::any_of(folders_.begin(), folders_.end(),
+                       [&](const FolderPtr& folder) { return folder->GetPath() == path; });
+}
+
+void FolderMgr::Upsert(FolderPtr& diff, FolderPtr folder) {
+    diff = DiffCfg(folder, GetMostSuitableCfg(folder->GetFullPath()));
+    RemovePath(folder->GetPath());
+    folders_.push_back(std::move(folder));
+    if (folders_.size() > kFileIndexFoldersMax) {
+        Fail({"folder_mgr.cpp", 76}, "folders_.size() > kFileIndexFoldersMax",
+             Error(Error::kTooManyFolders));
+    }
+}
+
+void FolderMgr::Delete(FolderPtr& diff, const std::string& path) {
+    std::string full_path;
+    GetFullPath(full_path, path);
+    const FolderPtr before = GetMostSuitableCfg(full_path);
+    if (before == nullptr) {
+        Fail({"folder_mgr.cpp", __LINE__}, "!before", Error(Error::kNoSuchFolder, path));
+    }
+    RemovePath(path);
+    diff = DiffCfg(before, GetMostSuitableCfg(full_path));
+}
+
+void FolderMgr::DeleteByShare(const std::string& share) {
+    std::vector<FolderPtr> kept;  // a malformed path throws: the set is to stay whole then
+    std::copy_if(folders_.begin(), folders_.end(), std::back_inserter(kept),
+                 [&](const FolderPtr& folder) { return folder->GetShare() != share; });
+    folders_ = std::move(kept);
+}
+
+void FolderMgr::List(std::vector<FolderPtr>& out, unsigned int& total, unsigned int offset,
+                     unsigned int limit, const std::string& sort_by,
+                     const std::string& sort_direction) const {
+    out = folders_;
+    total = static_cast<unsigned int>(folders_.size());
+    std::sort(out.begin(), out.end(), OrderBy(sort_by));
+    if (sort_direction == "desc") {
+        std::reverse(out.begin(), out.end());
+    }
+    out.erase(out.begin(), out.begin() + std::min(offset, total));
+    if (out.size() > limit) {
+        out.resize(limit);
+    }
+}
+
+FolderPtr FolderMgr::DiffCfg(FolderPtr next, FolderPtr previous) {
+    const auto changes = [&](bool (Folder::*get)() const) {
+        return previous == nullptr || (next.get()->*get)() != (previous.get()->*get)();
+    };
+    return std::make_shared<Folder>(next->GetPath(), next->GetName(), changes(&Folder::GetDocument),
+                                    changes(&Folder::GetAudio), changes(&Folder::GetVideo),
+                                    changes(&Folder::GetPhoto), false);
+}
+
+FolderPtr FolderMgr::GetMostSuitableCfg(const std::string& full_path) const {
+    const FolderPtr* best = nullptr;
+    std::size_t best_size = 0;
+    for (const FolderPtr& folder : folders_) {
+        if (Covers(*folder, full_path) && folder->GetFullPath().size() > best_size) {
+            best = &folder;
+            best_size = folder->GetFullPath().size();
+        }
+    }
+    return best == nullptr ? nullptr : *best;
+}
+
+bool FolderMgr::IsFullPathNeedMeta(const std::string& full_path) const {
+    const FolderPtr cfg = GetMostSuitableCfg(full_path);
+    if (cfg == nullptr) {
+        return false;
+    }
+    switch (GetFileTypeByFullPath(full_path)) {
+        case FileType::kDocument:
+            return cfg->GetDocument();
+        case FileType::kAudio:
+            return cfg->GetAudio();
+        case FileType::kVideo:
+            return cfg->GetVideo();
+        case FileType::kImage:
+            return cfg->GetPhoto();
+        case FileType::kOther:
+            break;
+    }
+    return false;
+}
+
+bool FolderMgr::IsFullPathHasOwnCfg(const std::string& full_path) const {
+    return std::any_of(folders_.begin(), folders_.end(),
+                       [&](const FolderPtr& folder) { return folder->GetFullPath() == full_path; });
+}
+
+bool FolderMgr::IsFullPathIndexed(const std::string& full_path) const {
+    return std::any_of(folders_.begin(), folders_.end(),
+                       [&](const FolderPtr& folder) { return Covers(*folder, full_path); });
+}
+
+bool FolderMgr::IsShareIndexed(const std::string& share) const {
+    return std::any_of(folders_.begin(), folders_.end(), [&](const FolderPtr& folder) {
+        std::string name;
+        GetShareNameByPath(name, folder->GetPath());
+        return name == share;
+    });
+}
+
+std::set<std::string> FolderMgr::GetIndexedShares() const {
+    std::set<std::string> shares;
+    for (const FolderPtr& folder : folders_) {
+        shares.insert(folder->GetShare());
+    }
+    return shares;
+}
+
+void FolderMgr::RemovePath(const std::string& path) {
+    std::erase_if(folders_, [&](const FolderPtr& folder) { return folder->GetPath() == path; });
+}
+
+}  // namespace quivra::fileindex

@@ -1,0 +1,202 @@
+#include <memory>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "common/error.h"
+#include "common/json.h"
+#include "common/lock_file.h"
+#include "common/log.h"
+#include "fileindex/elastic/elastic_control.h"
+#include "fileindex/event.h"
+#include "fileindex/folder_mgr.h"
+#include "fileindex/index_mgr.h"
+#include "fileindex/index_steps.h"
+#include "fileindex/status_mgr.h"
+#include "fileindex/util.h"
+#include "sdk/share.h"
+
+namespace quivra::fileindex {
+namespace {
+
+using FolderPtr = FolderMgr::FolderPtr;
+
+/// What a request changed in the set, before anybody is told.
+struct Changes {
+    std::vector<FolderPtr> diffs;  // in the request's order
+    std::set<std::string> shares;
+};
+
+void RequireArray(const Json::Value& list, const char* condition) {
+    if (!list.isArray()) {
+        Fail({"index_mgr", __LINE__}, condition,
+             Error(Error::kBadArgument, "Not an array" + AppendData(list)));
+    }
+}
+
+std::string RequireString(const Json::Value& it) {
+    if (!it.isString()) {
+        Fail({"index_mgr", __LINE__}, "!it.isString()",
+             Error(Error::kBadArgument, "Not a string" + AppendData(it)));
+    }
+    return it.asString();
+}
+
+void RequireIndexable(const Folder& folder, bool updater_mode) {
+    if (!CanPathBeIndexed(folder.GetPath()) && !updater_mode) {
+        Fail({"index_mgr", __LINE__}, "!CanPathBeIndexed(folder_new->GetPath()) && !updater_mode",
+             Error(Error::kPathNotIndexable, "Path cannot index: " + folder.GetPath()));
+    }
+}
+
+void RequireSpace(const std::string& share_name) {
+    const sdk::SDKShare share(share_name);
+    if (!share.IsSpaceEnough()) {
+        Fail({"index_mgr", __LINE__}, "!share.IsSpaceEnough()",
+             Error(Error::kSpaceNotEnough, "Share (" + share_name + ") space not enough"));
+    }
+}
+
+void UpsertFolder(FolderMgr& folder_mgr, Changes& changes, const Json::Value& element, bool create,
+                  bool updater_mode) {
+    const auto folder_new = std::make_shared<Folder>(element);
+    RequireIndexable(*folder_new, updater_mode);
+    if (create && folder_mgr.HasFolder(folder_new->GetPath())) {
+        Fail({"index_mgr", __LINE__}, "create && folder_mgr.HasFolder(folder_new->GetPath())",
+             Error(Error::kDuplicateFolder, "Duplicated ID: " + folder_new->GetPath()));
+    }
+    folder_mgr.Upsert(changes.diffs.emplace_back(), folder_new);
+    RequireSpace(folder_new->GetShare());
+    changes.shares.insert(folder_new->GetShare());
+}
+
+/// Queues the content that a change adds or drops; a change without any sends nothing.
+void QueueConfigEvents(const std::vector<FolderPtr>& diffs) {
+    for (const FolderPtr& diff : diffs) {
+        if (diff->GetDocument() || diff->GetAudio() || diff->GetVideo() || diff->GetPhoto()) {
+            AddCustomEvent(EVENT_UPDATE_CFG, diff->GetFullPath(), "", diff->GetIndexCfg());
+        }
+    }
+}
+
+void UpsertFolders(const Json::Value& folder_list, bool create, bool updater_mode) {
+    const LockFile lock(kFileIndexFoldersLockPath, true);
+    FolderMgr folder_mgr;
+    const FolderMgr folder_mgr_before;
+    RequireArray(folder_list, "!folder_list.isArray()");
+    Changes changes;
+    for (const Json::Value& element : folder_list) {
+        UpsertFolder(folder_mgr, changes, element, create, updater_mode);
+    }
+    folder_mgr.Save();
+    SwitchServices(true);
+    for (const std::string& share : changes.shares) {
+        if (create && !folder_mgr_before.IsShareIndexed(share)) {
+            elastic::ShareIndexCreate(share);
+        }
+        NotifySettingChanged(share, true);
+        UpsertMonitorQueue(share);
+    }
+    QueueConfigEvents(changes.diffs);
+}
+
+/// A share without folders left: its index and data go.
+void DropShare(const std::string& share_name) {
+    const sdk::SDKShare share(share_name);
+    DeleteMonitorQueue(share_name);
+    elastic::ShareIndexDelete(share_name);
+    RemoveShareIndexData(share_name, share.GetPath());
+}
+
+}  // namespace
+
+void FolderAdd(const Json::Value& folder_list, bool updater_mode) {
+    UpsertFolders(folder_list, true, updater_mode);
+}
+
+void FolderSet(const Json::Value& folder_list, bool updater_mode) {
+    UpsertFolders(folder_list, false, updater_mode);
+}
+
+void FolderDelete(const Json::Value& path_list) {
+    const LockFile lock(kFileIndexFoldersLockPath, true);
+    FolderMgr folder_mgr;
+    RequireArray(path_list, "!path_list.isArray()");
+    Changes changes;
+    for (const Json::Value& it : path_list) {
+        const std::string path = RequireString(it);
+        folder_mgr.Delete(changes.diffs.emplace_back(), path);
+        std::string share_name;
+        GetShareNameByPath(share_name, path);
+        changes.shares.insert(share_name);
+    }
+    folder_mgr.Save();
+    QueueConfigEvents(changes.diffs);
+    for (const std::string& share : changes.shares) {
+        NotifySettingChanged(share, false);
+        if (folder_mgr.IsShareIndexed(share)) {
+            UpsertMonitorQueue(share);
+        } else {
+            DropShare(share);
+        }
+    }
+    if (folder_mgr.GetFolders().empty()) {
+        SwitchServices(false);
+    }
+}
+
+void FolderList(Json::Value& result, unsigned int offset, unsigned int limit,
+                const std::string& sort_by, const std::string& sort_direction,
+                const Json::Value& additional) {
+    const FolderMgr folder_mgr;
+    std::vector<FolderPtr> page;
+    unsigned int total = 0;
+    folder_mgr.List(page, total, offset, limit, sort_by, sort_direction);
+    Json::Value list;
+    list["folder"] = Json::Value(Json::arrayValue);
+    for (const FolderPtr& folder : page) {
+        list["folder"].append(folder->GetDataWithAdditional(additional));
+    }
+    list["total"] = total;
+    list["offset"] = offset;
+    result = list;
+}
+
+void FolderGet(Json::Value& result, const std::string& path) {
+    const FolderMgr folder_mgr;
+    FolderPtr folder;
+    folder_mgr.Get(folder, path);
+    result = folder->GetData();
+}
+
+void FolderReindex(const Json::Value& path_list) {
+    const StatusMgr status_mgr;
+    const FolderMgr folder_mgr;
+    RequireArray(path_list, "!path_list.isArray()");
+    std::set<std::string> shares;
+    std::set<std::string> unqueued;  // these keep their flag
+    for (const Json::Value& it : path_list) {
+        const std::string path = RequireString(it);
+        std::string share_name;
+        GetShareNameByPath(share_name, path);
+        if (!folder_mgr.IsShareIndexed(share_name)) {
+            continue;
+        }
+        std::string full_path;
+        GetFullPath(full_path, path);
+        if (QueueCustomEvent(EVENT_REINDEX, full_path, "", Json::Value())) {
+            shares.insert(share_name);
+        } else {
+            unqueued.insert(share_name);
+        }
+    }
+    for (const std::string& share : shares) {
+        // A fresh store for each change: events that failed have set flags meanwhile.
+        if (!unqueued.contains(share) &&
+            (status_mgr.GetShareStatus(share) & kShareNeedReindex) != 0) {
+            StatusMgr().UnsetShareStatus(share, kShareNeedReindex);
+        }
+    }
+}
+
+}  // namespace quivra::fileindex

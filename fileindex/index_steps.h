@@ -1,0 +1,46 @@
+#pragma once
+
+#include <json/json.h>
+
+#include <string>
+
+/// The steps that the management operations share. None takes a lock. They throw Error 502 when
+/// the indexing daemon or the file monitor fails, and what SDKShare throws for a share.
+namespace quivra::fileindex {
+
+/// Tells the indexing daemon that a share's folders changed, or that it is to start or drop the
+/// share's worker.
+void NotifySettingChanged(const std::string& share, bool is_upsert);
+void CreateWorker(const std::string& share);
+void DeleteWorker(const std::string& share);
+
+/// Registers the share's queue with the file monitor, for the folders that the saved set holds.
+void UpsertMonitorQueue(const std::string& share);
+
+/// Removes the registration of the share's queue, or of a given queue path of it.
+void DeleteMonitorQueue(const std::string& share);
+void DeleteMonitorQueue(const std::string& share, const std::string& queue_path);
+
+/// Where the queue of a share with that root lies, known to the platform or not.
+std::string ComposeQueuePath(const std::string& share_path);
+
+/// Deletes a share's queue, working copy and index from the disk, and forgets its flags. What
+/// cannot be deleted is logged.
+void RemoveShareIndexData(const std::string& share, const std::string& share_path);
+
+/// Throws Error 120 with `reason`, logged as `condition`, when the argument is empty.
+void RequireArgument(const std::string& argument, const char* condition, const char* reason);
+
+/// Starts or stops the services that indexing needs; what fails is logged.
+void SwitchServices(bool enable);
+
+/// AddCustomEvent that tells whether the event is queued, or covered by a queued reindex; else the
+/// share has been flagged.
+bool QueueCustomEvent(int event, const std::string& path, const std::string& path_old,
+                      const Json::Value& data);
+
+/// Appends an event line to a queue under its lock, whatever is pending there. Error 506 or 502;
+/// the queue is as it was then.
+void AppendEvent(const std::string& queue_path, const Json::Value& event);
+
+}  // namespace quivra::fileindex

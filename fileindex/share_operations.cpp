@@ -1,0 +1,134 @@
+#include <set>
+#include <string>
+
+#include "common/log.h"
+#include "common/util.h"
+#include "fileindex/elastic/elastic_control.h"
+#include "fileindex/folder_mgr.h"
+#include "fileindex/index_mgr.h"
+#include "fileindex/index_steps.h"
+#include "fileindex/status_mgr.h"
+
+namespace quivra::fileindex {
+namespace {
+
+void SavePausedOfShare(const FolderMgr& folder_mgr, const std::string& share, bool paused) {
+    for (const auto& folder : folder_mgr.GetFolders()) {
+        if (folder->GetShare() == share) {
+            folder->SetPaused(paused);
+        }
+    }
+    folder_mgr.Save();
+}
+
+/// Marks the folders of a volume; answers their shares.
+std::set<std::string> SavePausedOfVolume(const std::string& mount_point, bool paused) {
+    const FolderMgr folder_mgr;
+    std::set<std::string> shares;
+    for (const auto& folder : folder_mgr.GetFolders()) {
+        // A plain prefix, without regard to components, is what callers rely on.
+        if (StringStartWith(folder->GetFullPath(), mount_point)) {
+            folder->SetPaused(paused);
+            shares.insert(folder->GetShare());
+        }
+    }
+    folder_mgr.Save();
+    return shares;
+}
+
+void RequireShareName(const std::string& share_name) {
+    RequireArgument(share_name, "share_name.empty()", "Missing share name");
+}
+
+void RequireMountPoint(const std::string& mount_point) {
+    RequireArgument(mount_point, "mount_point.empty()", "Missing mount point");
+}
+
+void SaveAfterClear(const FolderMgr& folder_mgr) {
+    folder_mgr.Save();
+    if (folder_mgr.GetFolders().empty()) {
+        SwitchServices(false);
+    }
+}
+
+bool IsToBeCleaned(const Folder& folder, const std::string& mount_point) {
+    if (log_level == kLogLevelDebug) {
+        LogTrace({"index_mgr", __LINE__}, "Examine path=%s, paused=%d, volume_to_be_clean=%s",
+                 folder.GetPath().c_str(), folder.GetPaused() ? 1 : 0,
+                 folder.GetVolumeToBeClean().c_str());
+    }
+    return folder.GetPaused() && folder.GetVolumeToBeClean() == mount_point;
+}
+
+}  // namespace
+
+void SharePause(const std::string& share_name) {
+    const FolderMgr folder_mgr;
+    RequireShareName(share_name);
+    if (!folder_mgr.IsShareIndexed(share_name)) {
+        return;
+    }
+    DeleteWorker(share_name);
+    DeleteMonitorQueue(share_name);
+    elastic::ShareIndexPause(share_name);
+    SavePausedOfShare(folder_mgr, share_name, true);
+}
+
+void ShareResume(const std::string& share_name) {
+    const FolderMgr folder_mgr;
+    RequireShareName(share_name);
+    if (!folder_mgr.IsShareIndexed(share_name)) {
+        return;
+    }
+    elastic::ShareIndexResume(share_name);
+    UpsertMonitorQueue(share_name);
+    CreateWorker(share_name);
+    SavePausedOfShare(folder_mgr, share_name, false);
+}
+
+void VolumePause(const std::string& mount_point) {
+    RequireMountPoint(mount_point);
+    for (const std::string& share : SavePausedOfVolume(mount_point, true)) {
+        DeleteWorker(share);
+        DeleteMonitorQueue(share);
+        elastic::ShareIndexPause(share);
+    }
+}
+
+void VolumeResume(const std::string& mount_point) {
+    RequireMountPoint(mount_point);
+    for (const std::string& share : SavePausedOfVolume(mount_point, false)) {
+        elastic::ShareIndexResume(share);
+        CreateWorker(share);
+        UpsertMonitorQueue(share);
+    }
+}
+
+void ShareClearPaused(const std::string& share_name, const std::string& share_path) {
+    FolderMgr folder_mgr;
+    RequireShareName(share_name);
+    RequireArgument(share_path, "share_path.empty()", "Missing share path");
+    RemoveShareIndexData(share_name, share_path);
+    elastic::ShareIndexDelete(share_name);
+    folder_mgr.DeleteByShare(share_name);
+    SaveAfterClear(folder_mgr);
+}
+
+void VolumeClearPaused(const std::string& mount_point) {
+    RequireMountPoint(mount_point);
+    FolderMgr folder_mgr;
+    StatusMgr status_mgr;
+    std::set<std::string> shares;
+    for (const auto& folder : folder_mgr.GetFolders()) {
+        if (IsToBeCleaned(*folder, mount_point)) {
+            shares.insert(folder->GetShare());
+        }
+    }
+    for (const std::string& share : shares) {
+        status_mgr.ClearShareStatus(share);
+        folder_mgr.DeleteByShare(share);
+    }
+    SaveAfterClear(folder_mgr);
+}
+
+}  // namespace quivra::fileindex
