@@ -1,5 +1,7 @@
 #include <kesto/error.h>
 
+#include <cstring>
+
 #include "platform/standalone/error_state.h"
 
 namespace kesto {
@@ -16,7 +18,9 @@ thread_local ErrorState last_error;
 }  // namespace
 
 int SetError(int code, std::source_location where) {
-    last_error = {code, where.file_name(), static_cast<int>(where.line())};
+    const char* slash = std::strrchr(where.file_name(), '/');
+    last_error = {code, slash == nullptr ? where.file_name() : slash + 1,
+                  static_cast<int>(where.line())};
     return -1;
 }
 

@@ -4,6 +4,7 @@
 #include <libmount/libmount.h>
 #include <sys/stat.h>
 
+#include <cstdlib>
 #include <memory>
 
 namespace kesto {
@@ -31,38 +32,37 @@ libmnt_fs* FindMount(const Table& table, const struct statx& status) {
     return nullptr;
 }
 
-/// Before Linux 5.8 only the table knows which paths are mount roots.
-int IsInTable(const char* path) {
-    const Table table = ReadTable();
-    if (table == nullptr) {
-        return -1;
-    }
-    // The table holds resolved paths.
-    const std::unique_ptr<char, void (*)(void*)> resolved(realpath(path, nullptr), std::free);
-    return resolved == nullptr
-               ? -1
-               : mnt_table_find_target(table.get(), resolved.get(), MNT_ITER_BACKWARD) != nullptr;
-}
-
 }  // namespace
 
 int IsMountRoot(const char* path) {
     struct statx status {};
-    if (statx(AT_FDCWD, path, AT_SYMLINK_NOFOLLOW | AT_NO_AUTOMOUNT, STATX_TYPE, &status) != 0) {
+    if (statx(AT_FDCWD, path, AT_SYMLINK_NOFOLLOW | AT_NO_AUTOMOUNT, 0, &status) != 0) {
         return -1;
     }
-    if (S_ISLNK(status.stx_mode)) {
-        return 0;
-    }
     if ((status.stx_attributes_mask & STATX_ATTR_MOUNT_ROOT) == 0) {
-        return IsInTable(path);
+        return IsMountRootByTable(path);
     }
     return (status.stx_attributes & STATX_ATTR_MOUNT_ROOT) != 0;
 }
 
+int IsMountRootByTable(const char* path) {
+    struct stat status {};
+    if (lstat(path, &status) != 0) {
+        return -1;
+    }
+    const std::unique_ptr<char, void (*)(void*)> resolved(realpath(path, nullptr), std::free);
+    const Table table = ReadTable();
+    if (table == nullptr || resolved == nullptr) {
+        return -1;
+    }
+    return !S_ISLNK(status.st_mode) &&
+           mnt_table_find_target(table.get(), resolved.get(), MNT_ITER_BACKWARD) != nullptr;
+}
+
 std::string FileSystemNameOf(const char* path) {
     struct statx status {};
-    if (statx(AT_FDCWD, path, AT_NO_AUTOMOUNT, STATX_MNT_ID, &status) != 0 ||
+    // Asked for nothing, the kernel need not ask the file system, which may be a dead server's.
+    if (statx(AT_FDCWD, path, AT_NO_AUTOMOUNT, 0, &status) != 0 ||
         (status.stx_mask & STATX_MNT_ID) == 0) {
         return {};
     }

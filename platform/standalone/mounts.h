@@ -8,6 +8,9 @@ namespace kesto {
 /// errno set on failure. Mounts nothing on demand.
 int IsMountRoot(const char* path);
 
+/// The same from the mount table, which is all that kernels before 5.8 offer. Slower.
+int IsMountRootByTable(const char* path);
+
 /// The file system's name in the mount table ("ext4", "fuse.sshfs"); empty when that cannot be
 /// told.
 std::string FileSystemNameOf(const char* path);

@@ -2,11 +2,11 @@
 
 #include <fcntl.h>
 #include <kesto/error.h>
-#include <sched.h>
+#include <sys/mman.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <csignal>
@@ -21,61 +21,95 @@ namespace {
 using quivra::UniqueFd;
 
 constexpr std::size_t kMaxOutput = 64U << 10;
-constexpr std::size_t kStackSize = 64U << 10;
 
-struct Launch {
-    const char* program;
-    char* const* argv;
-    int output;        ///< becomes the standard output; -1 keeps the caller's
-    sigset_t signals;  ///< the caller's mask
-    int error = 0;     ///< errno of the failed start
+/// How the program ended; in memory that the supervisor shares with its starter.
+struct Result {
+    int error;   ///< errno of the failed start, 0 after a start
+    int status;  ///< as from waitpid
 };
 
-/// Runs in the new process, on its own stack but in the caller's memory, while the caller's thread
-/// stands still: only system calls here. All signals are blocked until the caller's handlers are
-/// off.
-int Child(void* argument) {
-    auto* launch = static_cast<Launch*>(argument);
+class SharedResult {
+  public:
+    SharedResult()
+        : memory_(mmap(nullptr, sizeof(Result), PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS,
+                       -1, 0)) {}
+    ~SharedResult() {
+        if (IsValid()) {
+            munmap(memory_, sizeof(Result));
+        }
+    }
+    SharedResult(const SharedResult&) = delete;
+    SharedResult& operator=(const SharedResult&) = delete;
+
+    bool IsValid() const { return memory_ != MAP_FAILED; }
+    Result* operator->() const { return static_cast<Result*>(memory_); }
+
+  private:
+    void* memory_;
+};
+
+/// Waits for a child of whatever kind. False with errno set when there is none.
+bool WaitFor(pid_t pid, int& status) {
+    while (waitpid(pid, &status, __WALL) < 0) {
+        if (errno != EINTR) {
+            return false;
+        }
+    }
+    return true;
+}
+
+/// The supervisor's life: starts the program, waits for it and notes how it ended. `output` becomes
+/// the standard output; -1 keeps the caller's. Only calls that are safe after a fork from among
+/// several threads.
+[[noreturn]] void Supervise(const char* program, char* const* argv, int output,
+                            const SharedResult& result) {
     struct sigaction action {};
     action.sa_handler = SIG_DFL;
     for (int signal = 1; signal < NSIG; ++signal) {
         sigaction(signal, &action, nullptr);
     }
-    if (launch->output >= 0 && dup2(launch->output, STDOUT_FILENO) < 0) {
-        launch->error = errno;
-        _exit(127);
+    if (output >= 0 && dup2(output, STDOUT_FILENO) < 0) {
+        result->error = errno;
+        _exit(1);
     }
     close_range(STDERR_FILENO + 1, ~0U, 0);
     sigset_t none;
     sigemptyset(&none);
     sigprocmask(SIG_SETMASK, &none, nullptr);
-    execv(launch->program, launch->argv);
-    launch->error = errno;
-    _exit(127);
-}
-
-/// Starts the process without an exit signal. So it is no child that the caller's SIGCHLD handler,
-/// or an ignored SIGCHLD, could reap before us.
-pid_t Start(Launch& launch) {
-    std::vector<char> stack(kStackSize);
-    sigset_t all;
-    sigfillset(&all);
-    pthread_sigmask(SIG_SETMASK, &all, &launch.signals);
-    const pid_t pid = clone(Child, stack.data() + stack.size(), CLONE_VM | CLONE_VFORK, &launch);
-    const int error = pid < 0 ? errno : launch.error;
-    pthread_sigmask(SIG_SETMASK, &launch.signals, nullptr);
-    launch.error = error;
-    return pid;
-}
-
-int WaitFor(pid_t pid) {
-    int status = 0;
-    while (waitpid(pid, &status, __WALL) < 0) {
-        if (errno != EINTR) {
-            return -1;
-        }
+    const pid_t pid = vfork();
+    if (pid == 0) {
+        execv(program, argv);
+        result->error = errno;
+        _exit(127);
     }
-    return status;
+    if (pid < 0) {
+        result->error = errno;
+        _exit(1);
+    }
+    int status = 0;
+    WaitFor(pid, status);
+    result->status = status;
+    _exit(0);
+}
+
+/// Forks the supervisor without an exit signal. So it is no child that the caller's SIGCHLD
+/// handler, or an ignored SIGCHLD, could reap before us; the program itself, which is such a child
+/// from its exec on, is the supervisor's. Signals are blocked meanwhile, because the caller's
+/// handlers must not run in the copy.
+pid_t StartSupervisor(const char* program, char* const* argv, int output,
+                      const SharedResult& result) {
+    sigset_t all;
+    sigset_t old;
+    sigfillset(&all);
+    pthread_sigmask(SIG_SETMASK, &all, &old);
+    const long pid = syscall(SYS_clone, 0L, 0L, 0L, 0L, 0L);
+    if (pid == 0) {
+        Supervise(program, argv, output, result);
+    }
+    const int saved_errno = errno;
+    pthread_sigmask(SIG_SETMASK, &old, nullptr);
+    errno = saved_errno;
+    return static_cast<pid_t>(pid);
 }
 
 /// Takes in all of the output, so that the program never waits for a reader, and keeps its start.
@@ -104,21 +138,29 @@ int RunProgram(const std::string& program, const std::vector<std::string>& argum
     }
     const UniqueFd read_end(ends[0]);
     UniqueFd write_end(ends[1]);
-    Launch launch{program.c_str(), argv.data(), write_end.Get(), {}};
-    const pid_t pid = Start(launch);
+    const SharedResult result;
+    const pid_t pid = result.IsValid()
+                          ? StartSupervisor(program.c_str(), argv.data(), write_end.Get(), result)
+                          : -1;
     write_end.Reset();
-    if (pid >= 0 && output != nullptr) {
+    if (pid < 0) {
+        return SetError(KESTO_ERR_SYSTEM);
+    }
+    if (output != nullptr) {
         Collect(read_end.Get(), *output);
     }
-    const int status = pid < 0 ? -1 : WaitFor(pid);
-    errno = launch.error != 0 ? launch.error : saved_errno;
-    if (launch.error != 0) {
-        return SetError(launch.error == ENOENT ? KESTO_ERR_NOT_INSTALLED : KESTO_ERR_SYSTEM);
+    int supervisor_status = 0;
+    if (!WaitFor(pid, supervisor_status)) {
+        return SetError(KESTO_ERR_SYSTEM);
     }
-    if (status < 0 || !WIFEXITED(status)) {
+    errno = result->error != 0 ? result->error : saved_errno;
+    if (result->error != 0) {
+        return SetError(result->error == ENOENT ? KESTO_ERR_NOT_INSTALLED : KESTO_ERR_SYSTEM);
+    }
+    if (!WIFEXITED(supervisor_status) || !WIFEXITED(result->status)) {
         return SetError(KESTO_ERR_COMMAND_FAILED);
     }
-    return WEXITSTATUS(status);
+    return WEXITSTATUS(result->status);
 }
 
 }  // namespace kesto
