@@ -1,0 +1,41 @@
+#include <CLI/CLI.hpp>
+
+#include <exception>
+#include <iostream>
+#include <string>
+#include <vector>
+
+#include "common/log.h"
+#include "programs/fileindexd/once.h"
+
+namespace {
+
+constexpr const char* kExamples = R"(
+Examples:
+  fileindexd                     run the daemon in the foreground
+  fileindexd --once photo music  process the pending changes of two shares, then exit
+)";
+
+}  // namespace
+
+int main(int argc, char** argv) {
+    CLI::App app("Carries file changes out on the search index, share by share.", "fileindexd");
+    std::vector<std::string> once;
+    bool verbose = false;
+    app.add_option("--once", once, "Process what the queues of these shares hold, then exit")
+        ->type_name("SHARE");
+    app.add_flag("--verbose", verbose, "Log every change event");
+    app.footer(kExamples);
+    try {
+        app.parse(argc, argv);
+    } catch (const CLI::ParseError& error) {
+        return app.exit(error) == 0 ? 0 : 2;
+    }
+    quivra::fileindex::log_level = verbose ? quivra::fileindex::kLogLevelDebug : 6;
+    try {
+        return fileindexd::RunOnce(once);
+    } catch (const std::exception& error) {
+        std::cerr << "fileindexd: " << error.what() << std::endl;
+        return 1;
+    }
+}

@@ -1,0 +1,87 @@
+#include "programs/fileindexd/share_worker.h"
+
+#include <fcntl.h>
+#include <sys/file.h>
+
+#include <cerrno>
+#include <ctime>
+
+#include "common/log.h"
+#include "common/unique_fd.h"
+#include "fileindex/index_mgr.h"
+#include "programs/fileindexd/elastic_index.h"
+#include "sdk/share.h"
+
+namespace fileindexd {
+
+using quivra::Error;
+
+namespace {
+
+constexpr const char* kUnit = "share_worker";
+
+/// Held during a pass, so that `--once` and a worker do not take the same working copy.
+quivra::UniqueFd LockShare(const std::string& share) {
+    const std::string path = std::string(kRunDirectory) + "/" + share + ".lock";
+    quivra::UniqueFd fd(open(path.c_str(), O_RDWR | O_CREAT | O_NOFOLLOW | O_CLOEXEC, 0600));
+    int result = -1;
+    do {
+        result = fd.IsValid() ? flock(fd.Get(), LOCK_EX) : -1;
+    } while (fd.IsValid() && result != 0 && errno == EINTR);
+    if (result != 0) {
+        quivra::Fail({kUnit, __LINE__}, "flock(fd.Get(), LOCK_EX) != 0",
+                     Error(Error::kLockFailed,
+                           "Cannot lock " + path + ": " + quivra::SystemErrorText(errno)));
+    }
+    return fd;
+}
+
+/// What stops a whole share is told before its documents look gone.
+void CheckIndexable(const quivra::sdk::SDKShare& share, const std::string& name) {
+    if (!share.CanBeIndexed()) {
+        throw Error(Error::kPathNotIndexable,
+                    "The share is locked, read-only or excluded from indexing: " + name);
+    }
+}
+
+}  // namespace
+
+ShareWorker::ShareWorker(std::string share) : share_(std::move(share)), state_(share_) {}
+
+PassResult ShareWorker::RunPass(const std::function<void()>& between) {
+    const quivra::UniqueFd lock = LockShare(share_);
+    try {
+        PassResult result = RunLocked(between);
+        space_notified_ = false;
+        state_.SetLastError("");
+        if (result.had_work) {
+            state_.SetLastPass(time(nullptr));
+        }
+        state_.Set(StateFile::State::kIdle);
+        return result;
+    } catch (const Error& error) {
+        if (error.code == Error::kSpaceNotEnough && !space_notified_) {
+            space_notified_ = true;
+            quivra::fileindex::SendKOSNotify();
+        }
+        state_.SetLastError(error.what());
+        state_.Set(StateFile::State::kWaiting);
+        throw;
+    }
+}
+
+PassResult ShareWorker::RunLocked(const std::function<void()>& between) {
+    const quivra::sdk::SDKShare share(share_);
+    const std::unique_ptr<Scope> scope = LoadScope();
+    CheckIndexable(share, share_);
+    ElasticIndex index(share_);
+    Pass pass(share.GetQueuePath(), share.GetPath(), index, *scope, [&](const PassState& state) {
+        if (between) {
+            between();
+        }
+        state_.SetProgress(state);
+    });
+    return pass.Run();
+}
+
+}  // namespace fileindexd

@@ -1,0 +1,121 @@
+#include "programs/fileindexd/state_file.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <ctime>
+
+#include "common/json.h"
+#include "common/log.h"
+#include "common/unique_fd.h"
+#include "common/util.h"
+
+namespace fileindexd {
+
+namespace {
+
+constexpr const char* kUnit = "state_file";
+constexpr std::chrono::seconds kWriteInterval{1};
+
+const char* Name(StateFile::State state) {
+    switch (state) {
+        case StateFile::State::kIdle:
+            return "idle";
+        case StateFile::State::kSettling:
+            return "settling";
+        case StateFile::State::kProcessing:
+            return "processing";
+        case StateFile::State::kWaiting:
+            return "waiting";
+        case StateFile::State::kPaused:
+            return "paused";
+    }
+    return "";
+}
+
+std::string PathOf(const std::string& share) {
+    return std::string(kRunDirectory) + "/" + share + ".json";
+}
+
+/// Unlike a configuration file's, this text is not synced: it means nothing after a restart.
+bool Replace(const std::string& path, const std::string& text) {
+    const std::string aside = path + "." + std::to_string(getpid());
+    {
+        const quivra::UniqueFd fd(
+            open(aside.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_NOFOLLOW | O_CLOEXEC, 0644));
+        if (!fd.IsValid()) {
+            return false;
+        }
+        if (quivra::WriteAll(fd.Get(), text.data(), text.size()) &&
+            rename(aside.c_str(), path.c_str()) == 0) {
+            return true;
+        }
+    }
+    const int error = errno;
+    unlink(aside.c_str());
+    errno = error;
+    return false;
+}
+
+}  // namespace
+
+void MakeRunDirectory() {
+    if (mkdir(kRunDirectory, 0755) != 0 && errno != EEXIST) {
+        quivra::Fail({kUnit, __LINE__}, "mkdir(kRunDirectory, 0755) != 0",
+                     quivra::Error(quivra::Error::kSystemCallFailed,
+                                   std::string("Cannot make ") + kRunDirectory + ": " +
+                                       quivra::SystemErrorText(errno)));
+    }
+}
+
+StateFile::StateFile(std::string share) : share_(std::move(share)) {}
+
+void StateFile::Set(State state) {
+    state_ = state;
+    progress_ = {};
+    Write();
+}
+
+void StateFile::SetProgress(const PassState& progress) {
+    const bool entered = state_ != State::kProcessing;
+    if (!entered && std::chrono::steady_clock::now() - written_ < kWriteInterval) {
+        return;
+    }
+    state_ = State::kProcessing;
+    progress_ = progress;
+    Write();
+}
+
+void StateFile::SetLastPass(std::int64_t seconds_since_epoch) {
+    last_pass_ = seconds_since_epoch;
+}
+
+void StateFile::SetLastError(const std::string& error) {
+    last_error_ = error;
+}
+
+void StateFile::Remove() {
+    unlink(PathOf(share_).c_str());
+}
+
+void StateFile::Write() {
+    written_ = std::chrono::steady_clock::now();
+    Json::Value state;
+    state["share"] = share_;
+    state["pid"] = getpid();
+    state["state"] = Name(state_);
+    state["done"] = Json::UInt64(progress_.done);
+    state["total"] = Json::UInt64(progress_.total);
+    state["current"] = progress_.current;
+    state["last_error"] = last_error_;
+    state["last_pass"] = Json::Int64(last_pass_);
+    state["updated"] = Json::Int64(time(nullptr));
+    if (!Replace(PathOf(share_), quivra::toString(state) + "\n")) {
+        quivra::LogError({kUnit, __LINE__}, "Cannot write %s", PathOf(share_).c_str());
+    }
+}
+
+}  // namespace fileindexd

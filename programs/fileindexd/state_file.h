@@ -1,0 +1,48 @@
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <string>
+
+#include "programs/fileindexd/batch.h"
+
+namespace fileindexd {
+
+/// Where workers and front ends meet; in memory, so that writing there wakes no disk.
+inline constexpr const char* kRunDirectory = "/var/run/fileindexd";
+
+/// Makes kRunDirectory. Throws Error 502.
+void MakeRunDirectory();
+
+/// The file through which a front end follows the work on one share: kRunDirectory/SHARE.json,
+/// replaced atomically. Its members are described in docs/fileindexd.md. Failing to write it is
+/// no reason to stop work, so nothing is thrown.
+class StateFile {
+  public:
+    enum class State { kIdle, kSettling, kProcessing, kWaiting, kPaused };
+
+    explicit StateFile(std::string share);
+    StateFile(const StateFile&) = delete;
+    StateFile& operator=(const StateFile&) = delete;
+
+    /// Writes at once.
+    void Set(State state);
+    /// State kProcessing; writes at most once a second.
+    void SetProgress(const PassState& progress);
+    void SetLastPass(std::int64_t seconds_since_epoch);
+    /// Empty when the last pass succeeded.
+    void SetLastError(const std::string& error);
+    void Remove();
+
+  private:
+    void Write();
+
+    const std::string share_;
+    State state_ = State::kIdle;
+    PassState progress_;
+    std::int64_t last_pass_ = 0;
+    std::string last_error_;
+    std::chrono::steady_clock::time_point written_{};
+};
+
+}  // namespace fileindexd

@@ -1,0 +1,108 @@
+#include "tests/programs/fileindexd/fake_index.h"
+
+#include <sys/stat.h>
+
+#include <fstream>
+#include <sstream>
+
+#include "programs/fileindexd/paths.h"
+
+namespace fileindexd {
+
+FakeIndex::Content Extract(const std::string& path, bool need_meta) {
+    struct stat info {};
+    if (lstat(path.c_str(), &info) != 0) {
+        throw DocumentError("Parse failed, path=" + path);
+    }
+    FakeIndex::Content content;
+    content.attributes = {S_ISDIR(info.st_mode), info.st_size, info.st_mtime, info.st_ctime};
+    if (need_meta && !content.attributes.is_dir) {
+        std::ostringstream text;
+        text << std::ifstream(path).rdbuf();
+        content.text = text.str();
+    }
+    return content;
+}
+
+void FakeIndex::Call() {
+    if (kill_in_ > 0 && --kill_in_ == 0) {
+        throw Killed();
+    }
+}
+
+void FakeIndex::Upsert(const std::string& path, bool need_meta) {
+    Call();
+    pending_[path] = Extract(path, need_meta);
+    extracted += !pending_[path].attributes.is_dir;
+}
+
+bool FakeIndex::SetAttributes(const std::string& path) {
+    Call();
+    const auto found = pending_.find(path);
+    if (found == pending_.end()) {
+        return false;
+    }
+    found->second.attributes = Extract(path, false).attributes;
+    return true;
+}
+
+bool FakeIndex::Rename(const std::string& to, const std::string& from) {
+    Call();
+    if (!pending_.contains(from)) {
+        return false;
+    }
+    const auto move = [this](const std::string& target, const std::string& source) {
+        if (auto node = pending_.extract(source)) {
+            pending_[target] = node.mapped();
+        }
+    };
+    move(to, from);
+    Call();  // the command is several requests
+    for (const auto& [path, content] : committed_) {
+        if (IsBelow(path, from)) {
+            move(Moved(path, from, to), path);
+        }
+    }
+    return true;
+}
+
+void FakeIndex::Delete(const std::string& path) {
+    Call();
+    pending_.erase(path);
+}
+
+void FakeIndex::DeleteBelow(const std::string& directory) {
+    Call();
+    std::erase_if(pending_, [&](const auto& entry) { return IsBelow(entry.first, directory); });
+}
+
+void FakeIndex::Commit() {
+    Call();
+    committed_ = pending_;
+    Call();  // killed before the answer came
+}
+
+std::vector<Document> FakeIndex::ListBelow(const std::string& directory, std::size_t offset,
+                                           std::size_t limit) {
+    Call();
+    std::vector<Document> page;
+    for (const auto& [path, content] : committed_) {
+        if (IsBelow(path, directory) && (offset == 0 || offset-- == 0) && page.size() < limit) {
+            page.push_back({path, content.attributes});
+        }
+    }
+    return page;
+}
+
+std::vector<Document> FakeIndex::Find(const std::vector<std::string>& paths) {
+    Call();
+    std::vector<Document> found;
+    for (const std::string& path : paths) {
+        if (const auto it = committed_.find(path); it != committed_.end()) {
+            found.push_back({path, it->second.attributes});
+        }
+    }
+    return found;
+}
+
+}  // namespace fileindexd

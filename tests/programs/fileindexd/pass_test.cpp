@@ -1,0 +1,488 @@
+#include "programs/fileindexd/pass.h"
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sys/mount.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <fstream>
+#include <functional>
+#include <random>
+#include <set>
+
+#include "common/error.h"
+#include "common/json.h"
+#include "fileindex/event.h"
+#include "programs/fileindexd/paths.h"
+#include "tests/programs/fileindexd/fake_index.h"
+
+namespace fs = std::filesystem;
+
+namespace {
+/// Lets every queue look as if it had been begun that much later than the files were changed.
+std::int64_t age_of_files = 0;
+}  // namespace
+
+// In the place of the C library's.
+extern "C" int statx(int directory, const char* path, int flags, unsigned int mask,
+                     struct statx* info) {
+    const long result = syscall(SYS_statx, directory, path, flags, mask, info);
+    if (result == 0) {
+        info->stx_btime.tv_sec += age_of_files;
+    }
+    return static_cast<int>(result);
+}
+
+namespace fileindexd {
+namespace {
+
+using quivra::Error;
+using namespace quivra::fileindex;
+
+/// The rules of a test: what lies below one of `excluded` is not indexed, what lies below one of
+/// `without_meta` without content.
+class TestScope : public Scope {
+  public:
+    bool Covers(const std::string& path, bool) const override { return !IsIn(path, excluded); }
+    bool NeedsMeta(const std::string& path) const override { return !IsIn(path, without_meta); }
+    std::vector<std::string> RootsWithin(const std::string& path) const override {
+        return IsIn(path, excluded) ? std::vector<std::string>{} : std::vector{path};
+    }
+    bool HaveSameRules(const std::string& one, const std::string& other) const override {
+        return IsIn(one, excluded) == IsIn(other, excluded) &&
+               IsIn(one, without_meta) == IsIn(other, without_meta);
+    }
+
+    std::set<std::string> excluded;
+    std::set<std::string> without_meta;
+
+  private:
+    static bool IsIn(const std::string& path, const std::set<std::string>& places) {
+        return std::any_of(places.begin(), places.end(),
+                           [&](const std::string& place) { return IsAtOrBelow(path, place); });
+    }
+};
+
+/// A share on disk, its queue and its index. Paths are given without the share's root.
+class PassTest : public testing::Test {
+  protected:
+    PassTest() {
+        age_of_files = 0;
+        fs::remove_all(root_);
+        fs::create_directories(root_ + "/@eaDir/fileindex");
+    }
+
+    std::string Full(const std::string& path) const { return root_ + path; }
+
+    void Put(const std::string& path, const std::string& text) {
+        fs::create_directories(Full(path).substr(0, Full(path).rfind('/')));
+        std::ofstream(Full(path), std::ios::trunc) << text;
+    }
+
+    void Queue(unsigned int event, const std::string& path, const std::string& old = "",
+               bool is_dir = false, const Json::Value& data = Json::Value()) {
+        Json::Value line;
+        line["event"] = event;
+        line["is_dir"] = is_dir;
+        line["path"] = Full(path);
+        line["path_old"] = old.empty() ? "" : Full(old);
+        line["data"] = data;
+        std::ofstream(queue_, std::ios::app) << quivra::toString(line) << "\n";
+    }
+
+    /// A change of the disk together with its event.
+    void Write(const std::string& path, const std::string& text) {
+        const bool existed = fs::exists(Full(path));
+        Put(path, text);
+        Queue(existed ? EVENT_MODIFY : EVENT_CREATE, path);
+    }
+    void Mkdir(const std::string& path) {
+        if (fs::create_directory(Full(path))) {
+            Queue(EVENT_CREATE, path, "", true);
+        }
+    }
+    void Remove(const std::string& path) {
+        const bool is_dir = fs::is_directory(Full(path));
+        std::error_code ignored;  // a file may stand where the path wants a directory
+        if (fs::remove_all(Full(path), ignored) + 1 > 1) {
+            Queue(EVENT_DELETE, path, "", is_dir);
+        }
+    }
+    bool Move(const std::string& from, const std::string& to) {
+        const bool is_dir = fs::is_directory(Full(from));
+        if (from == to || rename(Full(from).c_str(), Full(to).c_str()) != 0) {
+            return false;
+        }
+        Queue(EVENT_RENAME, to, from, is_dir);
+        return true;
+    }
+
+    PassResult Run(PassListener listener = {}) {
+        Pass pass(queue_, root_, index_, scope_, std::move(listener));
+        return pass.Run();
+    }
+
+    /// What the index should hold: the disk, walked in the simplest way.
+    FakeIndex::Documents Expected() const {
+        FakeIndex::Documents expected;
+        const auto add = [&](const std::string& path, bool is_dir) {
+            if (scope_.Covers(path, is_dir)) {
+                expected[path] = Extract(path, scope_.NeedsMeta(path));
+            }
+        };
+        add(root_, true);
+        for (auto it = fs::recursive_directory_iterator(root_); it != fs::end(it); ++it) {
+            if (it->path().filename() == "@eaDir") {
+                it.disable_recursion_pending();
+            } else if (!it->is_symlink()) {
+                add(it->path(), it->is_directory());
+            }
+        }
+        return expected;
+    }
+
+    void IndexAll() {
+        Queue(EVENT_REINDEX, "");
+        Run();
+        index_.extracted = 0;
+        ASSERT_EQ(index_.Committed(), Expected());
+    }
+
+    const std::string root_ = "/volume1/share";
+    const std::string queue_ = root_ + "/@eaDir/fileindex/queue";
+    FakeIndex index_;
+    TestScope scope_;
+};
+
+TEST_F(PassTest, CarriesOutEveryKindOfEvent) {
+    Put("/dir/kept.txt", "kept");
+    Put("/dir/gone.txt", "gone");
+    Put("/dir/changed.txt", "before");
+    Put("/old/sub/a.txt", "a");
+    IndexAll();
+    Write("/dir/changed.txt", "after");
+    Remove("/dir/gone.txt");
+    Move("/old", "/new");
+    Write("/new/sub/a.txt", "b");
+    Write("/attr.txt", "x");
+    Queue(EVENT_ATTR, "/attr.txt");
+    Queue(EVENT_MODIFY, "/never/there.txt");
+    const PassResult result = Run();
+    EXPECT_EQ(index_.Committed(), Expected());
+    EXPECT_EQ(result.consumed, 7);
+    EXPECT_EQ(result.counts.renamed, 1U);
+    EXPECT_EQ(result.counts.skipped, 0U);
+    EXPECT_FALSE(fs::exists(queue_ + ".tmp"));
+    EXPECT_FALSE(Run().had_work);
+}
+
+TEST_F(PassTest, AttributesOfAFileWithoutDocumentIndexIt) {
+    Put("/a.txt", "a");
+    Queue(EVENT_ATTR, "/a.txt");
+    Run();
+    EXPECT_EQ(index_.Committed().count(Full("/a.txt")), 1U);
+    EXPECT_EQ(index_.Committed().at(Full("/a.txt")).text, "a");
+}
+
+TEST_F(PassTest, ARenamedDirectoryIsNotExtractedAgain) {
+    for (int i = 0; i < 50; ++i) {
+        Put("/old/" + std::to_string(i) + ".txt", "text");
+    }
+    Put("/file.txt", "file");
+    age_of_files = 1000;
+    IndexAll();
+    Move("/old", "/new");
+    Move("/file.txt", "/moved.txt");
+    Run();
+    EXPECT_EQ(index_.Committed(), Expected());
+    EXPECT_EQ(index_.extracted, 0);
+}
+
+// All files are of the same size and age here: only the right order of things keeps them apart.
+TEST_F(PassTest, RenamesThatCrossEachOther) {
+    using Moves = std::vector<std::pair<std::string, std::string>>;
+    const std::pair<const char*, Moves> cases[] = {
+        {"exchange of files", {{"/a", "/t"}, {"/b", "/a"}, {"/t", "/b"}}},
+        {"exchange of directories", {{"/d", "/t"}, {"/e", "/d"}, {"/t", "/e"}}},
+        {"chain", {{"/d", "/t"}, {"/t", "/u"}}},
+        {"chain over a replaced file", {{"/a", "/b"}, {"/b", "/c"}}},
+        {"rotation", {{"/b", "/c"}, {"/a", "/b"}}},
+        {"child, then parent", {{"/d/x", "/d/y"}, {"/d", "/t"}}},
+        {"parent, then child", {{"/d", "/t"}, {"/t/x", "/a"}}},
+        {"into a directory that moves on", {{"/a", "/d/x"}, {"/d", "/t"}}},
+        {"out of a directory that is replaced", {{"/d/x", "/t"}, {"/e", "/u"}, {"/t", "/e"}}},
+        {"twice to one place", {{"/a", "/c"}, {"/b", "/c"}}},
+        {"there and back", {{"/d", "/t"}, {"/t", "/d"}}},
+    };
+    for (const auto& [name, moves] : cases) {
+        SCOPED_TRACE(name);
+        for (const char* path : {"/d", "/e", "/t", "/u"}) {
+            fs::remove_all(Full(path));
+        }
+        for (const char* path : {"/a", "/b", "/c", "/d/x", "/d/y", "/e/x", "/e/y"}) {
+            Put(path, path + std::string(4 - std::string(path).size(), '_'));
+        }
+        age_of_files = 0;
+        IndexAll();
+        age_of_files = 1000;
+        for (const auto& [from, to] : moves) {
+            EXPECT_TRUE(Move(from, to));
+        }
+        Run();
+        EXPECT_EQ(index_.Committed(), Expected());
+    }
+}
+
+TEST_F(PassTest, ChangesHiddenByAReindexWithinOneSecondAreSeen) {
+    Put("/d/f.txt", "one");
+    IndexAll();
+    Put("/d/f.txt", "two");
+    Queue(EVENT_MODIFY, "/d/f.txt");
+    Queue(EVENT_REINDEX, "/d");
+    Run();
+    EXPECT_EQ(index_.Committed(), Expected());
+}
+
+TEST_F(PassTest, AFileThatIsIndexedForItselfIsNotExtractedTwice) {
+    Mkdir("/d");
+    Write("/d/f.txt", "text");
+    Run();
+    EXPECT_EQ(index_.extracted, 1);
+}
+
+TEST_F(PassTest, ChangedSettingsExtractTheirClassesAgain) {
+    Put("/a.txt", "text");
+    Put("/b.mp3", "sound");
+    age_of_files = 1000;
+    scope_.without_meta = {Full("")};
+    IndexAll();
+    scope_.without_meta.clear();
+    Json::Value settings;
+    settings["document"] = true;
+    settings["audio"] = false;
+    Queue(EVENT_UPDATE_CFG, "", "", true, settings);
+    Run();
+    EXPECT_EQ(index_.Committed().at(Full("/a.txt")).text, "text");
+    EXPECT_EQ(index_.Committed().at(Full("/b.mp3")).text, "");
+}
+
+TEST_F(PassTest, WhatLeavesTheScopeIsDroppedAndWhatEntersIsWalked) {
+    Put("/in/d/f.txt", "text");
+    Put("/out/e/g.txt", "text");
+    scope_.excluded = {Full("/out")};
+    IndexAll();
+    Move("/in/d", "/out/d");
+    Move("/out/e", "/in/e");
+    Run();
+    EXPECT_EQ(index_.Committed(), Expected());
+    scope_.excluded = {Full("/in")};
+    Queue(EVENT_UPDATE_CFG, "/in");
+    Queue(EVENT_UPDATE_CFG, "/out");
+    Run();
+    EXPECT_EQ(index_.Committed(), Expected());
+}
+
+TEST_F(PassTest, LinksMountsAndPreservedNamesAreNoFiles) {
+    Put("/d/f.txt", "text");
+    fs::create_directories(Full("/mount"));
+    fs::create_symlink(Full("/d"), Full("/link"));
+    fs::create_symlink("/etc/passwd", Full("/file"));
+    ASSERT_EQ(mkfifo(Full("/pipe").c_str(), 0600), 0);
+    ASSERT_EQ(mount(Full("/d").c_str(), Full("/mount").c_str(), nullptr, MS_BIND, nullptr), 0);
+    Queue(EVENT_REINDEX, "");
+    for (const char* path : {"/link/f.txt", "/file", "/pipe", "/mount/f.txt", "/@eaDir/x",
+                             "/d/@eaDir/fileindex", "/d/.DS_Store"}) {
+        Queue(EVENT_MODIFY, path);
+    }
+    Run();
+    FakeIndex::Documents expected;
+    for (const char* path : {"", "/d", "/d/f.txt"}) {
+        expected[Full(path)] = Extract(Full(path), true);
+    }
+    EXPECT_EQ(umount(Full("/mount").c_str()), 0);
+    EXPECT_EQ(index_.Committed(), expected);
+}
+
+TEST_F(PassTest, AnEmptyMountPointIsNoShareWithoutFiles) {
+    const std::string outside = "/var/queue";
+    Put("/f.txt", "text");
+    IndexAll();
+    const FakeIndex::Documents before = index_.Committed();
+    fs::remove_all(root_);
+    std::ofstream(outside) << R"({"event":512,"path":"/"})"
+                           << "\n";
+    const auto run = [&] { Pass(outside, root_, index_, scope_, {}).Run(); };
+    EXPECT_THROW(run(), Error);
+    fs::create_directories(root_);
+    EXPECT_THROW(run(), Error);
+    EXPECT_EQ(index_.Committed(), before);
+    EXPECT_TRUE(fs::exists(outside + ".tmp"));
+}
+
+TEST_F(PassTest, AVolumeThatVanishesInTheMiddleCommitsNothing) {
+    Put("/f.txt", "text");
+    Put("/g.txt", "text");
+    IndexAll();
+    const FakeIndex::Documents before = index_.Committed();
+    Queue(EVENT_REINDEX, "");
+    const std::string aside = root_ + ".aside";
+    const auto unmount = [&](const PassState&) {
+        if (!fs::exists(aside)) {
+            fs::rename(root_, aside);
+            fs::create_directories(root_);
+        }
+    };
+    EXPECT_THROW(Run(unmount), Error);
+    EXPECT_EQ(index_.Committed(), before);
+    fs::remove_all(root_);
+    fs::rename(aside, root_);
+    Run();
+    EXPECT_EQ(index_.Committed(), Expected());
+}
+
+TEST_F(PassTest, StopsBetweenOperationsAndGoesOn) {
+    for (int i = 0; i < 10; ++i) {
+        Write("/" + std::to_string(i) + ".txt", "text");
+    }
+    int operations = 0;
+    const auto stop = [&](const PassState& state) {
+        EXPECT_EQ(state.total, 10U);
+        if (++operations == 5) {
+            throw Stopped();
+        }
+    };
+    EXPECT_THROW(Run(stop), Stopped);
+    EXPECT_EQ(index_.extracted, 4);
+    EXPECT_TRUE(Run().had_work);
+    FakeIndex::Documents expected = Expected();
+    expected.erase(root_);  // no event named it
+    EXPECT_EQ(index_.Committed(), expected);
+}
+
+/// Random changes with their events. Few names, so that they collide; texts of one length.
+class Changes {
+  public:
+    Changes(unsigned int seed, std::function<std::string(int)> text)
+        : random_(seed), text_(std::move(text)) {}
+
+    template <typename Test>
+    void Apply(Test& test, int count) {
+        for (int i = 0; i < count; ++i) {
+            const std::string path = Path();
+            switch (random_() % 8) {
+                case 0:
+                case 1:
+                case 2:
+                    test.TryWrite(path, text_(++number_));
+                    break;
+                case 3:
+                    test.TryMkdir(path);
+                    break;
+                case 4:
+                    test.TryRemove(path);
+                    break;
+                default:
+                    test.TryMove(path, Path());
+            }
+        }
+    }
+
+  private:
+    std::string Path() {
+        std::string path;
+        for (auto depth = 1 + random_() % 3; depth > 0; --depth) {
+            path += std::string("/") + "abc"[random_() % 3];
+        }
+        return path;
+    }
+
+    std::mt19937 random_;
+    std::function<std::string(int)> text_;
+    int number_ = 0;
+};
+
+class RandomPassTest : public PassTest {
+  public:
+    void TryWrite(const std::string& path, const std::string& text) {
+        if (HasParent(path) && !fs::is_directory(Full(path))) {
+            Write(path, text);
+        }
+    }
+    void TryMkdir(const std::string& path) {
+        if (HasParent(path) && !fs::exists(Full(path))) {
+            Mkdir(path);
+        }
+    }
+    void TryRemove(const std::string& path) { Remove(path); }
+    void TryMove(const std::string& from, const std::string& to) {
+        if (HasParent(to) && fs::exists(Full(from))) {
+            Move(from, to);
+        }
+    }
+
+  protected:
+    bool HasParent(const std::string& path) const {
+        return fs::is_directory(Full(path.substr(0, path.rfind('/'))));
+    }
+    void StartAgain() {
+        fs::remove_all(root_);
+        fs::create_directories(root_ + "/@eaDir/fileindex");
+        index_ = FakeIndex();
+        IndexAll();
+    }
+};
+
+TEST_F(RandomPassTest, TheIndexEqualsTheDiskAfterEveryPass) {
+    for (unsigned int seed = 0; seed < 150; ++seed) {
+        SCOPED_TRACE(seed);
+        StartAgain();
+        // Old files are told apart by their size, young ones need not be.
+        age_of_files = seed % 2 == 0 ? 0 : 1000;
+        Changes changes(seed, [](int number) {
+            return age_of_files > 0 ? std::string(static_cast<std::size_t>(number), 'x')
+                                    : std::to_string(10000 + number);
+        });
+        for (int pass = 0; pass < 8; ++pass) {
+            changes.Apply(*this, 12);
+            Run();
+            ASSERT_EQ(index_.Committed(), Expected());
+        }
+    }
+}
+
+TEST_F(RandomPassTest, APassThatWasKilledAnywhereEndsTheSame) {
+    for (unsigned int seed = 0; seed < 12; ++seed) {
+        for (int kill = 1;; ++kill) {
+            SCOPED_TRACE("seed " + std::to_string(seed) + ", killed at " + std::to_string(kill));
+            StartAgain();
+            Changes changes(seed, [](int number) { return std::to_string(10000 + number); });
+            changes.Apply(*this, 15);
+            Run();
+            changes.Apply(*this, 15);
+            index_.KillAt(kill);
+            bool killed = false;
+            try {
+                Run();
+            } catch (const Killed&) {
+                killed = true;
+            }
+            index_.KillAt(0);
+            if (kill % 2 == 0) {
+                index_.LoseBatch();
+            }
+            changes.Apply(*this, 4);
+            Run();
+            Run();
+            ASSERT_EQ(index_.Committed(), Expected());
+            if (!killed) {
+                break;
+            }
+        }
+    }
+}
+
+}  // namespace
+}  // namespace fileindexd
