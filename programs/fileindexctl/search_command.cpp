@@ -297,10 +297,10 @@ void AddSearchCommand(CommandLine& line) {
     CLI::App& command = line.AddCommand(
         line.Root(), "search", "Find files by name, content and metadata: every word has to match",
         "  fileindexctl search sunset beach\n"
-        "  fileindexctl search 'annual report' -draft ext:pdf modified:>2024-01-01\n"
+        "  fileindexctl search 'annual report' -draft ext:pdf 'modified:>2024-01-01'\n"
         "  fileindexctl search name:invoice 'size:1M..20M' --sort -size --limit 50\n"
         "  fileindexctl search 'author:\"Ada Lovelace\"' --share books --json\n"
-        "  fileindexctl search --null ext:tmp | xargs -0 rm --\n\n"
+        "  fileindexctl search --null ext:iso | xargs -0 du -ch\n\n"
         "Words:\n"
         "  word        in the content, the metadata or a part of the name\n"
         "  -word       not there\n"

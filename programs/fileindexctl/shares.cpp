@@ -1,7 +1,6 @@
 #include "programs/fileindexctl/shares.h"
 
-#include <ini.h>
-
+#include <fstream>
 #include <set>
 
 #include "common/error.h"
@@ -14,10 +13,17 @@ namespace {
 
 constexpr const char* kSharesCfgPath = "/etc/kesto/shares.conf";
 
-int CollectSection(void* sections, const char* section, const char* /*name*/,
-                   const char* /*value*/) {
-    static_cast<std::set<std::string>*>(sections)->insert(section);
-    return 1;
+/// The names of the sections. The platform has no call that lists its shares; whether it takes a
+/// section for one is asked of it.
+void CollectSections(std::set<std::string>& names) {
+    std::ifstream file(kSharesCfgPath);
+    for (std::string line; std::getline(file, line);) {
+        const std::size_t begin = line.find_first_not_of(" \t");
+        const std::size_t end = line.find(']');
+        if (begin != std::string::npos && line[begin] == '[' && end != std::string::npos) {
+            names.insert(line.substr(begin + 1, end - begin - 1));
+        }
+    }
 }
 
 bool IsShare(const std::string& name) {
@@ -33,7 +39,7 @@ bool IsShare(const std::string& name) {
 
 std::vector<std::string> AllShares() {
     std::set<std::string> names = fileindex::FolderMgr().GetIndexedShares();
-    ini_parse(kSharesCfgPath, CollectSection, &names);
+    CollectSections(names);
     std::erase_if(names, [](const std::string& name) { return !IsShare(name); });
     return {names.begin(), names.end()};
 }

@@ -75,12 +75,10 @@ void PrintFolders(const Status& status, Session& session) {
 
 void PrintDaemons(const Status& status, Session& session) {
     if (!status.elastic_answers) {
-        session.out << "The search daemon does not answer: nothing can be found; start "
-                       "'kestoelasticd'.\n";
+        session.out << "kestoelasticd does not answer: nothing can be found until it runs.\n";
     }
     if (!status.indexer_answers) {
-        session.out << "The indexing daemon does not answer: changes wait in the queues; start "
-                       "'pkg-Quivra-fileindexd'.\n";
+        session.out << "fileindexd does not answer: changes wait in the queues until it runs.\n";
     }
     if (status.resume_time == fileindex::kPausedWithoutEnd) {
         session.out << "All indexing is paused until 'fileindexctl resume'.\n";

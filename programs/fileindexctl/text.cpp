@@ -96,17 +96,6 @@ std::size_t DisplayWidth(std::string_view text) {
         std::count_if(text.begin(), text.end(), [](char c) { return !IsContinuation(c); }));
 }
 
-std::string HumanSize(std::uint64_t bytes) {
-    constexpr std::array<const char*, 6> kUnits = {"B", "KB", "MB", "GB", "TB", "PB"};
-    std::size_t unit = 0;
-    auto amount = static_cast<double>(bytes);
-    while (amount >= 1024 && unit + 1 < kUnits.size()) {
-        amount /= 1024;
-        ++unit;
-    }
-    return Printed(unit == 0 ? "%.0f %s" : "%.1f %s", amount, kUnits[unit]);
-}
-
 std::string ProgressBar(double share, unsigned int width) {
     const unsigned int cells = width < 2 ? 0 : width - 2;
     const double filled = std::clamp(share, 0.0, 1.0) * cells;

@@ -1,6 +1,6 @@
 #pragma once
 
-#include <cstdint>
+#include <cstddef>
 #include <string>
 #include <string_view>
 
@@ -14,9 +14,6 @@ std::string EscapeControl(std::string_view bytes);
 
 /// The number of terminal cells of a text, near enough for tables: one for each character.
 std::size_t DisplayWidth(std::string_view text);
-
-/// "1.2 GB" and the like.
-std::string HumanSize(std::uint64_t bytes);
 
 /// A progress bar of `width` cells, brackets included, for a share from 0 to 1.
 std::string ProgressBar(double share, unsigned int width);

@@ -1,0 +1,130 @@
+#include <fstream>
+#include <regex>
+
+#include "programs/fileindexctl/error_text.h"
+#include "tests/programs/fileindexctl/ctl_fixture.h"
+
+namespace quivra::ctl {
+namespace {
+
+class WordingTest : public CtlTest {};
+
+TEST_F(WordingTest, EveryCodeOfTheLibraryHasACauseAndARemedy) {
+    std::ifstream header(FILEINDEX_SOURCE_DIR "/common/error.h");
+    const std::regex enumerator("k[A-Za-z]+ = ([0-9]+),");
+    int found = 0;
+    for (std::string line; std::getline(header, line);) {
+        std::smatch match;
+        if (std::regex_search(line, match, enumerator)) {
+            ++found;
+            const int code = std::stoi(match[1]);
+            EXPECT_TRUE(HasErrorText(code)) << line;
+            const std::string text = DescribeError("do X", Error(code, "why"));
+            EXPECT_EQ(text.find("cannot do X: "), 0U);
+            EXPECT_NE(text.find("; "), std::string::npos) << text;
+            EXPECT_TRUE(text.ends_with("[" + std::to_string(code) + "]")) << text;
+        }
+    }
+    EXPECT_GE(found, 19);
+}
+
+TEST_F(WordingTest, ErrorsAreOneSentence) {
+    EXPECT_EQ(
+        DescribeError("add /photo", Error(901, "Duplicated ID: /photo")),
+        "cannot add /photo: it is already indexed; use 'fileindexctl folder set' to change it "
+        "[901]");
+    EXPECT_NE(DescribeError("search share s", Error(4711, "Request failed, msg=odd"))
+                  .find("Request failed, msg=odd"),
+              std::string::npos);
+    // What an error is about may be hostile; the sentence stays one line.
+    const Result result = Piped({"queue", "show", "/tmp/no\nsuch\x1b[2J"});
+    EXPECT_EQ(result.status, kFailure);
+    EXPECT_EQ(result.err.find('\n'), result.err.size() - 1);
+    EXPECT_EQ(result.err.find('\x1b'), std::string::npos);
+}
+
+TEST_F(WordingTest, WrongCallsHaveStatusTwoAndDoNothing) {
+    const std::vector<std::string> rows[] = {
+        {},
+        {"frobnicate"},
+        {"queue"},
+        {"queue", "show"},
+        {"queue", "show", "a", "b"},
+        {"search"},
+        {"search", "--limit", "many", "word"},
+        {"search", "--no-such-option", "word"},
+        {"search", "--sort", "colour", "word"},
+        {"event", "add", "/volume1/s/a"},
+        {"event", "add", "/volume1/s/a", "--kind", "explode"},
+        {"event", "add", "/volume1/s/a", "--kind", "rename"},
+        {"event", "add", "/volume1/s/a", "--kind", "create", "--from", "/volume1/s/b"},
+        {"folder", "add"},
+        {"folder", "add", ""},
+        {"folder", "list", "--sort", "size"},
+        {"pause", "-1"},
+        {"pause", "soon"},
+        {"pause", "999999"},
+        {"share", "rename", "one"},
+        {"status", "now"},
+    };
+    fake::ScriptedServer indexer(kDaemonSocket);
+    for (const std::vector<std::string>& row : rows) {
+        const Result result = Piped(row);
+        EXPECT_EQ(result.status, kWrongCall) << testing::PrintToString(row);
+        EXPECT_EQ(result.out, "") << testing::PrintToString(row);
+        EXPECT_NE(result.err, "") << testing::PrintToString(row);
+    }
+    EXPECT_EQ(indexer.Connections(), 0);
+}
+
+TEST_F(WordingTest, HelpTeachesByExamplesAtEveryLevel) {
+    const std::vector<std::string> rows[] = {
+        {},
+        {"folder"},
+        {"folder", "add"},
+        {"folder", "set"},
+        {"folder", "get"},
+        {"folder", "list"},
+        {"folder", "delete"},
+        {"folder", "reindex"},
+        {"search"},
+        {"status"},
+        {"why"},
+        {"pause"},
+        {"resume"},
+        {"share"},
+        {"share", "list"},
+        {"share", "pause"},
+        {"share", "resume"},
+        {"share", "clear"},
+        {"share", "rename"},
+        {"share", "migrate"},
+        {"share", "check-recycle"},
+        {"volume"},
+        {"volume", "pause"},
+        {"volume", "resume"},
+        {"volume", "clear"},
+        {"queue"},
+        {"queue", "show"},
+        {"event"},
+        {"event", "add"},
+        {"services"},
+        {"services", "prepare"},
+    };
+    for (std::vector<std::string> row : rows) {
+        std::string call = "  fileindexctl ";
+        for (const std::string& word : row) {
+            call += word + " ";
+        }
+        call.pop_back();
+        row.push_back("--help");
+        const Result result = Piped(row);
+        EXPECT_EQ(result.status, kSuccess) << call;
+        EXPECT_NE(result.out.find("Examples:\n"), std::string::npos) << call;
+        EXPECT_NE(result.out.find(call, result.out.find("Examples:")), std::string::npos) << call;
+    }
+    EXPECT_EQ(Piped({"--version"}).status, kSuccess);
+}
+
+}  // namespace
+}  // namespace quivra::ctl
