@@ -19,22 +19,24 @@ inline constexpr const char* kAppName = "fileindex";
 // --- Folders -------------------------------------------------------------------------------------
 
 /// Add folders, or add and replace them: `folder_list` is an array of Folder::GetData objects and
-/// is taken as a whole or not at all. Once the set is saved, services are started and each touched
-/// share gets an index (where it had none), its daemon told and its queue registered with the file
-/// monitor; then the content that changed is queued. `updater_mode` accepts paths that may not be
-/// indexed. Both hold the folder lock throughout.
+/// is taken as a whole or not at all. Once the set is saved, services are started; for each touched
+/// share an index is created (by FolderAdd, where no folder of the share was there before), the
+/// indexing daemon told and the queue registered with the file monitor; then the content that
+/// changed is queued. `updater_mode` accepts paths that may not be indexed. Both hold the folder
+/// lock throughout.
 ///
 /// Error 120: no array, or a malformed element; 903: the path may not be indexed; 901 (FolderAdd):
 /// exists already; 900: more than 1000 folders; 1003: no space left on the share's volume. In all
 /// these cases nothing has changed. A failure after the save (of a daemon, 502 of the file monitor)
-/// leaves the set saved; repeat the request with FolderSet.
+/// leaves the set saved and the rest undone: delete the folders and add them again.
 QUIVRA_EXPORT void FolderAdd(const Json::Value& folder_list, bool updater_mode);
 QUIVRA_EXPORT void FolderSet(const Json::Value& folder_list, bool updater_mode);
 
 /// Removes the folders with these share paths (an array of strings) and queues the removal of
 /// their content. A share without folders left loses its index, its queue and its registration; a
 /// set without folders left stops the services. Holds the folder lock. Error 120: no array, or an
-/// element that is no string; 902: no such folder. In these cases nothing has changed.
+/// element that is no string; 902: no such folder. In these cases nothing has changed. A failure
+/// after the save leaves the set saved; ShareClearPaused then drops what is left of a share.
 QUIVRA_EXPORT void FolderDelete(const Json::Value& path_list);
 
 /// One page of the folders: {"folder": [Folder::GetDataWithAdditional...], "total": number of all

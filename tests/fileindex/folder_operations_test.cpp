@@ -1,0 +1,306 @@
+#include <poll.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include "fileindex/folder_mgr.h"
+#include "fileindex/index_mgr.h"
+#include "fileindex/status_mgr.h"
+#include "tests/fileindex/management_fixture.h"
+
+namespace quivra::fileindex {
+namespace {
+
+class FolderOperationsTest : public ManagementTest {
+  protected:
+    FolderOperationsTest() { Arrange(); }
+
+    void Arrange() {
+        Reset();
+        for (const char* share : {"a", "b"}) {
+            AddShare(share);
+            for (const char* folder : {"/x", "/y"}) {
+                std::filesystem::create_directories(std::string("/volume1/") + share + folder);
+            }
+        }
+        StartSteps();
+    }
+
+    static const std::vector<std::string>& StartedServices() {
+        static const std::vector<std::string> started = {
+            "KESTOSMBSetSpotlight(1)", "KLIBServiceRestart(samba)",
+            "KLIBServiceStart(kestocontentextractd, 1)",
+            "KLIBServicectlStart(pkg-Quivra-fileindexd, 1)"};
+        return started;
+    }
+    static Json::Value Paths(const std::vector<std::string>& paths) {
+        Json::Value list(Json::arrayValue);
+        for (const std::string& path : paths) {
+            list.append(path);
+        }
+        return list;
+    }
+    static Json::Value ConfigEvent(const std::string& path, const std::string& cfg) {
+        Json::Value event = Parse(R"({"event":131072,"path_old":""})");
+        event["path"] = path;
+        event["data"] = Parse(cfg);
+        return event;
+    }
+};
+
+constexpr const char* kAll = R"({"document":true,"audio":true,"video":true,"photo":true})";
+constexpr const char* kPhoto = R"({"document":false,"audio":false,"video":false,"photo":true})";
+
+TEST_F(FolderOperationsTest, AnAddedFolderMakesItsShareReady) {
+    FolderAdd(List({"/b/y", "/a/x", "/b/x"}), false);
+    std::vector<std::string> expected = {"save"};
+    expected.insert(expected.end(), StartedServices().begin(), StartedServices().end());
+    for (const std::string share : {"a", "b"}) {
+        expected.push_back("search index_create fileindex_" + share);
+        expected.push_back("daemon notify_setting_changed " + share);
+        expected.push_back("MonitorQueue::Upsert(" + QueuePath("/volume1/" + share) +
+                           ", fileindex, 1)");
+    }
+    EXPECT_EQ(Steps(), expected);
+    EXPECT_EQ(Folders(), List({"/b/y", "/a/x", "/b/x"}));
+    EXPECT_EQ(daemon_.Requests().back(), Parse(R"({"type":"notify_setting_changed",
+                  "data":{"share_name":"b","is_upsert":true}})"));
+    const auto queues = fake::MonitorQueues();
+    EXPECT_EQ(queues.at({QueuePath("/volume1/b"), "fileindex"}),
+              Parse(R"({"path":["/volume1/b/y","/volume1/b/x"],"mask":65478,
+                        "ignore":["@eaDir"]})"));
+    EXPECT_EQ(Queue("/volume1/b"),
+              (std::vector{ConfigEvent("/volume1/b/y", kAll), ConfigEvent("/volume1/b/x", kAll)}));
+    ExpectNothingHeld();
+}
+
+TEST_F(FolderOperationsTest, AKnownShareGetsNoIndexAndAnUnchangedFolderNoEvent) {
+    FolderAdd(List({"/a/x"}), false);
+    StartSteps();
+    FolderAdd(List({"/a/y"}), false);
+    FolderSet(List({"/a/x"}), false);
+    Json::Value without_photo(Json::arrayValue);
+    without_photo.append(FolderData("/a/x", false));
+    FolderSet(without_photo, false);
+    FolderSet(List({"/b/x"}), false);  // creates no index either
+    for (const std::string& step : Steps()) {
+        EXPECT_FALSE(step.starts_with("search ")) << step;
+    }
+    EXPECT_EQ(Queue("/volume1/a"),
+              (std::vector{ConfigEvent("/volume1/a/x", kAll), ConfigEvent("/volume1/a/y", kAll),
+                           ConfigEvent("/volume1/a/x", kPhoto)}));
+    StartSteps();
+    FolderSet(Json::Value(Json::arrayValue), false);
+    EXPECT_EQ(Steps(), (std::vector<std::string>{"save",  // the search integration is on already
+                                                 StartedServices()[2], StartedServices()[3]}));
+}
+
+TEST_F(FolderOperationsTest, ARefusedRequestChangesNothing) {
+    FolderAdd(List({"/a/x"}), false);
+    const Json::Value before = Folders();
+    struct Row {
+        const char* what;
+        Json::Value list;
+        int code;
+        std::string reason;
+        const char* condition;
+    };
+    Json::Value malformed = List({"/a/y", "/b/x"});
+    malformed[1].removeMember("photo");
+    std::vector<std::string> many;
+    for (int i = 0; i <= 1000; ++i) {
+        many.push_back("/b/" + std::to_string(i));
+        std::filesystem::create_directories("/volume1" + many.back());
+    }
+    const Row rows[] = {
+        {"no array", FolderData("/a/y"), 120, "", "!folder_list.isArray()"},
+        {"malformed", malformed, 120, "Missing property: photo", nullptr},
+        {"not indexable", List({"/a/y", "/a/none"}), 903, "Path cannot index: /a/none",
+         "!CanPathBeIndexed(folder_new->GetPath()) && !updater_mode"},
+        {"duplicate", List({"/a/y", "/a/x"}), 901, "Duplicated ID: /a/x",
+         "create && folder_mgr.HasFolder(folder_new->GetPath())"},
+        {"twice", List({"/a/y", "/a/y"}), 901, "Duplicated ID: /a/y", nullptr},
+        {"too many", List(many), 900, "", nullptr},
+        {"unknown share", List({"/c"}), 800, "c", nullptr},
+        {"no share path", List({"a/y"}), 120, "a/y", nullptr},
+    };
+    StartSteps();
+    for (const Row& row : rows) {
+        const Error error = ErrorOf([&] { FolderAdd(row.list, false); });
+        EXPECT_EQ(error.code, row.code) << row.what;
+        EXPECT_TRUE(error.reason.starts_with(row.reason)) << error.reason;
+        if (row.condition != nullptr) {
+            EXPECT_FALSE(fake::LogLinesWith(std::string("Failed [") + row.condition).empty());
+        }
+    }
+    fake::SetSpace(false);
+    const Error error = ErrorOf([&] { FolderSet(List({"/a/y"}), false); });
+    EXPECT_EQ(error.code, 1003);
+    EXPECT_EQ(error.reason, "Share (a) space not enough");
+    EXPECT_TRUE(Steps().empty());
+    EXPECT_EQ(Folders(), before);
+    ExpectNothingHeld();
+
+    fake::SetSpace(true);
+    FolderAdd(List({"/a/none"}), true);  // an updater may
+    EXPECT_EQ(Folders().size(), 2U);
+}
+
+TEST_F(FolderOperationsTest, FoldersAreListedAndFetched) {
+    FolderAdd(List({"/a/x", "/b/y"}), false);
+    Json::Value result;
+    FolderList(result, 1, 5, "path", "desc", Parse(R"(["status"])"));
+    Json::Value expected = Parse(R"({"total":2,"offset":1})");
+    expected["folder"][0] = FolderData("/a/x");
+    expected["folder"][0]["additional"] = Parse(R"({"status":{"text":"processing"}})");
+    EXPECT_EQ(toString(result), toString(expected));
+    FolderList(result, 7, 5, "", "", Json::Value(Json::arrayValue));
+    EXPECT_EQ(toString(result), R"({"folder":[],"offset":7,"total":2})");
+    EXPECT_EQ(ErrorOf([&] { FolderList(result, 0, 5, "", "", "status"); }).code, 120);
+    FolderGet(result, "/b/y");
+    EXPECT_EQ(result, FolderData("/b/y"));
+    EXPECT_EQ(ErrorOf([&] { FolderGet(result, "/b"); }).code, 902);
+    EXPECT_EQ(result, FolderData("/b/y"));
+}
+
+TEST_F(FolderOperationsTest, AReindexIsQueuedAndEndsTheNeedForOne) {
+    FolderAdd(List({"/a/x"}), false);
+    std::filesystem::remove(QueuePath("/volume1/a"));
+    StatusMgr().SetShareStatus("a", kShareNeedReindex);
+    StatusMgr().SetShareStatus("b", kShareNeedReindex);
+    FolderReindex(Paths({"/a/x", "/b/x", "/a/x/deep", "/a"}));
+    const auto event = [](const std::string& path) {
+        Json::Value line = Parse(R"({"event":65536,"path_old":"","data":null})");
+        line["path"] = path;
+        return line;
+    };
+    EXPECT_EQ(Queue("/volume1/a"),
+              (std::vector{event("/volume1/a/x"), event("/volume1/a")}));  // one covers the other
+    EXPECT_TRUE(Queue("/volume1/b").empty());
+    EXPECT_EQ(Status()["share"], Parse(R"({"a":0,"b":1})"));
+
+    EXPECT_EQ(ErrorOf([] { FolderReindex("/a"); }).code, 120);
+    EXPECT_EQ(fake::LogLinesWith("Failed [!path_list.isArray()]").size(), 1U);
+    std::filesystem::remove(QueuePath("/volume1/a"));
+    Json::Value mixed = Paths({"/a/y"});
+    mixed.append(5);
+    EXPECT_EQ(ErrorOf([&] { FolderReindex(mixed); }).code, 120);
+    EXPECT_EQ(fake::LogLinesWith("Failed [!it.isString()]").size(), 1U);
+    EXPECT_EQ(Queue("/volume1/a"), std::vector{event("/volume1/a/y")});
+
+    // What could not be queued keeps its flag.
+    fake::FailNext("FILEIDXQueuePathCompose");
+    FolderReindex(Paths({"/a/x"}));
+    EXPECT_EQ(Status()["share"]["a"], 1);
+}
+
+TEST_F(FolderOperationsTest, DeletingTheLastFolderDropsTheShareThenTheServices) {
+    FolderAdd(List({"/a", "/a/x", "/b/x"}), false);
+    StartSteps();
+    FolderDelete(Paths({"/a/x", "/b/x"}));
+    const std::string queue_b = QueuePath("/volume1/b");
+    std::vector<std::string> drop_b = {"daemon notify_setting_changed b",
+                                       "MonitorQueue::Delete(" + queue_b + ", fileindex, 1)",
+                                       "search index_delete fileindex_b",
+                                       "KLIBCExec(/bin/rm, -rf, " + queue_b + ")",
+                                       "KLIBCExec(/bin/rm, -rf, " + queue_b + ".tmp)",
+                                       "KLIBCExec(/bin/rm, -rf, /volume1/b/@eaDir/fileindex/db)",
+                                       "save"};
+    std::vector<std::string> expected = {
+        "save", "daemon notify_setting_changed a",
+        "MonitorQueue::Upsert(" + QueuePath("/volume1/a") + ", fileindex, 1)"};
+    expected.insert(expected.end(), drop_b.begin(), drop_b.end());
+    EXPECT_EQ(Steps(), expected);
+    EXPECT_EQ(Folders(), List({"/a"}));
+    EXPECT_EQ(daemon_.Requests().back()["data"]["is_upsert"], false);
+    // The enclosing folder has the same switches as the one that went: only /b/x sent an event.
+    EXPECT_EQ(Queue("/volume1/a").size(), 1U);
+    EXPECT_EQ(Queue("/volume1/b").back(), ConfigEvent("/volume1/b/x", kAll));
+    EXPECT_EQ(Status()["share"], Json::Value(Json::objectValue));
+
+    const Json::Value before = Folders();
+    EXPECT_EQ(ErrorOf([] { FolderDelete("/a"); }).code, 120);
+    Json::Value mixed = Paths({"/a"});
+    mixed.append(Json::Value());
+    EXPECT_EQ(ErrorOf([&] { FolderDelete(mixed); }).code, 120);
+    EXPECT_EQ(ErrorOf([&] { FolderDelete(Paths({"/b/x"})); }).code, 902);
+    EXPECT_EQ(Folders(), before);
+
+    StartSteps();
+    FolderDelete(Paths({"/a"}));
+    const auto steps = Steps();
+    EXPECT_EQ(std::vector(steps.end() - 4, steps.end()),
+              (std::vector<std::string>{"KESTOSMBSetSpotlight(0)", "KLIBServiceRestart(samba)",
+                                        "KLIBServiceStop(kestocontentextractd, 0)",
+                                        "KLIBServicectlStop(pkg-Quivra-fileindexd, 1)"}));
+}
+
+TEST_F(FolderOperationsTest, AnInterruptedRequestLeavesTheOldSetOrTheNewOne) {
+    struct Operation {
+        const char* name;
+        std::function<void()> run;
+    };
+    const Operation operations[] = {
+        {"add",
+         [] {
+             FolderAdd(List({"/a/y", "/b/x"}), false);
+         }},
+        {"set",
+         [] {
+             FolderSet(List({"/a/x", "/a/y"}), false);
+         }},
+        {"delete", [] { FolderDelete(Paths({"/a/x"})); }},
+    };
+    for (const Operation& operation : operations) {
+        const auto arrange = [&](int failing_call) {
+            Arrange();
+            FolderAdd(List({"/a/x"}), false);
+            StartSteps(failing_call);
+        };
+        arrange(kNever);
+        const Json::Value before = Folders();
+        operation.run();
+        const Json::Value after = Folders();
+        const int calls = OutsideCalls();
+        int errors = 0;
+        for (int call = 1; call <= calls; ++call) {
+            arrange(call);
+            const Error error = ErrorOf(operation.run);
+            errors += error.code != 0 ? 1 : 0;
+            const Json::Value left = Folders();
+            EXPECT_TRUE(left == before || left == after) << operation.name << " at " << call;
+            if (error.code == 0) {
+                EXPECT_EQ(left, after) << operation.name << " at " << call;
+            }
+            ExpectNothingHeld();
+        }
+        EXPECT_GT(errors, calls / 4) << operation.name << ": hardly any call was made to fail";
+    }
+}
+
+TEST_F(FolderOperationsTest, TwoProcessesLoseNothing) {
+    // Lock attempts are few, and a faked sleep would use them up at once.
+    fake::OnSleep([](auto) { poll(nullptr, 0, 20); });
+    constexpr int kEach = 10;
+    for (const std::string share : {"a", "b"}) {
+        for (int i = 0; i < kEach; ++i) {
+            std::filesystem::create_directories("/volume1/" + share + "/" + std::to_string(i));
+        }
+        if (fork() == 0) {
+            int code = 0;
+            for (int i = 0; i < kEach && code == 0; ++i) {
+                code = ErrorOf([&] {
+                           FolderAdd(List({"/" + share + "/" + std::to_string(i)}), false);
+                       }).code;
+            }
+            _exit(code == 0 ? 0 : 1);
+        }
+    }
+    int status = 0;
+    while (wait(&status) > 0) {
+        EXPECT_EQ(status, 0);
+    }
+    EXPECT_EQ(Folders().size(), 2U * kEach);
+}
+
+}  // namespace
+}  // namespace quivra::fileindex

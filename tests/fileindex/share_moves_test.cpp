@@ -1,0 +1,175 @@
+#include "fileindex/folder_mgr.h"
+#include "fileindex/index_mgr.h"
+#include "fileindex/status_mgr.h"
+#include "tests/fileindex/management_fixture.h"
+
+namespace quivra::fileindex {
+namespace {
+
+class ShareMovesTest : public ManagementTest {
+  protected:
+    ShareMovesTest() { Arrange(); }
+
+    /// The platform knows the share "new" at /volume1/new, which was "old" a moment ago.
+    void Arrange() {
+        Reset();
+        AddShare("new");
+        AddShare("other");
+        EXPECT_TRUE(toFile(List({"/old", "/other", "/old/x"}), kFileIndexFoldersCfgPath));
+        StartSteps();
+    }
+    static Json::Value Line(int event, const std::string& path, const std::string& path_old) {
+        Json::Value line = Parse(R"({"is_dir":true,"data":null})");
+        line["event"] = event;
+        line["path"] = path;
+        line["path_old"] = path_old;
+        return line;
+    }
+    static bool IsFlagged(const std::string& share) {
+        return StatusMgr().GetShareStatus(share) == 1;
+    }
+};
+
+TEST_F(ShareMovesTest, ARenamedShareTakesEverythingAlong) {
+    StatusMgr().SetShareStatus("old", kShareNeedReindex);
+    StartSteps();
+    ShareRename("old", "new");
+    EXPECT_EQ(Steps(),
+              (std::vector<std::string>{
+                  "save",  // flagged for the time of the move
+                  "daemon worker_delete old",
+                  "MonitorQueue::Delete(/volume1/old/@eaDir/fileindex/queue, fileindex, 1)",
+                  "search index_config_set fileindex_old",
+                  "save",          // folders
+                  "save", "save",  // flags: first the new name's, then the old name's
+                  "MonitorQueue::Upsert(/volume1/new/@eaDir/fileindex/queue, fileindex, 1)",
+                  "daemon worker_create new"}));
+    EXPECT_EQ(search_.Requests().back()["data"]["data"],
+              Parse(R"({"id":"fileindex_new","path":"/volume1/new/@eaDir/fileindex/db"})"));
+    EXPECT_EQ(Folders(), List({"/new", "/other", "/new/x"}));
+    EXPECT_EQ(Status()["share"], Parse(R"({"new":1})"));
+    EXPECT_EQ(Queue("/volume1/new"), std::vector{Line(256, "/volume1/new", "/volume1/old")});
+    EXPECT_EQ(fake::MonitorQueues().at({QueuePath("/volume1/new"), "fileindex"})["path"],
+              Parse(R"(["/volume1/new","/volume1/new/x"])"));
+}
+
+TEST_F(ShareMovesTest, AMigratedShareKeepsItsName) {
+    EXPECT_TRUE(toFile(List({"/new", "/new/x"}), kFileIndexFoldersCfgPath));
+    ShareMigrate("new", "/volume9/new");
+    EXPECT_EQ(search_.Requests().back(),
+              Parse(R"({"command":"index_config_set","data":{"id":"fileindex_new",
+                        "data":{"path":"/volume1/new/@eaDir/fileindex/db"}}})"));
+    EXPECT_EQ(Steps()[2],
+              "MonitorQueue::Delete(/volume9/new/@eaDir/fileindex/queue, fileindex, 1)");
+    EXPECT_EQ(Queue("/volume1/new"), std::vector{Line(256, "/volume1/new", "/volume9/new")});
+    EXPECT_FALSE(IsFlagged("new"));
+    EXPECT_EQ(Steps()[Steps().size() - 2], "daemon worker_create new");
+}
+
+TEST_F(ShareMovesTest, APausedShareStaysPaused) {
+    Json::Value folders = List({"/old", "/other", "/old/x"});
+    folders[0]["paused"] = folders[2]["paused"] = true;
+    EXPECT_TRUE(toFile(folders, kFileIndexFoldersCfgPath));
+    ShareRename("old", "new");
+    EXPECT_TRUE(fake::MonitorQueues().empty());
+    for (const std::string& step : Steps()) {
+        EXPECT_NE(step, "daemon worker_create new");
+    }
+    EXPECT_EQ(Queue("/volume1/new").size(), 1U);
+}
+
+TEST_F(ShareMovesTest, SharesThatNoFolderIndexesArePassedOver) {
+    AddShare("free");
+    ShareRename("free", "new");
+    ShareRename("free", "other");  // indexed, but nothing is left to be done
+    ShareRename("other", "other");
+    ShareMigrate("free", "/volume9/free");
+    ShareMigrate("other", "/volume1/other");  // has not moved
+    ShareCheckRecycle("free");
+    EXPECT_TRUE(Steps().empty());
+    EXPECT_EQ(ErrorOf([] { ShareRename("old", "unknown"); }).code, 800);
+    EXPECT_EQ(Folders(), List({"/old", "/other", "/old/x"}));
+}
+
+/// Every outside call fails in turn; the second call must bring the same end, and must have queued
+/// a reindex where the first left the share unwatched.
+TEST_F(ShareMovesTest, ASecondCallFinishesWhatTheFirstLeft) {
+    struct Operation {
+        const char* name;
+        bool is_rename;
+        std::function<void()> run;
+    };
+    const Operation operations[] = {
+        {"rename", true, [] { ShareRename("old", "new"); }},
+        {"migrate", false, [] { ShareMigrate("new", "/volume9/new"); }},
+    };
+    for (const Operation& operation : operations) {
+        const std::string from = operation.is_rename ? "old" : "new";
+        const auto arrange = [&] {
+            Arrange();
+            if (!operation.is_rename) {
+                EXPECT_TRUE(toFile(List({"/new", "/other", "/new/x"}), kFileIndexFoldersCfgPath));
+            }
+        };
+        arrange();
+        operation.run();
+        const Json::Value folders = Folders();
+        const auto registrations = fake::MonitorQueues();
+        const auto event = Queue("/volume1/new").at(0);
+        const int calls = OutsideCalls();
+        for (int call = 1; call <= calls; ++call) {
+            arrange();
+            StartSteps(call);
+            const Error error = ErrorOf(operation.run);
+            const auto first_steps = Steps();
+            const bool was_unwatched =
+                std::find(first_steps.begin(), first_steps.end(), "daemon worker_delete " + from) !=
+                first_steps.end();
+            const bool was_flagged = IsFlagged("new");
+            ExpectNothingHeld();
+            StartSteps();
+            operation.run();
+            const std::string where = operation.name + std::string(" at ") + std::to_string(call);
+            EXPECT_EQ(Folders(), folders) << where;
+            EXPECT_EQ(fake::MonitorQueues(), registrations) << where;
+            EXPECT_FALSE(IsFlagged("new")) << where;
+            const auto queue = Queue("/volume1/new");
+            ASSERT_FALSE(queue.empty()) << where;
+            EXPECT_EQ(queue[0], event) << where;
+            if (was_flagged) {
+                EXPECT_EQ(queue.back(), Line(65536, "/volume1/new", "")) << where;
+                const auto steps = Steps();
+                EXPECT_EQ(steps[steps.size() - 2], "daemon worker_create new") << where;
+            }
+            EXPECT_TRUE(error.code == 0 || was_flagged || !was_unwatched) << where;
+            ExpectNothingHeld();
+        }
+    }
+}
+
+TEST_F(ShareMovesTest, ASwitchedRecycleBinIsSettled) {
+    AddShare("homes");
+    for (const char* directory : {"alice/#recycle", "bob", "carol/#recycle"}) {
+        std::filesystem::create_directories(std::string("/volume1/homes/") + directory);
+    }
+    WriteFile("/volume1/homes/file", "");
+    EXPECT_TRUE(toFile(List({"/homes", "/other"}), kFileIndexFoldersCfgPath));
+    ShareCheckRecycle("other");
+    ShareCheckRecycle("homes");
+    const auto paths = [](const std::string& root) {
+        std::vector<std::string> found;
+        for (const Json::Value& line : Queue(root)) {
+            EXPECT_EQ(line["event"], 65536);
+            found.push_back(line["path"].asString());
+        }
+        std::sort(found.begin(), found.end());
+        return found;
+    };
+    EXPECT_EQ(paths("/volume1/other"), std::vector<std::string>{"/volume1/other/#recycle"});
+    EXPECT_EQ(paths("/volume1/homes"),
+              (std::vector<std::string>{"/volume1/homes/#recycle", "/volume1/homes/alice/#recycle",
+                                        "/volume1/homes/carol/#recycle"}));
+}
+
+}  // namespace
+}  // namespace quivra::fileindex
