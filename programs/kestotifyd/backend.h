@@ -1,0 +1,56 @@
+#pragma once
+
+#include <optional>
+#include <string>
+
+#include "programs/kestotifyd/change.h"
+
+namespace kestotifyd {
+
+/// What a back end tells the monitor. Roots are named by their path.
+class BackendSink {
+  public:
+    virtual ~BackendSink() = default;
+
+    virtual void OnChange(const Change& change) = 0;
+
+    /// Every directory below the root is watched from here on, but for those that OnGaps told of.
+    virtual void OnRootComplete(const std::string& root) = 0;
+
+    /// Some directories below the root could not be watched: what happens there is lost.
+    virtual void OnGaps(const std::string& root) = 0;
+
+    /// The root is not at its path any more, and the back end has dropped it.
+    virtual void OnRootLost(const std::string& root) = 0;
+
+    /// Events below the root were lost. A back end that must look for unwatched directories calls
+    /// OnRootComplete once more when it has.
+    virtual void OnOverflow(const std::string& root) = 0;
+
+    /// Whether the directory's contents are of interest to any queue. No for a mount point: what
+    /// is mounted there is a root of its own.
+    virtual bool ShouldWatch(const std::string& directory) const = 0;
+};
+
+/// A way to learn what happens below directories. All calls come from one thread; none blocks.
+class Backend {
+  public:
+    virtual ~Backend() = default;
+
+    /// To wait for until it is readable.
+    virtual int Fd() const = 0;
+
+    /// Starts to watch a directory tree. False, with errno set and nothing watched, when that
+    /// cannot be. The sink's OnRootComplete follows, from Work.
+    virtual bool AddRoot(const std::string& path) = 0;
+    virtual void RemoveRoot(const std::string& path) = 0;
+
+    /// Takes the events that are there and goes on with a piece of pending work, telling the sink.
+    /// With `is_last` nothing waits for more to come.
+    virtual void Work(bool is_last) = 0;
+
+    /// When Work wants to be called although nothing is readable; none when it does not.
+    virtual std::optional<Time> NextDue() const = 0;
+};
+
+}  // namespace kestotifyd

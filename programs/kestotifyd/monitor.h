@@ -1,0 +1,80 @@
+#pragma once
+
+#include <cstdint>
+#include <map>
+#include <memory>
+#include <optional>
+#include <set>
+#include <string>
+
+#include "common/unique_fd.h"
+#include "programs/kestotifyd/backend.h"
+#include "programs/kestotifyd/mount_table.h"
+#include "programs/kestotifyd/options.h"
+#include "programs/kestotifyd/queue_set.h"
+#include "programs/kestotifyd/watched_folders.h"
+
+namespace kestotifyd {
+
+/// The file monitor: follows the registrations, keeps each registered folder watched by the best
+/// back end that its file system offers, and hands what happens to the queues. One thread, one
+/// epoll loop; the stop signals must be blocked by the caller.
+class Monitor : private BackendSink {
+  public:
+    /// Takes the lock that only one monitor holds. Throws Error 506 when another one runs, 502 when
+    /// a directory or descriptor that it needs cannot be had.
+    explicit Monitor(const Options& options);
+    ~Monitor() override;
+
+    /// Runs until SIGTERM or SIGINT; then takes and writes what is there, and returns.
+    void Run();
+
+  private:
+    /// A directory tree to be watched: a registered folder that lies in no other one, or a file
+    /// system mounted below one.
+    struct Root {
+        Backend* backend = nullptr;  ///< null while the folder is not there
+        bool is_complete = false;
+        std::uint64_t device = 0;
+        std::uint64_t inode = 0;
+        std::string mount_point{};
+        bool is_failure_logged = false;
+    };
+
+    void OnChange(const Change& change) override;
+    void OnRootComplete(const std::string& root) override;
+    void OnGaps(const std::string& root) override;
+    void OnRootLost(const std::string& root) override;
+    void OnOverflow(const std::string& root) override;
+    bool ShouldWatch(const std::string& directory) const override;
+
+    void WatchDescriptor(int fd, std::uint32_t events);
+    void LoadRegistrations(bool is_start);
+    void HandleMountChange();
+    void UpdateRoots();
+    void CheckRoots();
+    bool IsPresent(const std::string& path) const;
+    void StartRoot(const std::string& path, Root& root);
+    Backend* ChooseBackend(const std::string& path);
+    void DropObsoleteRoots();
+    void WorkBackends(bool is_last);
+    int WaitMilliseconds(Time now) const;
+    void Stop();
+
+    const Options options_;
+    quivra::UniqueFd instance_lock_;
+    quivra::UniqueFd epoll_;
+    quivra::UniqueFd signals_;
+    quivra::UniqueFd registration_events_;
+    MountTable mounts_;
+    WatchedFolders watched_;
+    QueueSet queues_;
+    std::unique_ptr<Backend> inotify_;
+    std::unique_ptr<Backend> fanotify_;
+    std::map<std::string, Root> roots_;
+    std::set<std::string> wanted_roots_;  ///< roots_ holds others until they are replaced
+    Time next_check_{};
+    bool are_roots_stale_ = false;  ///< CheckRoots has something to do before next_check_
+};
+
+}  // namespace kestotifyd

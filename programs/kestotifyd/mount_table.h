@@ -1,0 +1,35 @@
+#pragma once
+
+#include <set>
+#include <string>
+
+#include "common/unique_fd.h"
+
+namespace kestotifyd {
+
+/// Where file systems are mounted, as this process sees it.
+class MountTable {
+  public:
+    MountTable();
+
+    /// Polls as exceptional (EPOLLPRI) when the table has changed since the last Reload.
+    int Fd() const { return fd_.Get(); }
+
+    /// Reads the table again; whether the set of mount points is another one.
+    bool Reload();
+
+    bool IsMountPoint(const std::string& path) const { return points_.contains(path); }
+
+    /// The mount point of the file system that holds the path; empty when the table is unreadable.
+    std::string Covering(const std::string& path) const;
+
+    /// The mount points strictly below the path, sorted. The kernel's own virtual file systems are
+    /// left out: nothing in them is a document.
+    std::set<std::string> Below(const std::string& path) const;
+
+  private:
+    quivra::UniqueFd fd_;
+    std::set<std::string> points_;
+};
+
+}  // namespace kestotifyd

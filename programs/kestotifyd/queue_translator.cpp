@@ -1,0 +1,171 @@
+#include "programs/kestotifyd/queue_translator.h"
+
+#include <algorithm>
+
+#include "common/json.h"
+#include "fileindex/event.h"
+
+namespace kestotifyd {
+namespace {
+
+using quivra::fileindex::EVENT_ATTR;
+using quivra::fileindex::EVENT_CREATE;
+using quivra::fileindex::EVENT_DELETE;
+using quivra::fileindex::EVENT_MODIFY;
+using quivra::fileindex::EVENT_QUEUE_CRASH;
+using quivra::fileindex::EVENT_REINDEX;
+using quivra::fileindex::EVENT_RENAME;
+
+/// The mask selects kinds of change. What repairs a gap is no change, and always goes out.
+constexpr std::uint32_t kUnmaskedEvents = EVENT_QUEUE_CRASH | EVENT_REINDEX;
+
+/// Above it everything held is reported at once, so that a storm of writes stays bounded in memory.
+constexpr std::size_t kMaxHeld = 65536;
+
+}  // namespace
+
+bool IsAtOrBelow(const std::string& path, const std::string& folder) {
+    if (folder == "/") {
+        return true;
+    }
+    return path.compare(0, folder.size(), folder) == 0 &&
+           (path.size() == folder.size() || path[folder.size()] == '/');
+}
+
+QueueTranslator::QueueTranslator(Registration registration, NameTest is_hidden)
+    : registration_(std::move(registration)), is_hidden_(std::move(is_hidden)) {}
+
+bool QueueTranslator::IsIgnoredBelow(const std::string& path, const std::string& folder) const {
+    const std::vector<std::string>& ignore = registration_.ignore;
+    for (std::size_t begin = folder == "/" ? 1 : folder.size() + 1; begin < path.size();) {
+        const std::size_t end = std::min(path.find('/', begin), path.size());
+        const std::string name = path.substr(begin, end - begin);
+        if (std::find(ignore.begin(), ignore.end(), name) != ignore.end() || is_hidden_(name)) {
+            return true;
+        }
+        begin = end + 1;
+    }
+    return false;
+}
+
+bool QueueTranslator::Matches(const std::string& path, bool muted_too) const {
+    // A consumer that works on its own queue must not be woken by that.
+    if (path == registration_.queue || path == registration_.queue + ".tmp") {
+        return false;
+    }
+    return std::any_of(
+        registration_.folders.begin(), registration_.folders.end(), [&](const std::string& folder) {
+            return IsAtOrBelow(path, folder) && (muted_too || !muted_.contains(folder)) &&
+                   !IsIgnoredBelow(path, folder);
+        });
+}
+
+void QueueTranslator::Apply(const Change& change, Time now) {
+    using Kind = Change::Kind;
+    if (change.kind == Kind::kReindex || change.kind == Kind::kCrashed) {
+        Emit(change.kind == Kind::kReindex ? EVENT_REINDEX : EVENT_QUEUE_CRASH, true, change.path);
+        return;
+    }
+    if (change.kind == Kind::kRenamed) {
+        ApplyRename(change);
+        return;
+    }
+    if (!Wants(change.path)) {
+        return;
+    }
+    switch (change.kind) {
+        case Kind::kCreated:
+            Emit(EVENT_CREATE, change.is_dir, change.path);
+            break;
+        case Kind::kWritten:
+            Hold(change.path, now + kOpenFileInterval);
+            break;
+        case Kind::kClosed:
+            Hold(change.path, now);
+            break;
+        case Kind::kAttributes:
+            Emit(EVENT_ATTR, change.is_dir, change.path);
+            break;
+        default:
+            ReleaseBelow(change.path, false);
+            Emit(EVENT_DELETE, change.is_dir, change.path);
+            break;
+    }
+}
+
+void QueueTranslator::ApplyRename(const Change& change) {
+    const bool leaves = Wants(change.path_old);
+    const bool enters = Wants(change.path);
+    if (leaves && enters) {
+        ReleaseBelow(change.path_old, true);  // under the name that the consumer knows
+        Emit(EVENT_RENAME, change.is_dir, change.path, change.path_old);
+    } else if (leaves) {
+        ReleaseBelow(change.path_old, false);
+        Emit(EVENT_DELETE, change.is_dir, change.path_old);
+    } else if (enters) {
+        Emit(EVENT_CREATE, change.is_dir, change.path);
+    }
+}
+
+void QueueTranslator::Hold(const std::string& path, Time due) {
+    const auto [it, is_new] = held_.emplace(path, due);
+    it->second = std::min(it->second, due);
+    if (is_new && held_.size() > kMaxHeld) {
+        Flush(Time::max());
+    }
+}
+
+void QueueTranslator::ReleaseBelow(const std::string& path, bool emit) {
+    // Names that merely begin alike ("/a/b.txt") sort between "/a/b" and "/a/b/c".
+    for (auto it = held_.lower_bound(path);
+         it != held_.end() && it->first.compare(0, path.size(), path) == 0;) {
+        if (!IsAtOrBelow(it->first, path)) {
+            ++it;
+            continue;
+        }
+        if (emit) {
+            Emit(EVENT_MODIFY, false, it->first);
+        }
+        it = held_.erase(it);
+    }
+}
+
+std::optional<Time> QueueTranslator::NextDue() const {
+    if (held_.empty()) {
+        return std::nullopt;
+    }
+    return std::min_element(held_.begin(), held_.end(),
+                            [](const auto& a, const auto& b) { return a.second < b.second; })
+        ->second;
+}
+
+void QueueTranslator::Flush(Time now) {
+    std::erase_if(held_, [&](const auto& held) {
+        if (held.second > now) {
+            return false;
+        }
+        Emit(EVENT_MODIFY, false, held.first);
+        return true;
+    });
+}
+
+void QueueTranslator::Emit(std::uint32_t event, bool is_dir, const std::string& path,
+                           const std::string& path_old) {
+    if ((event & (registration_.mask | kUnmaskedEvents)) == 0) {
+        return;
+    }
+    Json::Value line(Json::objectValue);
+    line["event"] = event;
+    line["is_dir"] = is_dir;
+    line["path"] = path;
+    if (event == EVENT_RENAME) {
+        line["path_old"] = path_old;
+    }
+    std::string text = quivra::toString(line) + "\n";
+    // chown, chmod and utime of one file in a row say the same thing three times.
+    if (lines_.empty() || lines_.back() != text) {
+        lines_.push_back(std::move(text));
+    }
+}
+
+}  // namespace kestotifyd

@@ -1,0 +1,374 @@
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/mount.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <fstream>
+#include <functional>
+#include <memory>
+#include <random>
+#include <string>
+#include <vector>
+
+#include "common/json.h"
+#include "common/lock_file.h"
+#include "tests/programs/kestotifyd/share_model.h"
+#include "tests/support/program.h"
+
+namespace fs = std::filesystem;
+using support::Eventually;
+
+namespace {
+
+constexpr char kShare[] = "/volume1/photo";
+constexpr char kRegistrations[] = "/var/lib/kesto/monitor";
+constexpr char kLog[] = "/var/log/kestotifyd.log";
+
+std::string ReadAll(const std::string& path) {
+    std::ifstream file(path, std::ios::binary);
+    return std::string(std::istreambuf_iterator<char>(file), {});
+}
+
+void WriteFile(const std::string& path, const std::string& content = "content") {
+    std::ofstream(path, std::ios::binary) << content;
+}
+
+/// The real program, on a real directory, with the back end that the parameter names.
+class LiveTest : public testing::TestWithParam<const char*> {
+  protected:
+    void SetUp() override {
+        fs::create_directories(Queue().parent_path());
+        fs::create_directories("/volume1/outside");
+    }
+
+    void TearDown() override {
+        monitor_.reset();
+        fs::remove_all("/var/lib/kesto");
+        fs::remove_all("/volume1");
+        fs::remove(kLog);
+    }
+
+    static fs::path Queue(const std::string& share = kShare) {
+        return share + "/@eaDir/fileindex/queue";
+    }
+
+    static void Register(const std::string& share = kShare, const std::string& ignore = "@eaDir") {
+        Json::Value json;
+        json["app"] = "fileindex";
+        json["type"] = 1;
+        json["queue"] = Queue(share).string();
+        json["config"]["path"].append(share);
+        json["config"]["mask"] = 65478;
+        json["config"]["ignore"].append(ignore);
+        fs::create_directories(kRegistrations);
+        fs::create_directories(Queue(share).parent_path());
+        ASSERT_TRUE(quivra::toFile(json, File(share)));
+    }
+    static std::string File(const std::string& share) {
+        return std::string(kRegistrations) + "/" + fs::path(share).filename().string() + ".json";
+    }
+
+    void Start(std::vector<std::string> arguments = {}) {
+        arguments.insert(arguments.end(), {"--verbose", "--backend", GetParam()});
+        monitor_ = std::make_unique<support::Program>("kestotifyd", arguments);
+    }
+
+    /// Starts, and waits for the reindex that every start owes; the queue is empty then.
+    void StartAndSettle(const std::vector<std::string>& arguments = {}) {
+        Register();
+        Start(arguments);
+        if (!Eventually([&] { return HasLog("cannot be watched") || !Lines().empty(); })) {
+            FAIL() << ReadAll(kLog);
+        }
+        if (HasLog("cannot be watched")) {
+            GTEST_SKIP() << "the kernel refuses " << GetParam();
+        }
+        ASSERT_EQ(Lines(), std::vector<std::string>{Line(0x10000, true, kShare)});
+        ASSERT_TRUE(model_.Converges());
+    }
+
+    static bool HasLog(const std::string& text) {
+        return ReadAll(kLog).find(text) != std::string::npos;
+    }
+
+    static std::string Line(unsigned event, bool is_dir, const std::string& path,
+                            const std::string& path_old = "") {
+        Json::Value json;
+        json["event"] = event;
+        json["is_dir"] = is_dir;
+        json["path"] = path;
+        if (!path_old.empty()) {
+            json["path_old"] = path_old;
+        }
+        return quivra::toString(json);
+    }
+
+    static std::vector<std::string> Lines(const std::string& share = kShare) {
+        std::vector<std::string> lines;
+        std::ifstream file(Queue(share));
+        for (std::string line; std::getline(file, line);) {
+            lines.push_back(line);
+        }
+        return lines;
+    }
+    static bool Has(const std::string& line, const std::string& share = kShare) {
+        const std::vector<std::string> lines = Lines(share);
+        return std::find(lines.begin(), lines.end(), line) != lines.end();
+    }
+    static testing::AssertionResult Comes(const std::string& line,
+                                          const std::string& share = kShare) {
+        if (Eventually([&] { return Has(line, share); }, std::chrono::seconds(10))) {
+            return testing::AssertionSuccess();
+        }
+        return testing::AssertionFailure() << line << "\nQueue:\n"
+                                           << ReadAll(Queue(share)) << "\nLog:\n"
+                                           << ReadAll(kLog);
+    }
+    /// The lines up to the one for a file that is made now.
+    std::vector<std::string> LinesUntilNow() {
+        const std::string mark = std::string(kShare) + "/mark" + std::to_string(++marks_);
+        WriteFile(mark);
+        EXPECT_TRUE(Comes(Line(0x2, false, mark)));
+        std::vector<std::string> lines = Lines();
+        std::erase_if(lines, [&](const std::string& line) {
+            return line.find("/mark") != std::string::npos;
+        });
+        return lines;
+    }
+
+    const std::string share_ = kShare;
+    std::unique_ptr<support::Program> monitor_;
+    ShareModel model_{kShare, Queue()};
+    int marks_ = 0;
+};
+
+INSTANTIATE_TEST_SUITE_P(Backends, LiveTest, testing::Values("inotify"),
+                         [](const auto& name) { return std::string(name.param); });
+
+TEST_P(LiveTest, ADirectoryRenameIsOneLine) {
+    fs::create_directories(share_ + "/many/sub");
+    for (int i = 0; i < 1000; ++i) {
+        WriteFile(share_ + "/many/sub/f" + std::to_string(i));
+    }
+    StartAndSettle();
+    fs::rename(share_ + "/many", share_ + "/moved");
+    WriteFile(share_ + "/moved/sub/f7", "new content");
+    EXPECT_EQ(LinesUntilNow(),
+              (std::vector<std::string>{Line(0x100, true, share_ + "/moved", share_ + "/many"),
+                                        Line(0x2, false, share_ + "/moved/sub/f7")}));
+    EXPECT_TRUE(model_.Converges());
+}
+
+TEST_P(LiveTest, MovesInAndOutAndBetweenShares) {
+    const std::string other = "/volume1/video";
+    Register(other);
+    fs::create_directories(share_ + "/keep/deep");
+    WriteFile(share_ + "/keep/deep/f");
+    fs::create_directories("/volume1/outside/in/deep");
+    WriteFile("/volume1/outside/in/deep/f");
+    StartAndSettle();
+    ASSERT_TRUE(Comes(Line(0x10000, true, other), other));
+    fs::rename("/volume1/outside/in", share_ + "/in");
+    EXPECT_TRUE(Comes(Line(0x40, true, share_ + "/in")));
+    WriteFile(share_ + "/in/deep/late");
+    EXPECT_TRUE(Comes(Line(0x40, false, share_ + "/in/deep/late")));
+    fs::rename(share_ + "/in", "/volume1/outside/out");
+    EXPECT_TRUE(Comes(Line(0x80, true, share_ + "/in")));
+    WriteFile("/volume1/outside/out/deep/unseen");
+    fs::rename(share_ + "/keep", other + "/kept");
+    EXPECT_TRUE(Comes(Line(0x80, true, share_ + "/keep")));
+    EXPECT_TRUE(Comes(Line(0x40, true, other + "/kept"), other));
+    WriteFile(other + "/kept/deep/f", "changed");
+    EXPECT_TRUE(Comes(Line(0x2, false, other + "/kept/deep/f"), other));
+    EXPECT_EQ(ReadAll(Queue()).find("unseen"), std::string::npos);
+    EXPECT_TRUE(model_.Converges());
+}
+
+TEST_P(LiveTest, IgnoredNamesAndItsOwnFilesNeverAppear) {
+    Register(kShare, "node_modules");
+    StartAndSettle();
+    Register(kShare, "node_modules");
+    fs::create_directories(share_ + "/node_modules/x");
+    fs::create_directories(share_ + "/a/#recycle/y");
+    fs::create_directories(share_ + "/a/@eaDir");
+    WriteFile(share_ + "/node_modules/x/f");
+    WriteFile(share_ + "/a/#recycle/y/f");
+    WriteFile(share_ + "/a/@eaDir/thumb");
+    WriteFile(share_ + "/a/f");
+    EXPECT_TRUE(Comes(Line(0x40, true, share_ + "/a")));
+    LinesUntilNow();
+    const std::string queue = ReadAll(Queue());
+    for (const char* const hidden : {"@eaDir", "#recycle", "thumb"}) {
+        EXPECT_EQ(queue.find(hidden), std::string::npos) << hidden << "\n" << queue;
+    }
+}
+
+TEST_P(LiveTest, RegistrationsComeChangeAndGoWhileItRuns) {
+    StartAndSettle();
+    const std::string other = "/volume1/video";
+    WriteFile(std::string(kRegistrations) + "/broken.json", "{\"queue\":");
+    Register(other);
+    const auto is_watched = [&] {
+        WriteFile(other + "/probe", "x");
+        return Has(Line(0x2, false, other + "/probe"), other);
+    };
+    ASSERT_TRUE(Eventually(is_watched)) << ReadAll(kLog);
+    EXPECT_FALSE(Has(Line(0x10000, true, other), other)) << "new in this run";
+    EXPECT_TRUE(HasLog("broken.json skipped"));
+
+    Register(other, "skip");
+    ASSERT_TRUE(Eventually([&] {
+        fs::remove(Queue(other));
+        WriteFile(other + "/skip");
+        WriteFile(other + "/after");
+        return Comes(Line(0x2, false, other + "/after"), other) &&
+               ReadAll(Queue(other)).find("/skip") == std::string::npos;
+    }));
+
+    fs::remove(File(other));
+    ASSERT_TRUE(Eventually([&] {
+        fs::remove(Queue(other));
+        WriteFile(other + "/unseen");
+        LinesUntilNow();
+        return !fs::exists(Queue(other));
+    }));
+    Register(other);  // what happened meanwhile was not seen
+    EXPECT_TRUE(Comes(Line(0x10000, true, other), other));
+}
+
+TEST_P(LiveTest, EveryStartBeginsWithAReindex) {
+    StartAndSettle();
+    for (const int signal : {SIGKILL, SIGTERM}) {
+        WriteFile(share_ + "/last");
+        fs::create_directories(share_ + "/a/b/c");
+        monitor_->Stop(signal);
+        fs::remove(Queue());
+        WriteFile(share_ + "/meanwhile" + std::to_string(signal));
+        Start();
+        ASSERT_TRUE(Comes(Line(0x10000, true, kShare)));
+        EXPECT_EQ(Lines().front(), Line(0x10000, true, kShare));
+        EXPECT_TRUE(model_.Converges());
+    }
+}
+
+TEST_P(LiveTest, StopWritesWhatItHasAndASecondInstanceIsRefused) {
+    StartAndSettle();
+    EXPECT_EQ(support::RunProgram("kestotifyd", {}).status, 1);
+    {
+        const quivra::LockFile busy(Queue(), true);
+        for (int i = 0; i < 100; ++i) {
+            WriteFile(share_ + "/f" + std::to_string(i));
+        }
+        kill(monitor_->Pid(), SIGTERM);
+    }
+    EXPECT_EQ(monitor_->Wait(), 0);
+    EXPECT_TRUE(Has(Line(0x2, false, share_ + "/f99")));
+    EXPECT_TRUE(model_.Converges());
+}
+
+TEST_P(LiveTest, OverflowBecomesACrashMarkerAndNothingStaysUnwatched) {
+    StartAndSettle();
+    kill(monitor_->Pid(), SIGSTOP);
+    for (int i = 0; i < 300; ++i) {
+        fs::create_directories(share_ + "/d" + std::to_string(i) + "/sub");
+    }
+    for (int i = 0; i < 9000; ++i) {
+        WriteFile(share_ + "/f" + std::to_string(i));
+    }
+    fs::create_directories(share_ + "/last/sub");
+    kill(monitor_->Pid(), SIGCONT);
+    EXPECT_TRUE(Comes(Line(0x200, true, kShare)));
+    EXPECT_TRUE(HasLog("max_queued_events"));
+    EXPECT_TRUE(model_.Converges());
+    EXPECT_GE(model_.CrashCount(), 1U);
+    for (const char* const name : {"/d0/late", "/d299/sub/late", "/last/sub/late"}) {
+        WriteFile(share_ + name);
+        EXPECT_TRUE(Comes(Line(0x2, false, share_ + name)));
+    }
+}
+
+TEST_P(LiveTest, AFolderThatGoesIsADeleteAndThatReturnsAReindex) {
+    StartAndSettle();
+    fs::rename(share_, "/volume1/gone");
+    Register();  // its queue's directory is back, and with it an empty folder
+    EXPECT_TRUE(Comes(Line(0x10000, true, kShare)));
+    EXPECT_EQ(Lines().front(), Line(0x80, true, kShare));
+    WriteFile(share_ + "/new");
+    EXPECT_TRUE(Comes(Line(0x2, false, share_ + "/new")));
+}
+
+/// Random operations on a small tree, in rounds; after each the model must equal the disk.
+class Storm {
+  public:
+    Storm(std::string root, std::string outside, unsigned seed)
+        : root_(std::move(root)), outside_(std::move(outside)), random_(seed) {}
+
+    void Run(int operations) {
+        for (int i = 0; i < operations; ++i) {
+            Step();
+        }
+    }
+
+  private:
+    std::string Pick() {
+        std::string path = Chance(12) ? outside_ : root_;
+        const int depth = 1 + Number(3);
+        for (int i = 0; i < depth; ++i) {
+            path += "/" + std::string(1, static_cast<char>('a' + Number(4)));
+        }
+        return path;
+    }
+    int Number(int below) { return static_cast<int>(random_() % static_cast<unsigned>(below)); }
+    bool Chance(int one_in) { return Number(one_in) == 0; }
+
+    void Step() {
+        std::error_code ignored;
+        const std::string path = Pick();
+        switch (Number(10)) {
+            case 0:
+            case 1:
+                fs::create_directories(path, ignored);
+                break;
+            case 2:
+            case 3:
+            case 4:
+                if (!fs::is_directory(path)) {
+                    // A change is told for the name that it was made through, not for other links.
+                    if (fs::hard_link_count(path, ignored) > 1) {
+                        fs::remove(path, ignored);
+                    }
+                    WriteFile(path, std::to_string(random_()));
+                }
+                break;
+            case 5:
+                fs::remove_all(path, ignored);
+                break;
+            case 6:
+                fs::create_hard_link(path, Pick(), ignored);
+                break;
+            default:
+                fs::rename(path, Pick(), ignored);
+                break;
+        }
+    }
+
+    std::string root_;
+    std::string outside_;
+    std::mt19937 random_;
+};
+
+TEST_P(LiveTest, StormsEndWithTheDisk) {
+    StartAndSettle();
+    const char* const given = std::getenv("STORM_SEED");
+    const unsigned seed = given != nullptr ? static_cast<unsigned>(std::atoi(given)) : 1;
+    for (unsigned round = 0; round < 40; ++round) {
+        Storm(share_, "/volume1/outside", seed * 1000 + round).Run(round % 2 == 0 ? 60 : 1500);
+        ASSERT_TRUE(model_.Converges()) << "STORM_SEED=" << seed << ", round " << round;
+    }
+    EXPECT_EQ(model_.CrashCount(), 0U);
+    EXPECT_TRUE(monitor_->IsRunning());
+}
+
+}  // namespace

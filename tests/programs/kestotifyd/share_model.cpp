@@ -1,0 +1,137 @@
+#include "tests/programs/kestotifyd/share_model.h"
+
+#include <gtest/gtest.h>
+
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+#include <utility>
+
+#include "common/lock_file.h"
+#include "fileindex/event.h"
+#include "programs/kestotifyd/queue_translator.h"
+#include "tests/support/program.h"
+
+namespace fs = std::filesystem;
+using kestotifyd::IsAtOrBelow;
+
+ShareModel::ShareModel(std::string folder, std::string queue)
+    : folder_(std::move(folder)), queue_(std::move(queue)) {}
+
+void ShareModel::Pass() {
+    if (!fs::exists(queue_)) {
+        return;
+    }
+    {
+        const quivra::LockFile lock(queue_, true);
+        fs::rename(queue_, queue_ + ".tmp");
+    }
+    std::ifstream lines(queue_ + ".tmp", std::ios::binary);
+    for (std::string line; std::getline(lines, line);) {
+        consumed_ += line + "\n";
+        Carry(line);
+    }
+    consumed_ += "(end of a pass)\n";
+    for (const auto& [path, unused] : std::exchange(marked_, {})) {
+        DropBelow(entries_, path);
+        Walk(path, entries_);
+    }
+}
+
+void ShareModel::Carry(const std::string& line) {
+    using namespace quivra::fileindex;
+    const Event event(line);
+    switch (event.event) {
+        case EVENT_DELETE:
+            DropBelow(entries_, event.path);
+            DropBelow(marked_, event.path);
+            break;
+        case EVENT_RENAME: {
+            DropBelow(entries_, event.path);
+            DropBelow(marked_, event.path);
+            MoveBelow(marked_, event.path_old, event.path);
+            if (!MoveBelow(entries_, event.path_old, event.path)) {
+                Mark(event.path);
+            }
+            break;
+        }
+        case EVENT_QUEUE_CRASH:
+            ++crashes_;
+            Mark(folder_);
+            break;
+        default:
+            Mark(event.path);
+            break;
+    }
+}
+
+void ShareModel::DropBelow(Entries& entries, const std::string& path) {
+    std::erase_if(entries, [&](const auto& entry) { return IsAtOrBelow(entry.first, path); });
+}
+
+bool ShareModel::MoveBelow(Entries& entries, const std::string& from, const std::string& to) {
+    Entries moved;
+    for (const auto& [path, content] : entries) {
+        if (IsAtOrBelow(path, from)) {
+            moved[to + path.substr(from.size())] = content;
+        }
+    }
+    const bool has_from = entries.contains(from);
+    DropBelow(entries, from);
+    entries.merge(moved);
+    return has_from;
+}
+
+void ShareModel::Walk(const std::string& path, Entries& found) const {
+    const fs::file_status status = fs::symlink_status(path);
+    if (!fs::exists(status) || path.find("@eaDir") != std::string::npos) {
+        return;
+    }
+    if (!fs::is_directory(status)) {
+        std::ifstream file(path, std::ios::binary);
+        found[path] = std::string(std::istreambuf_iterator<char>(file), {});
+        return;
+    }
+    found[path] = "(directory)";
+    std::error_code error;
+    for (const fs::directory_entry& entry : fs::directory_iterator(path, error)) {
+        Walk(entry.path(), found);
+    }
+}
+
+ShareModel::Entries ShareModel::OnDisk() const {
+    Entries found;
+    Walk(folder_, found);
+    return found;
+}
+
+bool ShareModel::Converges() {
+    const bool is_equal = support::Eventually(
+        [&] {
+            Pass();
+            return entries_ == OnDisk();
+        },
+        std::chrono::seconds(15));
+    if (is_equal) {
+        consumed_.clear();
+    } else {
+        PrintDifference();
+    }
+    return is_equal;
+}
+
+void ShareModel::PrintDifference() const {
+    const Entries disk = OnDisk();
+    std::string text;
+    for (const auto& [path, content] : disk) {
+        if (!entries_.contains(path) || entries_.at(path) != content) {
+            text += "not indexed, or stale: " + path + "\n";
+        }
+    }
+    for (const auto& [path, content] : entries_) {
+        if (!disk.contains(path)) {
+            text += "indexed, but gone: " + path + "\n";
+        }
+    }
+    ADD_FAILURE() << text << consumed_;
+}
