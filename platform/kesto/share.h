@@ -1,5 +1,7 @@
 #pragma once
 
+#include <kesto/string_list.h>
+
 #ifdef __cplusplus
 extern "C" {
 #endif
@@ -30,6 +32,9 @@ int KESTOShareGet(const char* name, struct KESTOShare** share);
 
 /// Frees a record; null is allowed.
 void KESTOShareFree(struct KESTOShare* share);
+
+/// Appends the names of all shares to the list. Negative on failure.
+int KESTOShareEnum(KLIBCSzList** list);
 
 /// The share that a full path lies in: the one with the longest root that is a component-wise
 /// prefix of the path. Fills its name and its root path; negative when there is none or a buffer

@@ -15,6 +15,9 @@ void KLIBCSzListFree(KLIBCSzList* list);
 /// Appends a copy of the text. Negative on failure.
 int KLIBCSzListPush(KLIBCSzList** list, const char* text);
 
+/// The text at a position, counted from 0; null beyond the end. It lives until the list changes.
+const char* KLIBCSzListGet(const KLIBCSzList* list, int position);
+
 /// The position of the text in the list, negative when it is not there.
 int KLIBCSzListFind(const KLIBCSzList* list, const char* text);
 

@@ -99,6 +99,19 @@ void KESTOShareFree(KESTOShare* share) {
     delete share;
 }
 
+int KESTOShareEnum(KLIBCSzList** list) {
+    const auto shares = kesto::LoadShares();
+    if (shares == nullptr) {
+        return -1;
+    }
+    for (const kesto::ShareConf& share : *shares) {
+        if (KLIBCSzListPush(list, share.name.c_str()) < 0) {
+            return -1;
+        }
+    }
+    return 0;
+}
+
 int KESTOShareNamePathGet(const char* full_path, char* name, int name_size, char* path,
                           int path_size) {
     const auto shares = kesto::LoadShares();

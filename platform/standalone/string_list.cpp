@@ -29,6 +29,11 @@ int KLIBCSzListPush(KLIBCSzList** list, const char* text) {
     return 0;
 }
 
+const char* KLIBCSzListGet(const KLIBCSzList* list, int position) {
+    const auto index = static_cast<std::size_t>(position);  // a negative one is beyond every end
+    return index < list->texts.size() ? list->texts[index].c_str() : nullptr;
+}
+
 int KLIBCSzListFind(const KLIBCSzList* list, const char* text) {
     const auto it = std::find(list->texts.begin(), list->texts.end(), text);
     return it == list->texts.end() ? kesto::SetError(KESTO_ERR_NOT_FOUND)

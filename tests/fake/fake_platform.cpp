@@ -384,6 +384,17 @@ void KESTOShareFree(KESTOShare* share) {
     delete share;
 }
 
+int KESTOShareEnum(KLIBCSzList** list) {
+    if (Begin("KESTOShareEnum")) {
+        return -1;
+    }
+    Locked state;
+    for (const auto& [name, share] : state->shares) {
+        (*list)->texts.push_back(name);
+    }
+    return 0;
+}
+
 int KESTOShareNamePathGet(const char* full_path, char* name, int name_size, char* path,
                           int path_size) {
     if (Begin("KESTOShareNamePathGet", std::string(full_path))) {
@@ -596,6 +607,11 @@ void KLIBCSzListFree(KLIBCSzList* list) {
 int KLIBCSzListPush(KLIBCSzList** list, const char* text) {
     (*list)->texts.emplace_back(text);
     return 0;
+}
+
+const char* KLIBCSzListGet(const KLIBCSzList* list, int position) {
+    const auto index = static_cast<std::size_t>(position);  // a negative one is beyond every end
+    return index < list->texts.size() ? list->texts[index].c_str() : nullptr;
 }
 
 int KLIBCSzListFind(const KLIBCSzList* list, const char* text) {

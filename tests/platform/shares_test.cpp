@@ -164,6 +164,13 @@ TEST_F(SharesTest, LongestRootByComponentsHoldsAPath) {
         EXPECT_EQ(result, *expected == '\0' ? -1 : 0) << path;
         EXPECT_STREQ(name, expected) << path;
     }
+    KLIBCSzList* list = KLIBCSzListAlloc(0);
+    EXPECT_EQ(KESTOShareEnum(&list), 0);
+    EXPECT_STREQ(KLIBCSzListGet(list, 0), "a");
+    EXPECT_STREQ(KLIBCSzListGet(list, 2), "ab");
+    EXPECT_EQ(KLIBCSzListGet(list, 3), nullptr);
+    EXPECT_EQ(KLIBCSzListGet(list, -1), nullptr);
+    KLIBCSzListFree(list);
     char name[3];
     char root[13];
     EXPECT_EQ(KESTOShareNamePathGet("/volume1/ab", name, 3, root, 12), 0);
