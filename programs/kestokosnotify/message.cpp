@@ -1,0 +1,60 @@
+#include "programs/kestokosnotify/message.h"
+
+#include <algorithm>
+#include <iterator>
+
+namespace notify {
+namespace {
+
+struct MessageText {
+    const char* key;
+    const char* text;
+};
+
+constexpr MessageText kTexts[] = {
+    {"app:displayname", "Quivra"},
+    {"error:index_no_space",
+     "Files are no longer indexed because the volume is full. Delete files to make room, or choose "
+     "other folders in the {0}index preferences{1}."},
+    {"error:lack_of_memory",
+     "Indexing waits because memory is short. It goes on by itself when other programs have "
+     "released some."},
+};
+
+}  // namespace
+
+std::string ResolveMessage(const std::string& key, const std::vector<std::string>& arguments) {
+    const auto it = std::find_if(std::begin(kTexts), std::end(kTexts),
+                                 [&](const MessageText& entry) { return entry.key == key; });
+    if (it == std::end(kTexts)) {
+        return key;
+    }
+    const std::string text = it->text;
+    std::string resolved;
+    for (std::size_t i = 0; i < text.size(); ++i) {
+        if (text[i] != '{') {
+            resolved += text[i];
+            continue;
+        }
+        const auto place = static_cast<std::size_t>(text[i + 1] - '0');
+        resolved += place < arguments.size() ? arguments[place] : "";
+        i += 2;  // the digit and the bracket
+    }
+    return resolved;
+}
+
+std::string PlainText(const std::string& text) {
+    std::string plain;
+    bool is_in_tag = false;
+    for (const char c : text) {
+        is_in_tag = is_in_tag || c == '<';
+        if (!is_in_tag) {
+            const auto byte = static_cast<unsigned char>(c);
+            plain += byte < 0x20 || byte == 0x7f ? ' ' : c;
+        }
+        is_in_tag = is_in_tag && c != '>';
+    }
+    return plain;
+}
+
+}  // namespace notify
