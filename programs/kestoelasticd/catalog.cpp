@@ -1,0 +1,329 @@
+#include "programs/kestoelasticd/catalog.h"
+
+#include <sodium.h>
+
+#include <utility>
+
+#include "common/error.h"
+#include "common/log.h"
+#include "common/util.h"
+#include "programs/kestoelasticd/codes.h"
+#include "programs/kestoelasticd/index_directory.h"
+
+namespace elasticd {
+namespace {
+
+using quivra::Error;
+
+std::string MakeUuid() {
+    unsigned char bytes[16];
+    char hex[2 * sizeof(bytes) + 1];
+    randombytes_buf(bytes, sizeof(bytes));
+    return sodium_bin2hex(hex, sizeof(hex), bytes, sizeof(bytes));
+}
+
+/// Whether one of the directories lies within the other, or they are the same.
+bool Overlap(const std::string& one, const std::string& other) {
+    return quivra::StringStartWith(one + "/", other + "/") ||
+           quivra::StringStartWith(other + "/", one + "/");
+}
+
+}  // namespace
+
+Catalog::Catalog(const std::string& registry_path, std::uint64_t min_free)
+    : min_free_(min_free), registry_(registry_path) {
+    SettleAll();
+}
+
+void Catalog::SettleAll() {
+    bool changed = false;
+    for (auto entry = registry_.entries.begin(); entry != registry_.entries.end();) {
+        try {
+            changed |= Settle(entry);
+        } catch (const Error& error) {
+            quivra::LogError({"catalog", __LINE__}, "%s: %s", entry->first.c_str(), error.what());
+            ++entry;
+        }
+    }
+    if (changed) {
+        registry_.Save();
+    }
+}
+
+/// Finishes or undoes what was interrupted, and moves on to the next entry; whether that changed
+/// anything. While a disk is missing, everything waits.
+bool Catalog::Settle(Entries::iterator& entry) {
+    IndexEntry& index = entry->second;
+    if (index.deleting) {
+        RemoveIndexDirectory(index.path, index.uuid);
+        entry = registry_.entries.erase(entry);
+        return true;
+    }
+    bool changed = false;
+    if (index.move) {
+        const bool at_old = IsIndexDirectory(index.path, index.uuid);
+        if (at_old) {
+            UndoMove(index.path, index.move->path, index.uuid);
+            index.move.reset();
+            changed = true;
+        } else if (IsIndexDirectory(index.move->path, index.uuid)) {
+            index.path = index.move->path;
+            const std::string new_id = std::exchange(index.move, std::nullopt)->id;
+            Rekey(entry++, new_id);
+            return true;
+        }
+    }
+    if (!index.leftover.empty() && IsIndexDirectory(index.path, index.uuid) &&
+        RemoveIndexDirectory(index.leftover, index.uuid)) {
+        index.leftover.clear();
+        changed = true;
+    }
+    ++entry;
+    return changed;
+}
+
+Catalog::Entries::iterator Catalog::Rekey(Entries::iterator entry, const std::string& new_id) {
+    if (entry->first == new_id) {
+        return entry;
+    }
+    auto node = registry_.entries.extract(entry);
+    node.key() = new_id;
+    return registry_.entries.insert(std::move(node)).position;
+}
+
+std::shared_ptr<Index> Catalog::Find(const std::string& id) {
+    const std::lock_guard lock(mutex_);
+    return Use(id);
+}
+
+/// As Find, with the lock held.
+std::shared_ptr<Index> Catalog::Use(const std::string& id) {
+    const auto found = in_use_.find(id);
+    if (found != in_use_.end()) {
+        return found->second;
+    }
+    auto entry = registry_.entries.find(id);
+    if (entry == registry_.entries.end()) {
+        CheckIdIsFree(id, std::string());
+        throw Error(kNoSuchIndex, "No such index: " + id);
+    }
+    if (entry->second.move) {  // its disk was missing at the start
+        auto settled = entry;
+        if (Settle(settled)) {
+            registry_.Save();
+            return Use(id);
+        }
+    }
+    auto index = std::make_shared<Index>(entry->second.path,
+                                         std::make_shared<Mapping>(entry->second.mappings),
+                                         entry->second.paused, min_free_);
+    in_use_.emplace(id, index);
+    return index;
+}
+
+/// The id that an index is about to get belongs to it already.
+void Catalog::CheckIdIsFree(const std::string& id, const std::string& own_id) const {
+    for (const auto& [other, entry] : registry_.entries) {
+        if (other != own_id && entry.move && entry.move->id == id) {
+            throw Error(kBusy, "An index is being moved to this id: " + id);
+        }
+    }
+}
+
+void Catalog::CheckPathIsFree(const std::string& path, const std::string& own_id) const {
+    for (const auto& [id, entry] : registry_.entries) {
+        const bool taken = Overlap(path, entry.path) ||
+                           (entry.move && Overlap(path, entry.move->path)) ||
+                           (!entry.leftover.empty() && Overlap(path, entry.leftover));
+        if (id != own_id && taken) {
+            throw Error(kIndexExists, "The path belongs to the index " + id + ": " + path);
+        }
+    }
+}
+
+void Catalog::MakeFiles(const IndexEntry& entry) const {
+    const Mapping mapping(entry.mappings);
+    MakeIndexDirectory(entry.path, entry.uuid);
+    try {
+        IndexWriter::Create(DatabasePath(entry.path), mapping);
+    } catch (const Error&) {
+        RemoveIndexDirectory(entry.path, entry.uuid);
+        throw;
+    }
+}
+
+void Catalog::Create(const std::string& id, const std::string& path, const Json::Value& mappings) {
+    const std::lock_guard lock(mutex_);
+    const auto found = registry_.entries.find(id);
+    if (found != registry_.entries.end()) {
+        if (found->second.path != path) {
+            throw Error(kIndexExists, "The index has another path: " + found->second.path);
+        }
+        if (!found->second.move && !IsIndexDirectory(path, found->second.uuid)) {
+            in_use_.erase(id);
+            MakeFiles(found->second);
+        }
+        return;
+    }
+    CheckIdIsFree(id, std::string());
+    CheckPathIsFree(path, std::string());
+    IndexEntry entry;
+    entry.path = path;
+    entry.uuid = MakeUuid();
+    entry.mappings = mappings;
+    MakeFiles(entry);
+    registry_.entries.emplace(id, entry);
+    try {
+        registry_.Save();
+    } catch (const Error&) {
+        registry_.entries.erase(id);
+        RemoveIndexDirectory(entry.path, entry.uuid);
+        throw;
+    }
+}
+
+void Catalog::Delete(const std::string& id) {
+    std::unique_lock lock(mutex_);
+    if (!registry_.entries.contains(id)) {
+        CheckIdIsFree(id, std::string());
+        return;
+    }
+    const std::shared_ptr<Index> index = Use(id);
+    if (!index->BeginMove()) {
+        throw Error(kBusy, "The index is being moved: " + id);
+    }
+    IndexEntry& entry = registry_.entries.at(id);
+    entry.deleting = true;
+    try {
+        registry_.Save();
+    } catch (const Error&) {
+        entry.deleting = false;
+        index->EndMove(entry.path);
+        throw;
+    }
+    index->CloseForMove();
+    if (!RemoveIndexDirectory(entry.path, entry.uuid)) {
+        quivra::LogError({"catalog", __LINE__}, "%s is no index; left alone", entry.path.c_str());
+    }
+    in_use_.erase(id);
+    registry_.entries.erase(id);
+    registry_.Save();
+}
+
+void Catalog::SetPaused(const std::string& id, bool paused) {
+    const std::lock_guard lock(mutex_);
+    const std::shared_ptr<Index> index = Use(id);
+    IndexEntry& entry = registry_.entries.at(id);
+    if (entry.paused != paused) {
+        entry.paused = paused;
+        try {
+            registry_.Save();
+        } catch (const Error&) {
+            entry.paused = !paused;
+            throw;
+        }
+    }
+    index->SetPaused(paused);
+}
+
+void Catalog::Configure(const std::string& id, const std::string& new_id,
+                        const std::string& new_path) {
+    std::unique_lock lock(mutex_);
+    const auto found = registry_.entries.find(id);
+    const auto target = registry_.entries.find(new_id);
+    if (found == registry_.entries.end() && target != registry_.entries.end() &&
+        (new_path.empty() || target->second.path == new_path)) {
+        return;  // done before
+    }
+    const std::shared_ptr<Index> index = Use(id);
+    const IndexEntry::Move move{new_id.empty() ? id : new_id,
+                                new_path.empty() ? registry_.entries.at(id).path : new_path};
+    if (move.id == id && move.path == registry_.entries.at(id).path) {
+        return;
+    }
+    if (move.id != id && target != registry_.entries.end()) {
+        throw Error(kIndexExists, "Another index has this id: " + new_id);
+    }
+    CheckIdIsFree(move.id, id);
+    CheckPathIsFree(move.path, id);
+    if (registry_.entries.at(id).move) {
+        throw Error(kBusy, "The index is being moved: " + id);
+    }
+    if (move.path == registry_.entries.at(id).path) {
+        Rename(id, move.id);
+    } else if (index->BeginMove()) {
+        Move(lock, id, move);
+    } else {
+        throw Error(kBusy, "The index is being moved: " + id);
+    }
+}
+
+/// With the index closed to others, and without the lock while files move.
+void Catalog::Move(std::unique_lock<std::mutex>& lock, const std::string& id,
+                   const IndexEntry::Move& target) {
+    const std::shared_ptr<Index> index = in_use_.at(id);
+    const std::string old_path = registry_.entries.at(id).path;
+    const std::string uuid = registry_.entries.at(id).uuid;
+    try {
+        registry_.entries.at(id).move = target;
+        registry_.Save();
+        lock.unlock();
+        index->CloseForMove();
+        const Moved moved = MoveIndexDirectory(old_path, target.path, uuid);
+        lock.lock();
+        Switch(id, moved == Moved::kCopied ? old_path : std::string());
+    } catch (const Error&) {
+        if (!lock.owns_lock()) {
+            lock.lock();
+        }
+        UndoMove(old_path, target.path, uuid);
+        registry_.entries.at(id).move.reset();
+        index->EndMove(old_path);
+        registry_.Save();
+        throw;
+    }
+    index->EndMove(target.path);
+    IndexEntry& entry = registry_.entries.at(target.id);
+    if (!entry.leftover.empty() && RemoveIndexDirectory(entry.leftover, uuid)) {
+        entry.leftover.clear();
+        registry_.Save();
+    }
+}
+
+/// Records that the index is at its new place. When that cannot be saved, files that are at the new
+/// place alone are found there by the next start; a copy is given up (Error 505).
+void Catalog::Switch(const std::string& id, const std::string& leftover) {
+    const Entries before = registry_.entries;
+    const auto found = registry_.entries.find(id);
+    const IndexEntry::Move target = *std::exchange(found->second.move, std::nullopt);
+    found->second.path = target.path;
+    found->second.leftover = leftover;
+    Rekey(found, target.id);
+    try {
+        registry_.Save();
+    } catch (const Error&) {
+        if (!leftover.empty()) {
+            registry_.entries = before;
+            throw;
+        }
+    }
+    auto node = in_use_.extract(id);
+    node.key() = target.id;
+    in_use_.insert(std::move(node));
+}
+
+/// A new id alone is one change of the registry.
+void Catalog::Rename(const std::string& id, const std::string& new_id) {
+    Rekey(registry_.entries.find(id), new_id);
+    try {
+        registry_.Save();
+    } catch (const Error&) {
+        Rekey(registry_.entries.find(new_id), id);
+        throw;
+    }
+    auto node = in_use_.extract(id);
+    node.key() = new_id;
+    in_use_.insert(std::move(node));
+}
+
+}  // namespace elasticd

@@ -1,0 +1,59 @@
+#pragma once
+
+#include <json/json.h>
+
+#include <cstdint>
+#include <map>
+#include <memory>
+#include <mutex>
+#include <string>
+
+#include "programs/kestoelasticd/index.h"
+#include "programs/kestoelasticd/registry.h"
+
+namespace elasticd {
+
+/// All indexes, and their making, deleting, pausing, renaming and moving. Every change is recorded
+/// before it is begun, and finished or undone after an interruption. Safe from any thread.
+class Catalog {
+  public:
+    /// Loads the registry and settles what an earlier process left half done. `min_free`: see
+    /// Index.
+    Catalog(const std::string& registry_path, std::uint64_t min_free);
+
+    /// Throws Error 1404 for an unknown id, 1401 for the id that an index is about to get.
+    std::shared_ptr<Index> Find(const std::string& id);
+
+    /// Throws Error 1405 when the id has another path or the path is another index's, 1406, 1414,
+    /// 1412. Succeeds when the index is there already; makes its files anew when they are all gone.
+    void Create(const std::string& id, const std::string& path, const Json::Value& mappings);
+    /// Also succeeds when there is no such index.
+    void Delete(const std::string& id);
+    void SetPaused(const std::string& id, bool paused);
+    /// Gives the index a new id, a new path, or both; an empty text leaves that one as it is. Other
+    /// requests for the index are answered with 1401 meanwhile. Succeeds when it has been done
+    /// before. Throws Error 1404, 1405, 1413, 1414, 1412; then the index is as it was.
+    void Configure(const std::string& id, const std::string& new_id, const std::string& new_path);
+
+  private:
+    using Entries = std::map<std::string, IndexEntry>;
+
+    void SettleAll();
+    bool Settle(Entries::iterator& entry);
+    void CheckPathIsFree(const std::string& path, const std::string& own_id) const;
+    void CheckIdIsFree(const std::string& id, const std::string& own_id) const;
+    std::shared_ptr<Index> Use(const std::string& id);
+    void MakeFiles(const IndexEntry& entry) const;
+    Entries::iterator Rekey(Entries::iterator entry, const std::string& new_id);
+    void Move(std::unique_lock<std::mutex>& lock, const std::string& id,
+              const IndexEntry::Move& target);
+    void Switch(const std::string& id, const std::string& leftover);
+    void Rename(const std::string& id, const std::string& new_id);
+
+    const std::uint64_t min_free_;
+    std::mutex mutex_;
+    Registry registry_;
+    std::map<std::string, std::shared_ptr<Index>> in_use_;
+};
+
+}  // namespace elasticd
