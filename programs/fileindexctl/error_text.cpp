@@ -16,8 +16,18 @@ struct ErrorText {
     Reason reason;
 };
 
-/// Every code that the library throws of itself, and the search daemon's where a user can do
-/// something about them.
+/// Codes of the search daemon that a user can do something about; docs/search-daemon.md has all.
+enum SearchDaemonCode : int {
+    kNoSuchIndex = 1404,
+    kIndexExists = 1405,
+    kIndexPaused = 1407,
+    kBadQuery = 1410,
+    kNoSpace = 1412,
+    kIndexUnavailable = 1413,
+    kReplyTooLarge = 1416,
+};
+
+/// Every code that the library throws of itself, then the search daemon's.
 constexpr std::array kErrorTexts = {
     ErrorText{Error::kBadArgument, "a value is missing or wrong", "check the names and paths given",
               Reason::kTell},
@@ -59,6 +69,19 @@ constexpr std::array kErrorTexts = {
               "try again in a few minutes", Reason::kTell},
     ErrorText{Error::kPathLookupFailed, "the path is not canonical",
               "give it absolute, without '.', '..', doubled or trailing '/'", Reason::kTell},
+    ErrorText{kNoSuchIndex, "it has no index",
+              "choose a folder of it with 'fileindexctl folder add'", Reason::kLeaveOut},
+    ErrorText{kIndexExists, "its index belongs to another share",
+              "'fileindexctl share clear' forgets one that is gone", Reason::kTell},
+    ErrorText{kIndexPaused, "its index is paused", "'fileindexctl share resume' goes on with it",
+              Reason::kLeaveOut},
+    ErrorText{kBadQuery, "the words cannot be searched for", "see 'fileindexctl search --help'",
+              Reason::kTell},
+    ErrorText{kNoSpace, "the volume of the index is full", "free space there", Reason::kTell},
+    ErrorText{kIndexUnavailable, "the files of its index are missing or unreadable",
+              "check that its volume is mounted", Reason::kTell},
+    ErrorText{kReplyTooLarge, "there are too many hits for one answer", "use --limit",
+              Reason::kLeaveOut},
 };
 
 const ErrorText* Find(int code) {

@@ -77,53 +77,80 @@ TEST_F(WordingTest, WrongCallsHaveStatusTwoAndDoNothing) {
     EXPECT_EQ(indexer.Connections(), 0);
 }
 
+/// Every command, by its words.
+const std::vector<std::string> kCommands[] = {
+    {},
+    {"folder"},
+    {"folder", "add"},
+    {"folder", "set"},
+    {"folder", "get"},
+    {"folder", "list"},
+    {"folder", "delete"},
+    {"folder", "reindex"},
+    {"search"},
+    {"status"},
+    {"why"},
+    {"pause"},
+    {"resume"},
+    {"share"},
+    {"share", "list"},
+    {"share", "pause"},
+    {"share", "resume"},
+    {"share", "clear"},
+    {"share", "rename"},
+    {"share", "migrate"},
+    {"share", "check-recycle"},
+    {"volume"},
+    {"volume", "pause"},
+    {"volume", "resume"},
+    {"volume", "clear"},
+    {"queue"},
+    {"queue", "show"},
+    {"event"},
+    {"event", "add"},
+    {"services"},
+    {"services", "prepare"},
+};
+
+std::string HelpOf(std::vector<std::string> command) {
+    command.push_back("--help");
+    std::ostringstream out;
+    Session session{.out = out, .err = out};
+    EXPECT_EQ(Run(command, session), kSuccess);
+    return out.str();
+}
+
 TEST_F(WordingTest, HelpTeachesByExamplesAtEveryLevel) {
-    const std::vector<std::string> rows[] = {
-        {},
-        {"folder"},
-        {"folder", "add"},
-        {"folder", "set"},
-        {"folder", "get"},
-        {"folder", "list"},
-        {"folder", "delete"},
-        {"folder", "reindex"},
-        {"search"},
-        {"status"},
-        {"why"},
-        {"pause"},
-        {"resume"},
-        {"share"},
-        {"share", "list"},
-        {"share", "pause"},
-        {"share", "resume"},
-        {"share", "clear"},
-        {"share", "rename"},
-        {"share", "migrate"},
-        {"share", "check-recycle"},
-        {"volume"},
-        {"volume", "pause"},
-        {"volume", "resume"},
-        {"volume", "clear"},
-        {"queue"},
-        {"queue", "show"},
-        {"event"},
-        {"event", "add"},
-        {"services"},
-        {"services", "prepare"},
-    };
-    for (std::vector<std::string> row : rows) {
-        std::string call = "  fileindexctl ";
-        for (const std::string& word : row) {
-            call += word + " ";
+    for (const std::vector<std::string>& command : kCommands) {
+        std::string call = "  fileindexctl";
+        for (const std::string& word : command) {
+            call += " " + word;
         }
-        call.pop_back();
-        row.push_back("--help");
-        const Result result = Piped(row);
-        EXPECT_EQ(result.status, kSuccess) << call;
-        EXPECT_NE(result.out.find("Examples:\n"), std::string::npos) << call;
-        EXPECT_NE(result.out.find(call, result.out.find("Examples:")), std::string::npos) << call;
+        const std::string help = HelpOf(command);
+        const std::size_t examples = help.find("Examples:\n");
+        ASSERT_NE(examples, std::string::npos) << call;
+        EXPECT_NE(help.find(call, examples), std::string::npos) << call;
     }
     EXPECT_EQ(Piped({"--version"}).status, kSuccess);
+}
+
+TEST_F(WordingTest, ManPageAndCompletionKnowEveryCommandAndOption) {
+    const std::regex option("--[a-z-]+");
+    const std::string page = std::regex_replace(
+        ReadFile(FILEINDEX_SOURCE_DIR "/packaging/man/fileindexctl.1"), std::regex(R"(\\-)"), "-");
+    const std::string completion =
+        ReadFile(FILEINDEX_SOURCE_DIR "/packaging/completions/fileindexctl.bash");
+    for (const std::vector<std::string>& command : kCommands) {
+        const std::string help = HelpOf(command);
+        std::vector<std::string> words = command;
+        for (std::sregex_iterator it(help.begin(), help.end(), option), end; it != end; ++it) {
+            words.push_back(it->str());
+        }
+        for (const std::string& word : words) {
+            EXPECT_NE(page.find(word), std::string::npos) << word;
+            EXPECT_NE(completion.find(word), std::string::npos) << word;
+        }
+    }
 }
 
 }  // namespace
