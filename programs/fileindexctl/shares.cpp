@@ -1,7 +1,10 @@
 #include "programs/fileindexctl/shares.h"
 
-#include <fstream>
+#include <algorithm>
+#include <memory>
 #include <set>
+
+#include <kesto/share.h>
 
 #include "common/error.h"
 #include "common/util.h"
@@ -9,39 +12,20 @@
 #include "sdk/share.h"
 
 namespace quivra::ctl {
-namespace {
-
-constexpr const char* kSharesCfgPath = "/etc/kesto/shares.conf";
-
-/// The names of the sections. The platform has no call that lists its shares; whether it takes a
-/// section for one is asked of it.
-void CollectSections(std::set<std::string>& names) {
-    std::ifstream file(kSharesCfgPath);
-    for (std::string line; std::getline(file, line);) {
-        const std::size_t begin = line.find_first_not_of(" \t");
-        const std::size_t end = line.find(']');
-        if (begin != std::string::npos && line[begin] == '[' && end != std::string::npos) {
-            names.insert(line.substr(begin + 1, end - begin - 1));
-        }
-    }
-}
-
-bool IsShare(const std::string& name) {
-    try {
-        const sdk::SDKShare share(name);
-        return true;
-    } catch (const Error&) {
-        return false;
-    }
-}
-
-}  // namespace
 
 std::vector<std::string> AllShares() {
-    std::set<std::string> names = fileindex::FolderMgr().GetIndexedShares();
-    CollectSections(names);
-    std::erase_if(names, [](const std::string& name) { return !IsShare(name); });
-    return {names.begin(), names.end()};
+    KLIBCSzList* list = KLIBCSzListAlloc(1024);
+    const int result = list == nullptr ? -1 : KESTOShareEnum(&list);
+    const std::unique_ptr<KLIBCSzList, decltype(&KLIBCSzListFree)> owner(list, KLIBCSzListFree);
+    if (result < 0) {
+        throw Error(Error::kSystemCallFailed, "KESTOShareEnum failed");
+    }
+    std::vector<std::string> names;
+    for (int i = 0; const char* name = KLIBCSzListGet(list, i); ++i) {
+        names.emplace_back(name);
+    }
+    std::sort(names.begin(), names.end());
+    return names;
 }
 
 std::vector<std::string> SearchableShares() {

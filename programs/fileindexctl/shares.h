@@ -5,8 +5,8 @@
 
 namespace quivra::ctl {
 
-/// The names of all shares of this machine, sorted: those of /etc/kesto/shares.conf that the
-/// platform accepts.
+/// The names of all shares that the platform knows, sorted. Throws Error 502 when it cannot list
+/// them.
 std::vector<std::string> AllShares();
 
 /// The shares that a search covers: those of the indexed folders, sorted; where no folder was ever

@@ -163,8 +163,6 @@ TEST_F(FolderTest, SharesVolumesAndPauseReachTheLibrary) {
 }
 
 TEST_F(FolderTest, ShareListTellsHowEachStands) {
-    std::filesystem::create_directories("/etc/kesto");
-    WriteFile("/etc/kesto/shares.conf", "[music]\n[photo]\n[locked]\n");
     AddShare("locked");
     fake::SetFlag("locked", fake::ShareFlag::kReadOnly);
     Piped({"folder", "add", "/photo"});
@@ -174,7 +172,8 @@ TEST_F(FolderTest, ShareListTellsHowEachStands) {
               "music   /volume1/music   0        off\n"
               "photo   /volume1/photo   1        on\n");
     EXPECT_EQ(PipedJson({"share", "list", "--json"})["share"].size(), 3U);
-    std::filesystem::remove_all("/etc/kesto");
+    fake::FailNext("KESTOShareEnum");
+    EXPECT_EQ(Piped({"share", "list"}).status, kFailure);
 }
 
 }  // namespace

@@ -157,9 +157,6 @@ TEST_F(SearchTest, WordsThatLookLikeOptions) {
 }
 
 TEST_F(SearchTest, WithoutAFolderSetEveryShareWithAnIndexIsSearched) {
-    std::filesystem::create_directories("/etc/kesto");
-    WriteFile("/etc/kesto/shares.conf",
-              "# [no]\n[a]\npath = /volume1/a\n  [b]\n[a share that is none]\n[unfinished\n");
     AddShare("a");
     AddShare("b");
     EXPECT_EQ(Piped({"search", "x"}).status, kFailure);
@@ -167,7 +164,6 @@ TEST_F(SearchTest, WithoutAFolderSetEveryShareWithAnIndexIsSearched) {
     std::filesystem::create_directories("/volume1/b/@eaDir/fileindex/db");
     Put("b", R"([{"KESTOMDPath": "/volume1/b/x"}])");
     EXPECT_EQ(Piped({"search", "x"}).out, "/volume1/b/x\n");
-    std::filesystem::remove_all("/etc/kesto");
 }
 
 TEST_F(SearchTest, ADaemonThatTalksNonsense) {
