@@ -56,9 +56,19 @@ class QUIVRA_EXPORT OPTree {
     /// changes nothing, when the old path is not a canonical absolute path.
     void HandleRename(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
 
-    /// Hands every surviving op to `fn`, in the order in which they were first queued; after a
-    /// queue crash, one OP_REINDEX_ALL on the root instead. Returns how many ops the queue gave,
-    /// those dropped on the way included (1 after a crash). What `fn` throws passes through.
+    /// Hands every surviving op to `fn`, in the order in which they were first queued.
+    ///
+    /// What the folding leaves to the consumer, so that the index ends like the disk:
+    /// - Ops other than deletes and renames stand at the path that is valid after all renames, also
+    ///   where they come before one. Carry out deletes and renames first, in order, then the rest.
+    /// - A delete looks at the disk again: a directory of the same name may have been made since,
+    ///   and been renamed, so that it is to be found at the place where those renames took it.
+    /// - The new place of a rename is compared with the disk when the old place is not in the
+    ///   index, when another rename of the pass overlaps with it (a to b, b to c reads as a to c, b
+    ///   to c), or when a reindex covers the old place (it has taken earlier deletes along).
+    /// After a queue crash `fn` gets one OP_REINDEX_ALL on the root instead. Returns how many ops
+    /// the queue gave, those dropped on the way included (1 after a crash). What `fn` throws passes
+    /// through.
     int ProcessOP(const std::function<void(std::shared_ptr<OP>)>& fn);
 
     /// Calls `fn` for every node of the subtree as it is at the start of the call, parents before

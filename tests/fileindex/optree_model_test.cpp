@@ -12,21 +12,9 @@
 namespace quivra::fileindex {
 namespace {
 
-/// The seed of the random runs: FILEINDEX_SEED, or another one each time.
-unsigned int Seed() {
-    const char* text = std::getenv("FILEINDEX_SEED");
-    const unsigned int seed =
-        text != nullptr ? static_cast<unsigned int>(std::atoi(text)) : std::random_device()();
-    std::cout << "FILEINDEX_SEED=" << seed << "\n";
-    return seed;
-}
-
-/// How often a random run repeats; less under the sanitizers, which are slow.
 #if defined(__SANITIZE_ADDRESS__)
-constexpr int kRuns = 3000;
 constexpr int kExhaustiveLength = 3;
 #else
-constexpr int kRuns = 60000;
 constexpr int kExhaustiveLength = 4;
 #endif
 
@@ -296,7 +284,7 @@ TEST(OPTreeModelTest, AgreesOnLongRandomSequences) {
     const std::vector<Step> steps =
         StepsOver({"/d", "/d/f", "/d/d", "/d/d/f", "/e", "/e/f", "/e/d/f"});
     std::mt19937 random(Seed());
-    for (int run = 0; run < kRuns; ++run) {
+    for (unsigned int run = 0; run < kRandomRuns; ++run) {
         std::vector<const Step*> sequence(5 + random() % 20);
         for (const Step*& step : sequence) {
             step = &steps[random() % steps.size()];

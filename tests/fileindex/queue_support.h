@@ -6,7 +6,9 @@
 #include <filesystem>
 #include <fstream>
 #include <functional>
+#include <iostream>
 #include <memory>
+#include <random>
 #include <set>
 #include <sstream>
 #include <string>
@@ -18,6 +20,22 @@
 #include "tests/fake/fake_libc.h"
 
 namespace quivra::fileindex {
+
+/// The seed of a random test, printed: FILEINDEX_SEED, or another one each time.
+inline unsigned int Seed() {
+    const char* text = std::getenv("FILEINDEX_SEED");
+    const unsigned int seed =
+        text != nullptr ? static_cast<unsigned int>(std::atoi(text)) : std::random_device()();
+    std::cout << "FILEINDEX_SEED=" << seed << "\n";
+    return seed;
+}
+
+/// How often a random test repeats; the sanitizers are slow.
+#if defined(__SANITIZE_ADDRESS__)
+inline constexpr unsigned int kRandomRuns = 3000;
+#else
+inline constexpr unsigned int kRandomRuns = 30000;
+#endif
 
 /// The queue line of an event; `data` is JSON text.
 inline std::string Line(unsigned int bits, const std::string& path, const std::string& old = "",
