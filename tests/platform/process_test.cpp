@@ -2,6 +2,7 @@
 #include <kesto/error.h>
 #include <kesto/process.h>
 #include <kesto/service.h>
+#include <sys/mount.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -59,13 +60,12 @@ TEST_F(ProcessTest, PassesNoDescriptorsAndNoSignalHandling) {
     sigaddset(&blocked, SIGINT);
     pthread_sigmask(SIG_BLOCK, &blocked, &old_mask);
     std::string output;
-    EXPECT_EQ(kesto::RunProgram("/bin/sh",
-                                {"-c",
-                                 "ls /proc/$$/fd | wc -w; grep -E 'Sig(Blk|Ign)' "
-                                 "/proc/$$/status"},
-                                &output),
+    EXPECT_EQ(kesto::RunProgram("/bin/ls", {"/proc/self/fd"}, &output), 0);
+    EXPECT_EQ(output, "0\n1\n2\n3\n");  // the last one is the directory itself
+    output.clear();
+    EXPECT_EQ(kesto::RunProgram("/bin/grep", {"-E", "Sig(Blk|Ign)", "/proc/self/status"}, &output),
               0);
-    EXPECT_EQ(output, "3\nSigBlk:\t0000000000000000\nSigIgn:\t0000000000000000\n");
+    EXPECT_EQ(output, "SigBlk:\t0000000000000000\nSigIgn:\t0000000000000000\n");
     sigset_t now;
     pthread_sigmask(SIG_SETMASK, &old_mask, &now);
     EXPECT_TRUE(sigismember(&now, SIGINT) == 1 && sigismember(&now, SIGTERM) == 0);
@@ -120,6 +120,61 @@ TEST_F(ServiceTest, ReturnsAtOnceWithoutWait) {
     EXPECT_FALSE(std::filesystem::exists("/volume1/done"));
     WriteFile("/volume1/go", "");
     EXPECT_TRUE(support::Eventually([] { return ReadFile("/volume1/done").size() == 11; }));
+}
+
+/// Samba's tools, played by scripts that are laid over /usr/bin.
+class SpotlightTest : public PlatformTest {
+  protected:
+    static void AddTool(const std::string& name, const std::string& script) {
+        WriteFile("/volume1/tools/" + name, "#!/bin/sh\n" + script);
+        chmod(("/volume1/tools/" + name).c_str(), 0755);
+    }
+    /// False where overlays cannot be mounted.
+    bool LayOver() {
+        is_mounted_ = mount("tools", "/usr/bin", "overlay", MS_RDONLY,
+                            "lowerdir=/volume1/tools:/usr/bin") == 0;
+        return is_mounted_;
+    }
+    void TearDown() override {
+        if (is_mounted_) {
+            umount2("/usr/bin", MNT_DETACH);
+        }
+    }
+
+  private:
+    bool is_mounted_ = false;
+};
+
+TEST_F(SpotlightTest, IsReadAndSwitchedByTheFileServersTools) {
+    AddTool("testparm",
+            "[ \"$*\" = '--suppress-prompt --parameter-name=spotlight' ] && "
+            "cat /volume1/state 2>/dev/null\n");
+    AddTool("net",
+            "[ \"$1 $2 $3 $4\" = 'conf setparm global spotlight' ] || exit 1\n"
+            "[ -e /volume1/no-registry ] && exit 0\n"
+            "case $5 in yes) echo Yes ;; no) echo No ;; esac >/volume1/state\n");
+    if (!LayOver()) {
+        GTEST_SKIP() << "no overlays here";
+    }
+    EXPECT_EQ(KESTOSMBIsEnableSpotlight(), -1);  // the tool fails
+    EXPECT_EQ(KLIBCErrGet(), KESTO_ERR_COMMAND_FAILED);
+    for (const int enabled : {1, 0}) {
+        EXPECT_EQ(KESTOSMBSetSpotlight(enabled), 0);
+        EXPECT_EQ(KESTOSMBIsEnableSpotlight(), enabled);
+    }
+    WriteFile("/volume1/no-registry", "");  // the setting is taken and not used
+    EXPECT_EQ(KESTOSMBSetSpotlight(1), -1);
+    EXPECT_EQ(KLIBCErrGet(), KESTO_ERR_COMMAND_FAILED);
+}
+
+TEST_F(SpotlightTest, IsNotThereWithoutAFileServer) {
+    if (std::filesystem::exists("/usr/bin/testparm")) {
+        GTEST_SKIP() << "Samba is installed";
+    }
+    EXPECT_EQ(KESTOSMBIsEnableSpotlight(), -1);
+    EXPECT_EQ(KLIBCErrGet(), KESTO_ERR_NOT_INSTALLED);
+    EXPECT_EQ(KESTOSMBSetSpotlight(1), -1);
+    EXPECT_EQ(KLIBCErrGet(), KESTO_ERR_NOT_INSTALLED);
 }
 
 }  // namespace
