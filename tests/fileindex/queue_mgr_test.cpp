@@ -6,6 +6,7 @@
 #include <unistd.h>
 
 #include "common/lock_file.h"
+#include "fileindex/folder_mgr.h"
 #include "tests/fileindex/queue_support.h"
 
 namespace quivra::fileindex {
@@ -146,6 +147,15 @@ TEST_F(QueueMgrTest, QuestionsStopAtTheFirstMatchOrBadLine) {
     EXPECT_EQ(ErrorOf([&] { manager.IsFullPathProcessing("/b"); }),
               std::make_pair(906, std::string("Malformed event_raw: bad")));
     EXPECT_EQ(ErrorOf([&] { manager.IsFullPathHasReindex("/b"); }).first, 906);
+}
+
+TEST_F(QueueMgrTest, BrokenFolderSetRaises) {
+    const std::filesystem::path path = kFileIndexFoldersCfgPath;
+    std::filesystem::create_directories(path.parent_path());
+    std::ofstream(path) << "{";
+    EXPECT_EQ(ErrorOf([&] { QueueMgr(queue_).IsFullPathProcessing("/a"); }).first, 504);
+    EXPECT_EQ(ErrorOf([&] { QueueMgr(queue_).IsFullPathHasReindex("/a"); }).first, 0);
+    std::filesystem::remove(path);
 }
 
 TEST_F(QueueMgrTest, UnreadableFileRaises) {
