@@ -104,8 +104,14 @@ bool DomainSockConnection::Connect() {
         close(fd_);
     }
     fd_ = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    return fd_ >= 0 &&
-           connect(fd_, reinterpret_cast<const sockaddr*>(&address), sizeof(address)) == 0;
+    if (fd_ < 0) {
+        return false;
+    }
+    int result = 0;
+    do {  // a signal may come while the server's backlog is full
+        result = connect(fd_, reinterpret_cast<const sockaddr*>(&address), sizeof(address));
+    } while (result != 0 && errno == EINTR);
+    return result == 0;
 }
 
 }  // namespace kestodaemon

@@ -1,7 +1,8 @@
+#include "platform/standalone/quota.h"
+
 #include <fcntl.h>
 #include <kesto/error.h>
 #include <kesto/filesystem.h>
-#include <sys/quota.h>
 #include <sys/statvfs.h>
 #include <sys/syscall.h>
 #include <unistd.h>
@@ -10,23 +11,24 @@
 #include "platform/standalone/error_state.h"
 
 namespace kesto {
-namespace {
 
-/// Unit of the block limits in dqblk, whatever the file system's own block size.
-constexpr unsigned long long kQuotaBlock = 1024;
+bool LeavesRoom(const dqblk& quota, unsigned long long bytes) {
+    constexpr unsigned long long kBlock = 1024;  // whatever the file system's own block size
+    const unsigned long long blocks =
+        quota.dqb_bhardlimit != 0 ? quota.dqb_bhardlimit : quota.dqb_bsoftlimit;
+    const unsigned long long limit = blocks * kBlock;
+    return limit == 0 || (quota.dqb_curspace <= limit && limit - quota.dqb_curspace >= bytes);
+}
+
+namespace {
 
 /// Whether the effective user's quota on the file system leaves that much. It does where no quota
 /// is set or none can be asked for (a kernel before 5.14 included).
 bool IsWithinQuota(int fd, unsigned long long bytes) {
     const KeepErrno keep_errno;
     dqblk quota{};
-    if (syscall(SYS_quotactl_fd, fd, QCMD(Q_GETQUOTA, USRQUOTA), geteuid(), &quota) != 0) {
-        return true;
-    }
-    const unsigned long long blocks =
-        quota.dqb_bhardlimit != 0 ? quota.dqb_bhardlimit : quota.dqb_bsoftlimit;
-    const unsigned long long limit = blocks * kQuotaBlock;
-    return limit == 0 || (quota.dqb_curspace <= limit && limit - quota.dqb_curspace >= bytes);
+    return syscall(SYS_quotactl_fd, fd, QCMD(Q_GETQUOTA, USRQUOTA), geteuid(), &quota) != 0 ||
+           LeavesRoom(quota, bytes);
 }
 
 }  // namespace

@@ -37,6 +37,16 @@ std::string_view Trim(std::string_view text) {
     return text.substr(begin, text.find_last_not_of(" \t\r") + 1 - begin);
 }
 
+/// The line without its comment: a semicolon counts at the start and behind a blank.
+std::string_view WithoutComment(std::string_view line) {
+    for (std::size_t i = line.find(';'); i < line.size(); i = line.find(';', i + 1)) {
+        if (i == 0 || line[i - 1] == ' ' || line[i - 1] == '\t') {
+            return Trim(line.substr(0, i));
+        }
+    }
+    return line;
+}
+
 /// "Read Only" and "readonly" are one key.
 std::string NormalizedKey(std::string_view key) {
     std::string normalized;
@@ -93,7 +103,7 @@ class Parser {
         while (!text.empty()) {
             const std::size_t end = std::min(text.find('\n'), text.size());
             ++line_;
-            TakeLine(Trim(text.substr(0, end)));
+            TakeLine(WithoutComment(Trim(text.substr(0, end))));
             text.remove_prefix(std::min(end + 1, text.size()));
         }
         FinishSection();
@@ -103,7 +113,7 @@ class Parser {
   private:
     void TakeLine(std::string_view line) {
         const std::size_t equals = line.find('=');
-        if (line.empty() || line[0] == '#' || line[0] == ';') {
+        if (line.empty() || line[0] == '#') {
             return;
         }
         if (line.find('\0') != std::string_view::npos) {

@@ -35,7 +35,8 @@ using ShareList = std::vector<ShareConf>;
 /// Reads the text of a shares file. Lines that cannot be understood and sections that make no share
 /// are reported to the system log and left out; all others count. A share's name must be the last
 /// component of its path, and only the first section of a name counts. Letter case and blanks in
-/// keys do not matter, keys that are not known are skipped.
+/// keys do not matter, keys that are not known are skipped. A line that begins with "#" or ";" is a
+/// comment, and so is what follows a blank and ";".
 ShareList ParseShares(std::string_view text);
 
 /// The shares of /etc/kesto/shares.conf, read again when the file has changed. A missing file has

@@ -13,6 +13,7 @@
 
 #include "platform/standalone/fs_types.h"
 #include "platform/standalone/mounts.h"
+#include "platform/standalone/quota.h"
 #include "tests/platform/platform_test.h"
 
 namespace {
@@ -68,6 +69,25 @@ TEST_F(FilesystemTest, SpaceIsWhatTheFileSystemAndTheQuotaLeave) {
 TEST_F(FilesystemTest, UnlimitedFileSystemHasRoom) {
     const Mount unlimited("unlimited", "/volume1", "tmpfs", 0, "size=0");
     EXPECT_EQ(KESTOQuotaIsEnough(0, "/volume1", ~0ULL), 1);
+}
+
+TEST_F(FilesystemTest, QuotaCountsUpToItsLimit) {
+    struct Row {
+        unsigned long long hard_blocks, soft_blocks, used, bytes;
+        bool leaves_room;
+    };
+    const Row rows[] = {
+        {0, 0, 1ULL << 40, ~0ULL, true}, {4, 0, 1024, 3072, true},  {4, 0, 1024, 3073, false},
+        {4, 2, 3000, 1000, true},        {0, 2, 1024, 1025, false}, {4, 0, 5000, 0, false},
+        {4, 0, 0, ~0ULL, false},
+    };
+    for (const Row& row : rows) {
+        dqblk quota{};
+        quota.dqb_bhardlimit = row.hard_blocks;
+        quota.dqb_bsoftlimit = row.soft_blocks;
+        quota.dqb_curspace = row.used;
+        EXPECT_EQ(kesto::LeavesRoom(quota, row.bytes), row.leaves_room) << &row - rows;
+    }
 }
 
 TEST_F(FilesystemTest, UserQuotaCounts) {
