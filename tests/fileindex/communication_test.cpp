@@ -7,7 +7,6 @@
 
 #include <array>
 #include <cstring>
-#include <thread>
 
 #include "common/unique_fd.h"
 #include "tests/fake/scripted_server.h"
@@ -61,21 +60,6 @@ class Interruptions {
     static inline volatile int pipe_fd_ = -1;
 };
 
-TEST_F(CommunicationTest, BuffersOfAnySizeArriveWhole) {
-    for (const unsigned int size : {0U, 1U, 1024U, 1025U, 300000U}) {
-        const Pipe pipe;
-        std::vector<unsigned char> sent(size);
-        for (unsigned int i = 0; i < size; ++i) {
-            sent[i] = static_cast<unsigned char>(i * 7 / 3);
-        }
-        std::thread writer([&] { BufferWrite(pipe.write_end.Get(), size, sent.data()); });
-        std::vector<unsigned char> received(size);
-        BufferRead(pipe.read_end.Get(), size, received.data());
-        writer.join();
-        EXPECT_EQ(received, sent) << size;
-    }
-}
-
 TEST_F(CommunicationTest, AnEmptyReadIsRepeatedAfterAPause) {
     WriteFile("/tmp/growing", "ab");
     fake::OnSleep([](auto) { std::ofstream("/tmp/growing", std::ios::app) << "cd"; });
@@ -100,15 +84,6 @@ TEST_F(CommunicationTest, TenInterruptionsArePassedOverAndTheEleventhFails) {
     });
     EXPECT_EQ(error.code, 502);
     EXPECT_EQ(error.reason, "read failed, reason=Interrupted system call");
-}
-
-TEST_F(CommunicationTest, FailuresNameTheSystemsReason) {
-    unsigned char byte = 0;
-    EXPECT_EQ(ErrorOf([&] { BufferRead(-1, 1, &byte); }).reason,
-              "read failed, reason=Bad file descriptor");
-    EXPECT_EQ(ErrorOf([&] { BufferWrite(-1, 1, &byte); }).reason,
-              "write failed, reason=Bad file descriptor");
-    EXPECT_EQ(fake::LogLinesWith("communication:").size(), 2U);
 }
 
 TEST_F(CommunicationTest, ACommandIsOneFrameEachWay) {
@@ -150,15 +125,6 @@ TEST_F(CommunicationTest, AMissingSocketIsTriedFiveTimes) {
     });
     SendCommandToDaemon("pause", Json::Value());
     EXPECT_EQ(server->Connections(), 1);
-}
-
-TEST_F(CommunicationTest, ASocketThatNobodyServesFailsAtOnce) {
-    WriteFile(kDaemonSocket, "");
-    const Error error = ErrorOf([] { SendCommandToDaemon("pause", Json::Value()); });
-    std::filesystem::remove(kDaemonSocket);
-    EXPECT_EQ(error.code, 502);
-    EXPECT_TRUE(error.reason.starts_with("write failed, reason=")) << error.reason;
-    EXPECT_TRUE(fake::Sleeps().empty());
 }
 
 TEST_F(CommunicationTest, AMisbehavingDaemonIsAnErrorAndLeaksNothing) {

