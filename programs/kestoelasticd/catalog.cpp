@@ -114,6 +114,9 @@ std::shared_ptr<Index> Catalog::Use(const std::string& id) {
             return Use(id);
         }
     }
+    if (entry->second.deleting) {
+        throw Error(kBusy, "The index is being made or deleted: " + id);
+    }
     auto index = std::make_shared<Index>(entry->second.path,
                                          std::make_shared<Mapping>(entry->second.mappings),
                                          entry->second.paused, min_free_);
@@ -153,32 +156,46 @@ void Catalog::MakeFiles(const IndexEntry& entry) const {
 }
 
 void Catalog::Create(const std::string& id, const std::string& path, const Json::Value& mappings) {
-    const std::lock_guard lock(mutex_);
+    std::unique_lock lock(mutex_);
     const auto found = registry_.entries.find(id);
     if (found != registry_.entries.end()) {
-        if (found->second.path != path) {
-            throw Error(kIndexExists, "The index has another path: " + found->second.path);
-        }
-        if (!found->second.move && !IsIndexDirectory(path, found->second.uuid)) {
-            in_use_.erase(id);
-            MakeFiles(found->second);
-        }
+        CheckIsThere(id, found->second, path);
         return;
     }
     CheckIdIsFree(id, std::string());
     CheckPathIsFree(path, std::string());
+    const Mapping checked(mappings);
     IndexEntry entry;
     entry.path = path;
     entry.uuid = MakeUuid();
     entry.mappings = mappings;
-    MakeFiles(entry);
+    entry.deleting = true;  // what is found half made after an interruption goes
     registry_.entries.emplace(id, entry);
+    lock.unlock();
     try {
+        MakeFiles(entry);
+        lock.lock();
+        registry_.entries.at(id).deleting = false;
         registry_.Save();
     } catch (const Error&) {
-        registry_.entries.erase(id);
         RemoveIndexDirectory(entry.path, entry.uuid);
+        if (!lock.owns_lock()) {
+            lock.lock();
+        }
+        registry_.entries.erase(id);
         throw;
+    }
+}
+
+void Catalog::CheckIsThere(const std::string& id, const IndexEntry& entry,
+                           const std::string& path) {
+    if (entry.path != path) {
+        throw Error(kIndexExists, "The index has another path: " + entry.path);
+    }
+    Use(id);  // busy?
+    if (!entry.move && !IsIndexDirectory(path, entry.uuid)) {
+        in_use_.erase(id);
+        MakeFiles(entry);
     }
 }
 
@@ -192,18 +209,24 @@ void Catalog::Delete(const std::string& id) {
     if (!index->BeginMove()) {
         throw Error(kBusy, "The index is being moved: " + id);
     }
-    IndexEntry& entry = registry_.entries.at(id);
-    entry.deleting = true;
+    registry_.entries.at(id).deleting = true;
+    const IndexEntry entry = registry_.entries.at(id);
     try {
         registry_.Save();
+        lock.unlock();
+        index->Close();
+        if (!RemoveIndexDirectory(entry.path, entry.uuid)) {
+            quivra::LogError({"catalog", __LINE__}, "%s is no index: left", entry.path.c_str());
+        }
+        lock.lock();
     } catch (const Error&) {
-        entry.deleting = false;
+        if (!lock.owns_lock()) {
+            lock.lock();
+        }
+        registry_.entries.at(id).deleting = false;
+        lock.unlock();
         index->EndMove(entry.path);
         throw;
-    }
-    index->CloseForMove();
-    if (!RemoveIndexDirectory(entry.path, entry.uuid)) {
-        quivra::LogError({"catalog", __LINE__}, "%s is no index; left alone", entry.path.c_str());
     }
     in_use_.erase(id);
     registry_.entries.erase(id);
@@ -211,7 +234,7 @@ void Catalog::Delete(const std::string& id) {
 }
 
 void Catalog::SetPaused(const std::string& id, bool paused) {
-    const std::lock_guard lock(mutex_);
+    std::unique_lock lock(mutex_);
     const std::shared_ptr<Index> index = Use(id);
     IndexEntry& entry = registry_.entries.at(id);
     if (entry.paused != paused) {
@@ -223,7 +246,9 @@ void Catalog::SetPaused(const std::string& id, bool paused) {
             throw;
         }
     }
-    index->SetPaused(paused);
+    index->WantPaused(paused);
+    lock.unlock();
+    index->ApplyPaused();  // waits for those who use the index
 }
 
 void Catalog::Configure(const std::string& id, const std::string& new_id,
@@ -246,7 +271,7 @@ void Catalog::Configure(const std::string& id, const std::string& new_id,
     }
     CheckIdIsFree(move.id, id);
     CheckPathIsFree(move.path, id);
-    if (registry_.entries.at(id).move) {
+    if (index->IsMoving() || registry_.entries.at(id).move) {
         throw Error(kBusy, "The index is being moved: " + id);
     }
     if (move.path == registry_.entries.at(id).path) {
@@ -264,30 +289,46 @@ void Catalog::Move(std::unique_lock<std::mutex>& lock, const std::string& id,
     const std::shared_ptr<Index> index = in_use_.at(id);
     const std::string old_path = registry_.entries.at(id).path;
     const std::string uuid = registry_.entries.at(id).uuid;
+    bool copied = false;
     try {
         registry_.entries.at(id).move = target;
         registry_.Save();
         lock.unlock();
-        index->CloseForMove();
-        const Moved moved = MoveIndexDirectory(old_path, target.path, uuid);
+        index->CommitAndClose();
+        copied = MoveIndexDirectory(old_path, target.path, uuid) == Moved::kCopied;
         lock.lock();
-        Switch(id, moved == Moved::kCopied ? old_path : std::string());
+        Switch(id, copied ? old_path : std::string());
+        lock.unlock();
     } catch (const Error&) {
-        if (!lock.owns_lock()) {
-            lock.lock();
+        if (lock.owns_lock()) {
+            lock.unlock();
         }
-        UndoMove(old_path, target.path, uuid);
-        registry_.entries.at(id).move.reset();
-        index->EndMove(old_path);
-        registry_.Save();
+        GiveUpMove(*index, id, old_path, target.path);
         throw;
     }
     index->EndMove(target.path);
-    IndexEntry& entry = registry_.entries.at(target.id);
-    if (!entry.leftover.empty() && RemoveIndexDirectory(entry.leftover, uuid)) {
-        entry.leftover.clear();
+    if (copied && RemoveIndexDirectory(old_path, uuid)) {
+        lock.lock();
+        registry_.entries.at(target.id).leftover.clear();
         registry_.Save();
     }
+}
+
+void Catalog::GiveUpMove(Index& index, const std::string& id, const std::string& old_path,
+                         const std::string& new_path) {
+    std::unique_lock lock(mutex_);
+    IndexEntry& entry = registry_.entries.at(id);
+    try {
+        UndoMove(old_path, new_path, entry.uuid);
+        entry.move.reset();
+        registry_.Save();
+    } catch (const Error& error) {
+        // The next start tries again: the record of the move is still there, on disk.
+        quivra::LogError({"catalog", __LINE__}, "cannot undo a move: %s", error.what());
+        entry.move.reset();
+    }
+    lock.unlock();
+    index.EndMove(old_path);
 }
 
 /// Records that the index is at its new place. When that cannot be saved, files that are at the new

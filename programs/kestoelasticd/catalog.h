@@ -14,7 +14,8 @@
 namespace elasticd {
 
 /// All indexes, and their making, deleting, pausing, renaming and moving. Every change is recorded
-/// before it is begun, and finished or undone after an interruption. Safe from any thread.
+/// before it is begun, and finished or undone after an interruption. Safe from any thread; long
+/// work on one index does not hold up the others.
 class Catalog {
   public:
     /// Loads the registry and settles what an earlier process left half done. `min_free`: see
@@ -47,6 +48,9 @@ class Catalog {
     Entries::iterator Rekey(Entries::iterator entry, const std::string& new_id);
     void Move(std::unique_lock<std::mutex>& lock, const std::string& id,
               const IndexEntry::Move& target);
+    void CheckIsThere(const std::string& id, const IndexEntry& entry, const std::string& path);
+    void GiveUpMove(Index& index, const std::string& id, const std::string& old_path,
+                    const std::string& new_path);
     void Switch(const std::string& id, const std::string& leftover);
     void Rename(const std::string& id, const std::string& new_id);
 

@@ -25,6 +25,7 @@ Index::Index(std::string directory, std::shared_ptr<const Mapping> mapping, bool
              std::uint64_t min_free)
     : mapping_(std::move(mapping)),
       min_free_(min_free),
+      want_paused_(paused),
       directory_(std::move(directory)),
       paused_(paused) {
     MakeWriter();
@@ -118,19 +119,15 @@ SearchResult Index::Query(const Json::Value& query) {
     });
 }
 
-void Index::SetPaused(bool paused) {
-    if (moving_) {
-        throw Error(kBusy, "The index is being moved");
-    }
+void Index::ApplyPaused() {
     const std::unique_lock lock(use_);
-    paused_ = paused;
-    if (paused) {
-        writer_->Close();
-        idle_readers_.clear();
+    paused_ = want_paused_;
+    if (paused_) {
+        CloseFiles();
     }
 }
 
-void Index::CloseForMove() {
+void Index::CommitAndClose() {
     const std::unique_lock lock(use_);
     try {
         if (writer_->HasChanges()) {
@@ -140,6 +137,15 @@ void Index::CloseForMove() {
         quivra::LogError({"index", __LINE__}, "batch lost in a move: %s", error.what());
         writer_->SetBatchLost();
     }
+    CloseFiles();
+}
+
+void Index::Close() {
+    const std::unique_lock lock(use_);
+    CloseFiles();
+}
+
+void Index::CloseFiles() {
     writer_->Close();
     idle_readers_.clear();
 }

@@ -33,14 +33,19 @@ class Index {
     /// Removes documents or commits: as Write, but never refused for space.
     void Reduce(const std::function<void(IndexWriter&)>& change);
     SearchResult Query(const Json::Value& query);
-    /// Pausing drops the batch and closes all files.
-    void SetPaused(bool paused);
+    /// Pausing drops the batch and closes all files. The two steps, of which only the second waits
+    /// for those who use the index, may come from several threads: the last wish holds.
+    void WantPaused(bool paused) { want_paused_ = paused; }
+    void ApplyPaused();
 
     /// From now on, everybody is told to come back later. False when that is so already.
     bool BeginMove() { return !moving_.exchange(true); }
+    bool IsMoving() const { return moving_; }
     /// After BeginMove: waits for those who still use the index, commits the batch and closes all
     /// files. A batch that cannot be committed is lost, and the next commit will say so.
-    void CloseForMove();
+    void CommitAndClose();
+    /// The same without the commit.
+    void Close();
     /// Continues, in the directory that it was moved to.
     void EndMove(std::string directory);
 
@@ -55,10 +60,12 @@ class Index {
     void CheckSpace();
     std::unique_ptr<Reader> TakeReader();
     void MakeWriter();
+    void CloseFiles();
 
     const std::shared_ptr<const Mapping> mapping_;
     const std::uint64_t min_free_;
     std::atomic<bool> moving_ = false;
+    std::atomic<bool> want_paused_;
 
     std::shared_mutex use_;  ///< exclusive: nobody uses the files
     std::string directory_;  ///< changed under the exclusive lock only, as is paused_

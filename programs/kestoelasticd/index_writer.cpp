@@ -127,15 +127,16 @@ void IndexWriter::Upsert(const std::string& id, const Json::Value& data) {
             if (name == mapping_->IdField() || it->isNull()) {
                 continue;
             }
-            editor.AddField(name, *it);
-            if (name == kTextField) {
-                bytes = it->isString() ? it->asString().size() : 0;
-            } else {
-                AppendJson(record[fields_.FindOrAdd(name)], *it);
+            std::string json;
+            AppendJson(json, *it);
+            bytes += json.size();
+            if (bytes > kMaxDocumentText) {
+                throw Error(kBadDocument, "The document is too large");
             }
-        }
-        if (bytes > kMaxDocumentText) {
-            throw Error(kBadDocument, "The document's text is too long");
+            editor.AddField(name, *it);
+            if (name != kTextField) {
+                record[fields_.FindOrAdd(name)] = std::move(json);
+            }
         }
         editor.Finish();
         document.set_data(EncodeRecord(record));
