@@ -81,8 +81,6 @@ int QueueMgr::ProcessOP(const std::function<void(std::shared_ptr<OP>)>& fn, bool
 }
 
 bool QueueMgr::IsFullPathProcessing(const std::string& full_path) const {
-    // Not consulted, but the question fails like every other one while the set cannot be loaded.
-    const FolderMgr folders;
     // Not consulted: who asks learns here when the configured folders cannot be read.
     const FolderMgr folder_mgr;
     const auto touches = [&](const Event& event) {
