@@ -19,6 +19,7 @@
 #include "common/error.h"
 #include "common/log.h"
 
+#include "programs/kestotifyd/fanotify_backend.h"
 #include "programs/kestotifyd/inotify_backend.h"
 #include "programs/kestotifyd/registration.h"
 #include "programs/support/instance_lock.h"
@@ -259,8 +260,8 @@ bool Monitor::IsPresent(const std::string& path) const {
 
 void Monitor::StartRoot(const std::string& path, Root& root) {
     struct stat status {};
-    Backend* const backend = stat(path.c_str(), &status) == 0 ? ChooseBackend(path) : nullptr;
-    if (backend == nullptr || !backend->AddRoot(path)) {
+    Backend* const backend = stat(path.c_str(), &status) == 0 ? AddToBackend(path) : nullptr;
+    if (backend == nullptr) {
         if (!std::exchange(root.is_failure_logged, true)) {
             quivra::LogError({"monitor", __LINE__}, "The folder %s cannot be watched",
                              path.c_str());
@@ -268,16 +269,31 @@ void Monitor::StartRoot(const std::string& path, Root& root) {
         return;
     }
     root = {backend, false, status.st_dev, status.st_ino, mounts_.Covering(path), false};
+    if (options_.is_verbose) {
+        quivra::LogTrace({"monitor", __LINE__}, "Watching %s with %s", path.c_str(),
+                         backend == fanotify_.get() ? "fanotify" : "inotify");
+    }
 }
 
-Backend* Monitor::ChooseBackend(const std::string& path) {
-    (void)path;
+/// The back end that took the folder; null when none could.
+Backend* Monitor::AddToBackend(const std::string& path) {
+    BackendSink& sink = *this;
+    if (options_.backend != BackendChoice::kInotify) {
+        if (!fanotify_ && (fanotify_ = FanotifyBackend::Create(sink))) {
+            WatchDescriptor(fanotify_->Fd(), EPOLLIN);
+        }
+        if (fanotify_ && fanotify_->AddRoot(path)) {
+            return fanotify_.get();
+        }
+        if (options_.backend == BackendChoice::kFanotify) {
+            return nullptr;
+        }
+    }
     if (!inotify_) {
-        inotify_ = std::make_unique<InotifyBackend>(static_cast<BackendSink&>(*this),
-                                                    options_.max_watches);
+        inotify_ = std::make_unique<InotifyBackend>(sink, options_.max_watches);
         WatchDescriptor(inotify_->Fd(), EPOLLIN);
     }
-    return inotify_.get();
+    return inotify_->AddRoot(path) ? inotify_.get() : nullptr;
 }
 
 void Monitor::OnChange(const Change& change) {

@@ -55,7 +55,7 @@ class Monitor : private BackendSink {
     void CheckRoots();
     bool IsPresent(const std::string& path) const;
     void StartRoot(const std::string& path, Root& root);
-    Backend* ChooseBackend(const std::string& path);
+    Backend* AddToBackend(const std::string& path);
     void DropObsoleteRoots();
     void WorkBackends(bool is_last);
     int WaitMilliseconds(Time now) const;

@@ -66,7 +66,9 @@ void ShareModel::Carry(const std::string& line) {
 }
 
 void ShareModel::DropBelow(Entries& entries, const std::string& path) {
-    std::erase_if(entries, [&](const auto& entry) { return IsAtOrBelow(entry.first, path); });
+    entries.erase(path);
+    // "0" is the character behind "/".
+    entries.erase(entries.lower_bound(path + "/"), entries.lower_bound(path + "0"));
 }
 
 bool ShareModel::MoveBelow(Entries& entries, const std::string& from, const std::string& to) {
