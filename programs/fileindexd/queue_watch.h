@@ -1,0 +1,47 @@
+#pragma once
+
+#include <sys/types.h>
+
+#include <string>
+#include <vector>
+
+#include "common/unique_fd.h"
+#include "programs/fileindexd/schedule.h"
+
+namespace fileindexd {
+
+/// Tells when a share's queue or the status file changes, and what the queue's new lines are about.
+class QueueWatch {
+  public:
+    struct News {
+        bool queue = false;   ///< lines were added
+        bool status = false;  ///< the status file was replaced
+        bool gone = false;    ///< the queue's directory was removed or unmounted
+    };
+
+    /// Throws Error 502 when the queue's directory cannot be watched.
+    explicit QueueWatch(const std::string& queue_path);
+
+    /// Readable when there is news.
+    int Fd() const { return inotify_.Get(); }
+    /// What has happened since the last call.
+    News Read();
+
+    /// Reports the lines that were added since the last call to the schedule: those that are only
+    /// about files that change all the time may wait.
+    void ReadNewLines(Schedule& schedule, const ChangeRates& rates, Clock::time_point now);
+    /// The queue file is about to be taken away; the next one counts from its beginning.
+    void Forget() { inode_ = 0; }
+
+  private:
+    void HandleEvent(News& news, int watch, unsigned int mask, const char* name) const;
+
+    const std::string queue_path_;
+    quivra::UniqueFd inotify_;
+    int queue_watch_ = -1;
+    int status_watch_ = -1;
+    ino_t inode_ = 0;   ///< of the queue file that was read last
+    off_t offset_ = 0;  ///< how far
+};
+
+}  // namespace fileindexd

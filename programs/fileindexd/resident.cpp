@@ -1,0 +1,184 @@
+#include "programs/fileindexd/resident.h"
+
+#include <poll.h>
+#include <sys/eventfd.h>
+#include <sys/signalfd.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <csignal>
+#include <cstdint>
+#include <deque>
+#include <future>
+#include <memory>
+#include <mutex>
+#include <thread>
+#include <utility>
+
+#include "common/error.h"
+#include "common/log.h"
+#include "common/unique_fd.h"
+#include "programs/fileindexd/controller.h"
+#include "programs/fileindexd/state_file.h"
+#include "programs/support/frame_server.h"
+
+namespace fileindexd {
+
+using quivra::Error;
+using Clock = Controller::Clock;
+
+namespace {
+
+constexpr const char* kUnit = "fileindexd";
+
+/// No command is long.
+constexpr std::size_t kMaxRequest = 1024 * 1024;
+
+/// Hands commands from the server's threads over to the one that supervises.
+class CommandQueue {
+  public:
+    CommandQueue() : event_(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {}
+
+    struct Entry {
+        Command command;
+        std::promise<std::string> reply;
+    };
+
+    /// Readable while there are entries.
+    int Fd() const { return event_.Get(); }
+
+    /// Waits for the reply, which is an error once the queue was closed.
+    std::string Run(const Command& command) {
+        std::future<std::string> reply;
+        {
+            const std::lock_guard<std::mutex> lock(mutex_);
+            if (closed_) {
+                return ErrorReply(Error::kSystemCallFailed, "The daemon is stopping");
+            }
+            entries_.push_back({command, {}});
+            reply = entries_.back().reply.get_future();
+        }
+        eventfd_write(event_.Get(), 1);
+        return reply.get();
+    }
+
+    std::deque<Entry> Take() {
+        eventfd_t count = 0;
+        eventfd_read(event_.Get(), &count);
+        const std::lock_guard<std::mutex> lock(mutex_);
+        return std::exchange(entries_, {});
+    }
+
+    void Close() {
+        const std::lock_guard<std::mutex> lock(mutex_);
+        closed_ = true;
+    }
+
+  private:
+    quivra::UniqueFd event_;
+    std::mutex mutex_;
+    std::deque<Entry> entries_;
+    bool closed_ = false;
+};
+
+std::string Answer(CommandQueue& queue, const std::string& request) {
+    try {
+        return queue.Run(ParseCommand(request));
+    } catch (const Error& error) {
+        return ErrorReply(error.code, error.reason);
+    }
+}
+
+/// Blocks the signals that the loop waits for, in this thread and those to come.
+quivra::UniqueFd CatchSignals() {
+    sigset_t signals;
+    sigemptyset(&signals);
+    for (const int signal : {SIGTERM, SIGINT, SIGCHLD}) {
+        sigaddset(&signals, signal);
+    }
+    sigprocmask(SIG_BLOCK, &signals, nullptr);
+    return quivra::UniqueFd(signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK));
+}
+
+class Resident {
+  public:
+    explicit Resident(const std::vector<std::string>& worker_command)
+        : signals_(CatchSignals()),
+          server_({.path = kDaemonSocketPath, .max_request = kMaxRequest},
+                  [this](const std::string& request) { return Answer(commands_, request); }),
+          supervisor_([worker_command](const std::string& share) {
+              std::vector<std::string> command = worker_command;
+              command.push_back(share);
+              return command;
+          }),
+          controller_(supervisor_) {}
+
+    void Run() {
+        std::thread serving([this] { server_.Run(); });
+        while (!stopping_ || !controller_.IsStopped()) {
+            Wait();
+            ReadSignals();
+            for (CommandQueue::Entry& entry : commands_.Take()) {
+                Execute(entry);
+            }
+            controller_.Update(Clock::now());
+        }
+        commands_.Close();
+        for (CommandQueue::Entry& entry : commands_.Take()) {
+            entry.reply.set_value(ErrorReply(Error::kSystemCallFailed, "The daemon is stopping"));
+        }
+        server_.Stop();
+        serving.join();
+    }
+
+  private:
+    void Wait() const {
+        int timeout = -1;
+        const Clock::time_point now = Clock::now();
+        if (const auto due = controller_.Due(now)) {
+            const auto left = std::chrono::ceil<std::chrono::milliseconds>(*due - now).count();
+            timeout = static_cast<int>(std::clamp<std::int64_t>(left, 0, 3600000));
+        }
+        pollfd descriptors[] = {{signals_.Get(), POLLIN, 0}, {commands_.Fd(), POLLIN, 0}};
+        poll(descriptors, 2, timeout);
+    }
+
+    void ReadSignals() {
+        signalfd_siginfo info;
+        while (read(signals_.Get(), &info, sizeof(info)) == sizeof(info)) {
+            if (info.ssi_signo != SIGCHLD && !stopping_) {
+                stopping_ = true;
+                controller_.ShutDown(Clock::now());
+            }
+        }
+    }
+
+    void Execute(CommandQueue::Entry& entry) {
+        auto reply = std::make_shared<std::promise<std::string>>(std::move(entry.reply));
+        try {
+            controller_.Execute(
+                entry.command, [reply](const std::string& text) { reply->set_value(text); },
+                Clock::now());
+        } catch (const Error& error) {
+            quivra::LogError({kUnit, __LINE__}, "A command failed: %s", error.what());
+            reply->set_value(ErrorReply(error.code, error.reason));
+        }
+    }
+
+    quivra::UniqueFd signals_;
+    CommandQueue commands_;
+    support::FrameServer server_;
+    Supervisor supervisor_;
+    Controller controller_;
+    bool stopping_ = false;
+};
+
+}  // namespace
+
+void RunResident(const std::vector<std::string>& worker_command) {
+    MakeRunDirectory();
+    Resident(worker_command).Run();
+}
+
+}  // namespace fileindexd

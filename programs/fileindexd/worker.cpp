@@ -1,0 +1,170 @@
+#include "programs/fileindexd/worker.h"
+
+#include <linux/ioprio.h>
+#include <poll.h>
+#include <sys/eventfd.h>
+#include <sys/resource.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <chrono>
+#include <csignal>
+#include <cstdint>
+
+#include "common/log.h"
+#include "programs/fileindexd/queue_watch.h"
+#include "programs/fileindexd/repair.h"
+#include "programs/fileindexd/share_worker.h"
+#include "sdk/share.h"
+
+namespace fileindexd {
+
+using quivra::Error;
+
+namespace {
+
+constexpr const char* kUnit = "worker";
+
+volatile std::sig_atomic_t stop_requested = 0;
+int stop_event = -1;
+
+extern "C" void RequestStop(int) {
+    const int error = errno;
+    stop_requested = 1;
+    const std::uint64_t one = 1;
+    if (write(stop_event, &one, sizeof(one)) < 0) {
+        // It is readable already.
+    }
+    errno = error;
+}
+
+/// SIGTERM and SIGINT are noticed between two operations, end a wait, and cut the search client's
+/// long sleeps short.
+void CatchStopSignals() {
+    stop_event = eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK);
+    struct sigaction action {};
+    action.sa_handler = RequestStop;
+    sigset_t signals;
+    sigemptyset(&signals);
+    for (const int signal : {SIGTERM, SIGINT}) {
+        sigaddset(&signals, signal);
+        sigaction(signal, &action, nullptr);
+    }
+    sigprocmask(SIG_UNBLOCK, &signals, nullptr);
+}
+
+/// Indexing takes what others leave.
+void LowerPriority() {
+    setpriority(PRIO_PROCESS, 0, 15);
+    syscall(SYS_ioprio_set, IOPRIO_WHO_PROCESS, 0, IOPRIO_PRIO_VALUE(IOPRIO_CLASS_IDLE, 0));
+}
+
+class Worker {
+  public:
+    explicit Worker(const std::string& share)
+        : share_(share), watch_(quivra::sdk::SDKShare(share).GetQueuePath()), work_(share) {}
+
+    int Run() {
+        Repair();
+        schedule_.QueueChanged(Clock::now());  // what was queued, or left, before
+        while (stop_requested == 0) {
+            ShowState();
+            Wait();
+            const QueueWatch::News news = watch_.Read();
+            if (news.gone) {
+                quivra::LogError({kUnit, __LINE__}, "The queue's directory of share %s has gone",
+                                 share_.c_str());
+                return 1;
+            }
+            if (news.status) {
+                Repair();
+            }
+            if (news.queue) {
+                watch_.ReadNewLines(schedule_, rates_, Clock::now());
+            }
+            const auto due = schedule_.Due();
+            if (due && *due <= Clock::now() && stop_requested == 0) {
+                RunPass();
+            }
+        }
+        work_.State().Remove();
+        return 0;
+    }
+
+  private:
+    void ShowState() {
+        if (!schedule_.HasFailed()) {
+            work_.State().Set(schedule_.Due() ? StateFile::State::kSettling
+                                              : StateFile::State::kIdle);
+        }
+    }
+
+    void Wait() const {
+        int timeout = -1;
+        if (const auto due = schedule_.Due()) {
+            const auto left =
+                std::chrono::ceil<std::chrono::milliseconds>(*due - Clock::now()).count();
+            timeout = static_cast<int>(std::clamp<std::int64_t>(left, 0, 3600000));
+        }
+        pollfd descriptors[] = {{watch_.Fd(), POLLIN, 0}, {stop_event, POLLIN, 0}};
+        poll(descriptors, 2, timeout);
+    }
+
+    void RunPass() {
+        schedule_.PassBegins();
+        watch_.Forget();
+        try {
+            const PassResult result = work_.RunPass([] {
+                if (stop_requested != 0) {
+                    throw Stopped();
+                }
+            });
+            schedule_.PassSucceeded();
+            for (const std::string& path : result.changed) {
+                rates_.Indexed(path, Clock::now());
+            }
+            Repair();
+        } catch (const Stopped&) {
+            return;  // the working copy is carried on by the next worker
+        } catch (const std::exception& error) {
+            schedule_.PassFailed(Clock::now());
+            quivra::LogError({kUnit, __LINE__}, "The pass over share %s failed: %s", share_.c_str(),
+                             error.what());
+        }
+        // What came during the pass, or stood behind the copy of an interrupted one.
+        watch_.ReadNewLines(schedule_, rates_, Clock::now());
+    }
+
+    void Repair() {
+        try {
+            RepairIfNeeded(share_);
+        } catch (const std::exception& error) {
+            quivra::LogError({kUnit, __LINE__}, "Share %s cannot be repaired: %s", share_.c_str(),
+                             error.what());
+        }
+    }
+
+    const std::string share_;
+    QueueWatch watch_;
+    ShareWorker work_;
+    Schedule schedule_;
+    ChangeRates rates_;
+};
+
+}  // namespace
+
+int RunWorker(const std::string& share) {
+    CatchStopSignals();
+    LowerPriority();
+    try {
+        return Worker(share).Run();
+    } catch (const std::exception& error) {
+        quivra::LogError({kUnit, __LINE__}, "The worker of share %s failed: %s", share.c_str(),
+                         error.what());
+        return 1;
+    }
+}
+
+}  // namespace fileindexd
