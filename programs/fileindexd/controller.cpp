@@ -27,6 +27,7 @@ constexpr std::chrono::seconds kPauseCheck{30};
 
 Controller::Controller(Supervisor& supervisor)
     : supervisor_(supervisor), resume_time_(StatusMgr().GetPauseInfo()) {
+    supervisor_.SetEndListener([this](const std::string& share) { ShowStopped(share); });
     indexed_ = ReadShares();
     Reconcile(Clock::now());
 }
@@ -67,14 +68,22 @@ void Controller::Reconcile(Clock::time_point now) {
     const std::set<std::string> paused =
         was_paused_ ? std::exchange(wanted, {}) : std::set<std::string>();
     supervisor_.SetWanted(wanted, now);
-    for (const std::string& share : shown_paused_) {
-        if (!paused.contains(share) && !wanted.contains(share)) {
-            StateFile(share).Remove();
-        }
+    for (const std::string& share : std::exchange(paused_, paused)) {
+        ShowStopped(share);
     }
-    shown_paused_ = paused;
-    for (const std::string& share : paused) {
+    for (const std::string& share : paused_) {
+        ShowStopped(share);
+    }
+}
+
+void Controller::ShowStopped(const std::string& share) const {
+    if (supervisor_.IsRunning(share) || supervisor_.IsWanted(share)) {
+        return;  // the worker writes the file, or it is called again when the worker has ended
+    }
+    if (paused_.contains(share)) {
         StateFile(share).Set(StateFile::State::kPaused);
+    } else {
+        StateFile(share).Remove();
     }
 }
 

@@ -46,13 +46,15 @@ class Controller {
     bool IsPaused() const;
     std::set<std::string> ReadShares();
     void Reconcile(Clock::time_point now);
+    /// Brings the state file of a share without a worker up to date.
+    void ShowStopped(const std::string& share) const;
     void AnswerWaiting();
 
     Supervisor& supervisor_;
     std::int64_t resume_time_;
     std::map<std::string, bool> commanded_;  ///< created or deleted by command
     std::set<std::string> indexed_;          ///< as the folder set said last
-    std::set<std::string> shown_paused_;     ///< their state files say so
+    std::set<std::string> paused_;           ///< by the global pause
     std::list<Waiting> waiting_;
     bool was_paused_ = false;
     bool shut_down_ = false;

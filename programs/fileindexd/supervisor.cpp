@@ -61,12 +61,11 @@ Supervisor::~Supervisor() {
 
 void Supervisor::SetWanted(const std::set<std::string>& shares, Clock::time_point now) {
     for (const std::string& share : shares) {
-        Worker& worker = workers_.try_emplace(share, Worker{.next_start = now}).first->second;
+        Worker& worker = workers_[share];
         if (!worker.wanted) {
-            worker = Worker{.pid = worker.pid,
-                            .started = worker.started,
-                            .next_start = now,
-                            .kill_at = worker.kill_at};
+            worker.wanted = true;
+            worker.wait = kFirstRestart;
+            worker.next_start = now;
         }
     }
     for (auto& [share, worker] : workers_) {
@@ -110,6 +109,9 @@ void Supervisor::NoteEnd(const std::string& share, Worker& worker, int status,
     const bool was_told = worker.kill_at.has_value();
     worker.pid = 0;
     worker.kill_at.reset();
+    if (!worker.wanted && on_end_) {
+        on_end_(share);
+    }
     if (was_told) {
         return;
     }

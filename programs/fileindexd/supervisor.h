@@ -28,11 +28,16 @@ class Supervisor {
     /// A worker that lived that long starts from kFirstRestart again.
     static constexpr std::chrono::seconds kStable{60};
 
+    /// Told when the last worker of a share that is not wanted any more has ended.
+    using EndListener = std::function<void(const std::string& share)>;
+
     explicit Supervisor(CommandOf command_of) : command_of_(std::move(command_of)) {}
     /// Kills what still runs.
     ~Supervisor();
     Supervisor(const Supervisor&) = delete;
     Supervisor& operator=(const Supervisor&) = delete;
+
+    void SetEndListener(EndListener listener) { on_end_ = std::move(listener); }
 
     /// Starts and stops workers so that exactly these shares have one.
     void SetWanted(const std::set<std::string>& shares, Clock::time_point now);
@@ -61,10 +66,10 @@ class Supervisor {
 
     void Start(const std::string& share, Worker& worker, Clock::time_point now);
     static void Stop(Worker& worker, Clock::time_point now);
-    static void NoteEnd(const std::string& share, Worker& worker, int status,
-                        Clock::time_point now);
+    void NoteEnd(const std::string& share, Worker& worker, int status, Clock::time_point now);
 
     CommandOf command_of_;
+    EndListener on_end_;
     std::map<std::string, Worker> workers_;
 };
 

@@ -89,7 +89,6 @@ class Worker {
                 RunPass();
             }
         }
-        work_.State().Remove();
         return 0;
     }
 
