@@ -43,17 +43,37 @@ void Batch::Changed() {
 
 void Batch::Upsert(const std::string& path, bool is_dir) {
     Announce(path);
+    const bool need_meta = !is_dir && scope_.NeedsMeta(path);
     try {
-        index_.Upsert(path, !is_dir && scope_.NeedsMeta(path));
-        Changed();
-        ++counts_.indexed;
+        UpsertAs(path, need_meta);
     } catch (const DocumentError& error) {
         std::optional<Attributes> there;
-        if (Look(there, path) && !there) {
+        if (!Look(there, path)) {
+            return;
+        }
+        if (!there) {
             Drop(path);
-        } else if (there) {
+        } else if (!need_meta || !UpsertWithoutContent(path, error.what())) {
             Skip(path, error.what());
         }
+    }
+}
+
+void Batch::UpsertAs(const std::string& path, bool need_meta) {
+    index_.Upsert(path, need_meta);
+    Changed();
+    ++counts_.indexed;
+}
+
+/// Better found by its name than not at all.
+bool Batch::UpsertWithoutContent(const std::string& path, const std::string& reason) {
+    try {
+        UpsertAs(path, false);
+        quivra::LogError({kUnit, __LINE__}, "Indexed %s without content: %s", path.c_str(),
+                         reason.c_str());
+        return true;
+    } catch (const DocumentError&) {
+        return false;
     }
 }
 

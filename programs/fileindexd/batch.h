@@ -48,7 +48,8 @@ class Batch {
     /// Tells the listener what comes next, also where the index is only compared.
     void Announce(const std::string& path);
 
-    /// A file that is gone meanwhile is dropped; another failure is logged, and the file skipped.
+    /// A file that is gone meanwhile is dropped. One that is refused is tried without its content,
+    /// then skipped; both are logged.
     void Upsert(const std::string& path, bool is_dir);
     /// Sets the attributes of a document, which is added when there is none.
     void Refresh(const std::string& path, bool is_dir);
@@ -76,6 +77,8 @@ class Batch {
     const Counts& GetCounts() const { return counts_; }
 
   private:
+    void UpsertAs(const std::string& path, bool need_meta);
+    bool UpsertWithoutContent(const std::string& path, const std::string& reason);
     void Changed();
 
     Index& index_;

@@ -51,8 +51,8 @@ Document ReadDocument(const Json::Value& hit) {
 
 /// The search daemon's codes that concern the document of a request, not the index: see its
 /// documentation.
-constexpr int kNoSuchDocument = 1404;
-constexpr int kDocumentRefused = 1406;
+constexpr int kNoSuchDocument = 1408;
+constexpr int kDocumentRefused = 1409;
 
 class NoSuchDocument : public DocumentError {
     using DocumentError::DocumentError;

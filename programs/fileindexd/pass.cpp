@@ -20,7 +20,7 @@ namespace {
 constexpr const char* kUnit = "pass";
 
 /// How much older than its event, in seconds, a change may be: the monitor may lag behind.
-constexpr std::int64_t kMonitorLag = 10;
+constexpr std::int64_t kMonitorLag = 2;
 
 ContentClasses ClassesOf(const Json::Value& settings) {
     ContentClasses classes;
