@@ -96,7 +96,7 @@ TEST_F(CommunicationTest, ACommandIsOneFrameEachWay) {
     SendCommandToDaemon("pause", Parse(R"({"resume_time": 5})"));
     SendCommandToDaemon("resume", Json::Value());
     SendCommandToDaemon("big", big);
-    EXPECT_EQ(OpenDescriptors(), descriptors);
+    EXPECT_TRUE(NoneLeaked(descriptors));
     const auto requests = server.Requests();
     ASSERT_EQ(requests.size(), 3U);
     EXPECT_EQ(requests[0], Parse(R"({"type": "pause", "data": {"resume_time": 5}})"));
@@ -113,7 +113,7 @@ TEST_F(CommunicationTest, AMissingSocketIsTriedFiveTimes) {
     EXPECT_EQ(error.code, 502);
     EXPECT_EQ(error.reason, "write failed, reason=Transport endpoint is not connected");
     EXPECT_EQ(fake::Sleeps(), std::vector<std::chrono::microseconds>(4, std::chrono::seconds(1)));
-    EXPECT_EQ(OpenDescriptors(), descriptors);
+    EXPECT_TRUE(NoneLeaked(descriptors));
 
     // A daemon that comes up meanwhile is found.
     fake::ResetLibc();
@@ -138,7 +138,7 @@ TEST_F(CommunicationTest, AMisbehavingDaemonIsAnErrorAndLeaksNothing) {
     server.Then({.bytes = "", .read_request = false});
     const Error hung_up = ErrorOf([] { SendCommandToDaemon("x", std::string(1U << 20, 'x')); });
     EXPECT_EQ(hung_up.code, 502);
-    EXPECT_EQ(OpenDescriptors(), descriptors);
+    EXPECT_TRUE(NoneLeaked(descriptors));
 
     server.Then({.bytes = "", .read_request = false, .keep_open = true});
     const Error stalled = ErrorOf([] { SendCommandToDaemon("x", std::string(1U << 22, 'x')); });

@@ -2,7 +2,9 @@
 
 #include <gtest/gtest.h>
 #include <json/json.h>
+#include <poll.h>
 
+#include <chrono>
 #include <filesystem>
 #include <fstream>
 #include <sstream>
@@ -67,6 +69,16 @@ inline void WriteFile(const std::string& path, const std::string& text) {
 inline std::size_t OpenDescriptors() {
     const std::filesystem::directory_iterator entries("/proc/self/fd");
     return static_cast<std::size_t>(std::distance(begin(entries), end(entries)));
+}
+
+/// Whether no more descriptors are open than before. Waits for the servers' threads, which close
+/// their ends some time after the reply.
+inline bool NoneLeaked(std::size_t before) {
+    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(10);
+    while (OpenDescriptors() > before && std::chrono::steady_clock::now() < deadline) {
+        poll(nullptr, 0, 1);
+    }
+    return OpenDescriptors() <= before;
 }
 
 }  // namespace quivra::fileindex
