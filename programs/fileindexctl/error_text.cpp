@@ -3,6 +3,8 @@
 #include <algorithm>
 #include <array>
 
+#include "common/util.h"
+
 namespace quivra::ctl {
 namespace {
 
@@ -31,8 +33,7 @@ enum SearchDaemonCode : int {
 constexpr std::array kErrorTexts = {
     ErrorText{Error::kBadArgument, "a value is missing or wrong", "check the names and paths given",
               Reason::kTell},
-    ErrorText{Error::kSystemCallFailed, "a system call or a daemon failed",
-              "check with 'fileindexctl status' that the daemons run, and see the system log",
+    ErrorText{Error::kSystemCallFailed, "a system call failed", "see the system log",
               Reason::kTell},
     ErrorText{Error::kCredentialsFailed, "the rights of root could not be taken",
               "run the command as root", Reason::kTell},
@@ -75,14 +76,25 @@ constexpr std::array kErrorTexts = {
               "'fileindexctl share clear' forgets one that is gone", Reason::kTell},
     ErrorText{kIndexPaused, "its index is paused", "'fileindexctl share resume' goes on with it",
               Reason::kLeaveOut},
-    ErrorText{kBadQuery, "the words cannot be searched for", "see 'fileindexctl search --help'",
-              Reason::kTell},
+    ErrorText{kBadQuery, "the search daemon cannot follow the query",
+              "see 'fileindexctl search --help'", Reason::kTell},
     ErrorText{kNoSpace, "the volume of the index is full", "free space there", Reason::kTell},
     ErrorText{kIndexUnavailable, "the files of its index are missing or unreadable",
               "check that its volume is mounted", Reason::kTell},
     ErrorText{kReplyTooLarge, "there are too many hits for one answer", "use --limit",
               Reason::kLeaveOut},
 };
+
+constexpr ErrorText kIndexerAway = {Error::kSystemCallFailed, "the indexing daemon does not answer",
+                                    "start it with 'service pkg-Quivra-fileindexd start'",
+                                    Reason::kTell};
+
+/// The channel to the indexing daemon shares its code with system calls; its reasons are its own.
+bool IsIndexerAway(const Error& error) {
+    return error.code == Error::kSystemCallFailed &&
+           (StringStartWith(error.reason, "write failed, ") ||
+            StringStartWith(error.reason, "read failed, "));
+}
 
 const ErrorText* Find(int code) {
     const auto* const it =
@@ -94,7 +106,7 @@ const ErrorText* Find(int code) {
 }  // namespace
 
 std::string DescribeError(const std::string& doing, const Error& error) {
-    const ErrorText* text = Find(error.code);
+    const ErrorText* text = IsIndexerAway(error) ? &kIndexerAway : Find(error.code);
     std::string sentence = "cannot " + doing + ": ";
     if (text == nullptr) {
         sentence += error.reason.empty() ? "the search daemon refused it" : error.reason;

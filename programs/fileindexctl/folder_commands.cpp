@@ -7,10 +7,12 @@
 #include "common/error.h"
 #include "common/json.h"
 #include "common/util.h"
+#include "fileindex/elastic/elastic_control.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/index_mgr.h"
 #include "programs/fileindexctl/command_line.h"
 #include "programs/fileindexctl/folder_status.h"
+#include "programs/fileindexctl/output.h"
 #include "programs/fileindexctl/paths.h"
 #include "programs/fileindexctl/table.h"
 
@@ -70,21 +72,29 @@ int Report(Session& session, const Json::Value& folder, const std::string& sente
     return kSuccess;
 }
 
+/// A failure behind the save leaves a folder that nobody has been told of. Its content is queued
+/// here and now; the rest is what `folder set` does again.
+void SecureSavedFolder(const std::string& path, Session& session) {
+    fileindex::FolderReindex(ListOf(path));
+    session.doing = "finish adding " + path +
+                    " (it is saved and queued; 'fileindexctl folder set " + path +
+                    "' completes it)";
+}
+
 int Add(const Options& options, Session& session) {
     session.doing = "add " + options.path;
-    const Place place = FindPlace(options.path);
-    const std::string& path = place.share_path;
+    const std::string path = FindPlace(options.path).share_path;
     session.doing = "add " + path;
     Json::Value folder =
         fileindex::Folder(path, Basename(path), true, true, true, true, false).GetData();
     Apply(folder, options);
     const bool existed = fileindex::FolderMgr().HasFolder(path);
     try {
+        const Silence silence;
         fileindex::FolderAdd(ListOf(folder), false);
     } catch (const Error&) {
         if (!existed && fileindex::FolderMgr().HasFolder(path)) {
-            session.doing = "finish adding " + path + " (it is saved; 'fileindexctl folder set " +
-                            path + "' completes it)";
+            SecureSavedFolder(path, session);
         }
         throw;
     }
@@ -98,7 +108,12 @@ int Set(const Options& options, Session& session) {
     Json::Value folder;
     fileindex::FolderGet(folder, path);
     Apply(folder, options);
-    fileindex::FolderSet(ListOf(folder), false);
+    // There already, unless adding the folder was cut off; creating it again changes nothing.
+    fileindex::elastic::ShareIndexCreate(fileindex::Folder(folder).GetShare());
+    {
+        const Silence silence;
+        fileindex::FolderSet(ListOf(folder), false);
+    }
     return Report(session, folder, "Changed ");
 }
 
@@ -162,7 +177,10 @@ int Delete(const Options& options, Session& session) {
     session.doing = "delete " + path;
     Json::Value folder;
     fileindex::FolderGet(folder, path);
-    fileindex::FolderDelete(ListOf(path));
+    {
+        const Silence silence;
+        fileindex::FolderDelete(ListOf(path));
+    }
     return Report(session, folder, "No longer indexing ");
 }
 

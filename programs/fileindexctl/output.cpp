@@ -1,5 +1,8 @@
 #include "programs/fileindexctl/output.h"
 
+#include <fcntl.h>
+#include <unistd.h>
+
 #include <cerrno>
 
 #include "common/util.h"
@@ -31,6 +34,25 @@ int DescriptorBuffer::sync() {
     }
     setp(buffer_.data(), buffer_.data() + buffer_.size());
     return error_ == 0 ? 0 : -1;
+}
+
+Silence::Silence() {
+    const UniqueFd nowhere(open("/dev/null", O_WRONLY | O_CLOEXEC));
+    UniqueFd output(fcntl(STDOUT_FILENO, F_DUPFD_CLOEXEC, STDERR_FILENO + 1));
+    UniqueFd error(fcntl(STDERR_FILENO, F_DUPFD_CLOEXEC, STDERR_FILENO + 1));
+    if (nowhere.IsValid() && output.IsValid() && error.IsValid()) {
+        dup2(nowhere.Get(), STDOUT_FILENO);
+        dup2(nowhere.Get(), STDERR_FILENO);
+        output_ = std::move(output);
+        error_ = std::move(error);
+    }
+}
+
+Silence::~Silence() {
+    if (output_.IsValid()) {
+        dup2(output_.Get(), STDOUT_FILENO);
+        dup2(error_.Get(), STDERR_FILENO);
+    }
 }
 
 }  // namespace quivra::ctl

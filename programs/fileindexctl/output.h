@@ -3,6 +3,8 @@
 #include <array>
 #include <streambuf>
 
+#include "common/unique_fd.h"
+
 namespace quivra::ctl {
 
 /// A buffered stream to a descriptor that remembers why writing failed, which the standard streams
@@ -25,6 +27,20 @@ class DescriptorBuffer : public std::streambuf {
     int fd_;
     int error_ = 0;
     std::array<char, 16384> buffer_{};
+};
+
+/// While it lives, the process's standard output and error lead nowhere. The services and programs
+/// that the library runs inherit these two, and their chatter has no place among our own.
+class Silence {
+  public:
+    Silence();
+    ~Silence();
+    Silence(const Silence&) = delete;
+    Silence& operator=(const Silence&) = delete;
+
+  private:
+    UniqueFd output_;  ///< what the two were; invalid: nothing was changed
+    UniqueFd error_;
 };
 
 }  // namespace quivra::ctl

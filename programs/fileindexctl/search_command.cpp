@@ -150,7 +150,8 @@ Results Search(const std::vector<std::string>& shares, Json::Value request, cons
         try {
             fileindex::elastic::IndexQuery(reply, share, request);
         } catch (const Error& error) {
-            if (error.code == Error::kChannelFailed || single) {
+            if (error.code == Error::kChannelFailed ||
+                results.failures.size() + 1 == shares.size()) {
                 throw;
             }
             results.failures.push_back(DescribeError(session.doing, error));
@@ -182,7 +183,7 @@ std::string ShownHighlight(const std::string& text, const Session& session) {
         part.clear();
         line += session.out_is_terminal ? style : "";
     };
-    for (const char c : text) {
+    for (const char c : text.substr(0, text.find_last_not_of(" \t\r\n") + 1)) {
         if (c == kMarkBegin) {
             flush("\x1b[1m");
         } else if (c == kMarkEnd) {

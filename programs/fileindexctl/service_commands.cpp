@@ -4,10 +4,12 @@
 #include <memory>
 #include <ostream>
 
+#include "common/error.h"
 #include "common/json.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "programs/fileindexctl/command_line.h"
+#include "programs/fileindexctl/output.h"
 
 namespace quivra::ctl {
 namespace {
@@ -39,29 +41,43 @@ void PrintPause(Session& session, std::int64_t resume_time) {
     }
 }
 
+/// What is recorded holds even if the daemon could not be told.
+template <typename Change>
+int ChangePause(Session& session, Change change) {
+    fileindex::StatusMgr status;
+    try {
+        change(status);
+    } catch (const Error&) {
+        if (fileindex::StatusMgr().GetPauseInfo() == status.GetPauseInfo()) {
+            session.doing = "tell the indexing daemon to " + session.doing +
+                            " (it is recorded, and holds from the daemon's next start on)";
+        }
+        throw;
+    }
+    PrintPause(session, status.GetPauseInfo());
+    return kSuccess;
+}
+
 int Pause(int hours, Session& session) {
     if (hours < 0 || hours > LongestPause()) {
         throw WrongCall("a pause has 1 to " + std::to_string(LongestPause()) +
                         " hours; without HOURS it has no end");
     }
     session.doing = "pause indexing";
-    fileindex::StatusMgr status;
-    status.Pause(hours);
-    PrintPause(session, status.GetPauseInfo());
-    return kSuccess;
+    return ChangePause(session, [hours](fileindex::StatusMgr& status) { status.Pause(hours); });
 }
 
 int Resume(Session& session) {
     session.doing = "resume indexing";
-    fileindex::StatusMgr status;
-    status.Resume();
-    PrintPause(session, status.GetPauseInfo());
-    return kSuccess;
+    return ChangePause(session, [](fileindex::StatusMgr& status) { status.Resume(); });
 }
 
 int Prepare(Session& session) {
     session.doing = "prepare the services";
-    fileindex::PrepareServices();
+    {
+        const Silence silence;
+        fileindex::PrepareServices();
+    }
     if (session.json) {
         session.out << "{\"done\":\"prepare\"}\n";
     } else {

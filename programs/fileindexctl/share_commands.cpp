@@ -8,6 +8,7 @@
 #include "fileindex/folder_mgr.h"
 #include "fileindex/index_mgr.h"
 #include "programs/fileindexctl/command_line.h"
+#include "programs/fileindexctl/output.h"
 #include "programs/fileindexctl/paths.h"
 #include "programs/fileindexctl/shares.h"
 #include "programs/fileindexctl/table.h"
@@ -44,7 +45,10 @@ std::string LowerCase(std::string text) {
 
 int RunOperation(const Operation& operation, const Arguments& arguments, Session& session) {
     session.doing = std::string(operation.doing) + " " + arguments.first;
-    operation.call(arguments.first, arguments.second);
+    {
+        const Silence silence;
+        operation.call(arguments.first, arguments.second);
+    }
     if (session.json) {
         Json::Value result(Json::objectValue);
         result["done"] = operation.name;

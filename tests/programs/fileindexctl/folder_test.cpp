@@ -1,3 +1,5 @@
+#include <unistd.h>
+
 #include "tests/programs/fileindexctl/ctl_fixture.h"
 
 namespace quivra::ctl {
@@ -103,6 +105,11 @@ TEST_F(FolderTest, AFailureAfterTheSaveSaysHowToGoOn) {
     EXPECT_EQ(result.status, kFailure);
     EXPECT_NE(result.err.find("folder set /photo"), std::string::npos) << result.err;
     EXPECT_EQ(Folders().size(), 1U);
+    // Nothing is lost when nobody does: the folder's content waits in the queue.
+    EXPECT_EQ(Piped({"queue", "show", QueueOf("photo")}).out, "[06] /volume1/photo\nconsumed: 1\n");
+    EXPECT_EQ(Piped({"folder", "set", "/photo"}).status, kSuccess);
+    EXPECT_EQ(search_.Requests().back()["command"], "index_create");
+    EXPECT_EQ(fake::MonitorQueues().size(), 1U);
 }
 
 TEST_F(FolderTest, ListPagesAndSorts) {
@@ -160,6 +167,26 @@ TEST_F(FolderTest, SharesVolumesAndPauseReachTheLibrary) {
             }
         }
     }
+}
+
+TEST_F(FolderTest, APauseThatTheDaemonDidNotHearOfIsRecorded) {
+    std::filesystem::remove(kDaemonSocket);
+    const Result result = Piped({"pause"});
+    EXPECT_EQ(result.status, kFailure);
+    EXPECT_NE(result.err.find("it is recorded"), std::string::npos) << result.err;
+    EXPECT_EQ(ReadFile("/var/packages/Quivra/etc/fileindex.status"), R"({"resume_time":0})");
+}
+
+TEST_F(FolderTest, WhatServicesPrintDoesNotMixWithTheOutput) {
+    fake::OnCall([](const std::string&) {
+        EXPECT_EQ(write(STDOUT_FILENO, "chatter", 7), 7);
+        EXPECT_EQ(write(STDERR_FILENO, "chatter", 7), 7);
+    });
+    testing::internal::CaptureStdout();
+    testing::internal::CaptureStderr();
+    Piped({"services", "prepare"});
+    EXPECT_EQ(testing::internal::GetCapturedStderr(), "");
+    EXPECT_EQ(testing::internal::GetCapturedStdout(), "");
 }
 
 TEST_F(FolderTest, ShareListTellsHowEachStands) {

@@ -139,7 +139,9 @@ TEST_F(SearchTest, OneBrokenShareDoesNotHideTheOthers) {
     EXPECT_NE(both.err.find("[404]"), std::string::npos) << both.err;
     EXPECT_EQ(Piped({"search", "x", "--share", "a"}).status, kFailure);
     Break("b", 1401);
-    EXPECT_EQ(Piped({"search", "x"}).status, kFailure);
+    const Result none = Piped({"search", "x"});
+    EXPECT_EQ(none.status, kFailure);
+    EXPECT_EQ(none.err.find("Nothing found"), std::string::npos) << none.err;
     EXPECT_TRUE(fake::Sleeps().empty());
 }
 

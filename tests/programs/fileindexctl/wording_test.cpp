@@ -33,6 +33,9 @@ TEST_F(WordingTest, ErrorsAreOneSentence) {
         DescribeError("add /photo", Error(901, "Duplicated ID: /photo")),
         "cannot add /photo: it is already indexed; use 'fileindexctl folder set' to change it "
         "[901]");
+    const Error unreachable(502, "write failed, reason=Transport endpoint is not connected");
+    EXPECT_NE(DescribeError("pause indexing", unreachable).find("daemon does not answer"),
+              std::string::npos);
     EXPECT_NE(DescribeError("search share s", Error(4711, "Request failed, msg=odd"))
                   .find("Request failed, msg=odd"),
               std::string::npos);
