@@ -15,6 +15,9 @@
 namespace elasticd {
 namespace {
 
+/// Ends a word by the standard; some versions of ICU take it for a letter.
+constexpr char kSeparator = '@';
+
 bool IsAscii(std::string_view text) {
     return std::all_of(text.begin(), text.end(), [](char c) { return (c & '\x80') == 0; });
 }
@@ -180,7 +183,7 @@ class StandardTokenizer {
                  pos < end && (c == kLetter || c == kDigit || c == kUnderscore ||
                                (pos > start && JoinsNeighbours(stretch, pos)));
                  c = ClassAt(stretch, ++pos)) {
-                has_content |= c != kOther;
+                has_content |= c == kLetter || c == kDigit;
             }
             if (pos == start) {
                 ++pos;
@@ -197,7 +200,10 @@ class StandardTokenizer {
         for (std::size_t pos = begin; pos < end;) {
             const std::size_t start = pos;
             const bool cjk = IsCjk(NextCharacter(stretch, pos));
-            for (std::size_t next = pos; next < end; pos = next) {
+            if (stretch[start] == kSeparator) {
+                continue;
+            }
+            for (std::size_t next = pos; next < end && stretch[pos] != kSeparator; pos = next) {
                 const UChar32 c = NextCharacter(stretch, next);
                 const bool mark = c >= 0 && (U_GET_GC_MASK(c) & U_GC_M_MASK) != 0;
                 if (!mark && IsCjk(c) != cjk) {

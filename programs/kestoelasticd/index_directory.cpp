@@ -66,17 +66,23 @@ void RemoveTree(const std::string& path) {
     }
 }
 
-/// Copies a directory of plain files and directories, durably.
-void CopyTree(const std::string& from, const std::string& to) {
+void Copy(const std::string& from, const std::string& to) {
     std::error_code error;
-    fs::copy(from, to, fs::copy_options::recursive | fs::copy_options::copy_symlinks, error);
+    fs::copy(from, to, fs::copy_options::recursive | fs::copy_options::skip_existing, error);
     if (error) {
         errno = error.value();
         FailFile("cannot copy " + from + " to " + to);
     }
-    if (chmod(to.c_str(), 0700) != 0) {
-        FailFile("cannot change the mode of " + to);
+}
+
+/// Copies an index, durably. The marker comes first: half a copy is known for what it is.
+void CopyIndex(const std::string& from, const std::string& to) {
+    if (mkdir(to.c_str(), 0700) != 0) {
+        FailFile("cannot make " + to);
     }
+    Copy(from + kMarkerName, to + kMarkerName);
+    SyncPath(to + kMarkerName);
+    Copy(from, to);
     for (const fs::directory_entry& entry : fs::recursive_directory_iterator(to)) {
         SyncPath(entry.path().string());
     }
@@ -188,7 +194,7 @@ Moved MoveIndexDirectory(const std::string& from, const std::string& to, const s
     }
     const std::string aside = to + kCopySuffix;
     ClearPath(aside);
-    CopyTree(from, aside);
+    CopyIndex(from, aside);
     if (rename(aside.c_str(), to.c_str()) != 0) {
         FailFile("cannot rename " + aside);
     }

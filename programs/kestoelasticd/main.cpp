@@ -15,6 +15,10 @@ int main(int argc, char** argv) {
         ->transform(CLI::AsSizeValue(false))
         ->capture_default_str();
     app.add_flag("--verbose,-v", options.verbose, "Log to standard error as well");
-    CLI11_PARSE(app, argc, argv);
+    try {
+        app.parse(argc, argv);
+    } catch (const CLI::ParseError& error) {
+        return app.exit(error) == 0 ? 0 : 2;
+    }
     return elasticd::RunDaemon(options);
 }

@@ -1,0 +1,377 @@
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <filesystem>
+#include <memory>
+#include <thread>
+
+#include "common/json.h"
+#include "programs/kestoelasticd/codes.h"
+#include "programs/kestoelasticd/service.h"
+#include "programs/support/frame_server.h"
+#include "tests/programs/kestoelasticd/client.h"
+
+namespace elasticd {
+namespace {
+
+const std::string kState = "/var/lib/protocol_test";
+const std::string kDatabase = kState + "/s";
+const std::string kSocket = "/tmp/protocol_test.sock";
+
+/// Every case runs against the service itself and through a real socket.
+class ProtocolTest : public testing::TestWithParam<bool> {
+  protected:
+    void SetUp() override {
+        std::filesystem::remove_all(kState);
+        Start({});
+    }
+    void TearDown() override {
+        Stop();
+        std::filesystem::remove_all(kState);
+    }
+
+    void Start(ServiceOptions options) {
+        options.state_directory = kState;
+        service_ = std::make_unique<Service>(options);
+        if (GetParam()) {
+            support::FrameServerOptions server_options;
+            server_options.path = kSocket;
+            server_ = std::make_unique<support::FrameServer>(
+                server_options, [this](const std::string& text) { return service_->Handle(text); });
+            thread_ = std::thread([this] { server_->Run(); });
+        }
+    }
+    void Stop() {
+        if (server_) {
+            server_->Stop();
+            thread_.join();
+            server_.reset();
+        }
+        service_.reset();
+    }
+    void Restart(const ServiceOptions& options = {}) {
+        Stop();
+        Start(options);
+    }
+    void CreateIndex() { ASSERT_EQ(client.Create(kDatabase, TestMappings()), 0); }
+
+    Client client{[this](const std::string& request) {
+        return GetParam() ? SendToSocket(kSocket, request) : service_->Handle(request);
+    }};
+
+  private:
+    std::unique_ptr<Service> service_;
+    std::unique_ptr<support::FrameServer> server_;
+    std::thread thread_;
+};
+
+INSTANTIATE_TEST_SUITE_P(Transports, ProtocolTest, testing::Bool(), [](const auto& parameter) {
+    return parameter.param ? "Socket" : "InProcess";
+});
+
+TEST_P(ProtocolTest, BadRequestsGetStableCodes) {
+    CreateIndex();
+    const struct {
+        const char* request;
+        int code;
+    } cases[] = {
+        {"[]", kBadRequest},
+        {"{}", kBadRequest},
+        {R"({"command": "commit"})", kBadRequest},
+        {R"({"command": 5, "data": {"id": "fileindex_s"}})", kBadRequest},
+        {R"({"command": "commit", "data": {"id": 5}})", kBadRequest},
+        {R"({"command": "commit", "data": []})", kBadRequest},
+        {R"({"command": "nonsense", "data": {"id": "fileindex_s"}})", kUnknownCommand},
+        {R"({"command": "document_nonsense", "data": {"id": "fileindex_s"}})", kUnknownCommand},
+        {R"({"command": "commit", "data": {"id": "fileindex_x"}})", kNoSuchIndex},
+        {R"({"command": "document_upsert_by_id", "data": {"id": "fileindex_s"}})", kBadRequest},
+        {R"({"command": "document_upsert_by_id",
+             "data": {"id": "fileindex_s", "doc_id": "", "data": {}}})",
+         kBadRequest},
+        {R"({"command": "document_del_by_query", "data": {"id": "fileindex_s", "query": 1}})",
+         kBadRequest},
+        {R"({"command": "index_config_set", "data": {"id": "fileindex_s", "data": {"path": 7}}})",
+         kBadRequest},
+        {R"({"compound": {}})", kBadRequest},
+    };
+    for (const auto& test : cases) {
+        const Json::Value reply = client.Ask(ParseJson(test.request));
+        EXPECT_FALSE(reply["success"].asBool()) << test.request;
+        EXPECT_EQ(reply["error"]["code"].asInt(), test.code) << test.request;
+        EXPECT_TRUE(reply["error"]["msg"].isString());
+    }
+    EXPECT_EQ(client.Commit(), 0);
+}
+
+TEST_P(ProtocolTest, BadMappingsAndPathsAreRefused) {
+    const char* mappings[] = {
+        R"({})",
+        R"({"property_id": "a", "properties": []})",
+        R"({"property_id": "a"})",  // the default analyzer is no keyword
+        R"({"property_id": "a", "default": {"analyzer": "klingon"}})",
+        R"({"property_id": "a", "properties": {"a": {"analyzer": "keyword"}, "b": {"type": 1}}})",
+        R"({"property_id": "a", "properties": {"a": {"analyzer": "keyword"}, "b": {"boost": 2}}})",
+        R"({"property_id": "a", "properties": {"a": {"analyzer": "keyword"},
+                                               "b": {"required": "yes"}}})",
+        R"({"property_id": "a", "properties": {"a": {"analyzer": "keyword"},
+                                               "b": {"type": "int", "preprocess": ["ngram"]}}})",
+        R"({"property_id": "a", "properties": {"a": {"analyzer": "keyword"}, "_all": {}}})",
+    };
+    for (const char* mapping : mappings) {
+        EXPECT_EQ(client.Create(kDatabase, ParseJson(mapping)), kBadMapping) << mapping;
+    }
+    std::filesystem::create_directory(kState + "/taken");
+    std::filesystem::create_directory(kState + "/taken/precious");
+    std::filesystem::create_symlink(kState, kState + "/link");
+    for (const std::string path : {"relative", "/no/such/parent", "/var/../tmp/x", "/", "/tmp/"}) {
+        EXPECT_EQ(client.Create(path, TestMappings()), kPathRefused) << path;
+    }
+    EXPECT_EQ(client.Create(kState + "/taken", TestMappings()), kPathRefused);
+    EXPECT_EQ(client.Create(kState + "/link", TestMappings()), kPathRefused);
+    EXPECT_TRUE(std::filesystem::exists(kState + "/taken/precious"));
+    EXPECT_EQ(client.Commit(), kNoSuchIndex);
+}
+
+TEST_P(ProtocolTest, CreatingAndDeletingCanBeRepeated) {
+    CreateIndex();
+    EXPECT_EQ(client.Upsert("/a"), 0);
+    EXPECT_EQ(client.Commit(), 0);
+    CreateIndex();
+    EXPECT_EQ(client.All(), Ids{"/a"});
+    EXPECT_EQ(client.Create(kState + "/other", TestMappings()), kIndexExists);
+    Client second = client;
+    second.index = "fileindex_t";
+    EXPECT_EQ(second.Create(kDatabase, TestMappings()), kIndexExists);
+    EXPECT_EQ(second.Create(kDatabase + "/below", TestMappings()), kIndexExists);
+    EXPECT_EQ(client.Code("index_delete"), 0);
+    EXPECT_EQ(client.Code("index_delete"), 0);
+    EXPECT_FALSE(std::filesystem::exists(kDatabase));
+    CreateIndex();
+    EXPECT_EQ(client.All(), Ids{});
+    std::filesystem::remove_all(kDatabase);  // the share was emptied by hand
+    CreateIndex();
+    EXPECT_EQ(client.Upsert("/b"), 0);
+    EXPECT_EQ(client.Commit(), 0);
+}
+
+TEST_P(ProtocolTest, DocumentsFollowTheMapping) {
+    Json::Value mappings = TestMappings();
+    mappings["properties"]["kind"]["required"] = true;
+    ASSERT_EQ(client.Create(kDatabase, mappings), 0);
+    EXPECT_EQ(client.Upsert("/a", "{}"), kBadDocument);
+    EXPECT_EQ(client.Upsert("/a", R"({"kind": null})"), kBadDocument);
+    EXPECT_EQ(client.Upsert("/a", R"({"kind": "x", "size": "big"})"), kBadDocument);
+    EXPECT_EQ(client.Upsert("/a", R"({"kind": "x", "path": "/b"})"), kBadDocument);
+    EXPECT_EQ(client.Upsert("/a", R"({"kind": "x", "path": "/a", "deep": {"er": ["y", 1]}})"), 0);
+    EXPECT_EQ(client.Set("/a", R"({"kind": null})"), kBadDocument);
+    EXPECT_EQ(client.Set("/a", R"({"path": null})"), kBadDocument);
+    EXPECT_EQ(client.Set("/a", R"({"length": "long"})"), kBadDocument);
+    EXPECT_EQ(client.Commit(), 0) << "what is refused must not spoil the batch";
+    EXPECT_EQ(client.Ids(R"({"qsl": {"match": {"deep": "y 1"}}})"), Ids{"/a"});
+}
+
+TEST_P(ProtocolTest, BatchesAreSeenWhenCommitted) {
+    CreateIndex();
+    EXPECT_EQ(client.Upsert("/a"), 0);
+    EXPECT_EQ(client.All(), Ids{});
+    EXPECT_EQ(client.Commit(), 0);
+    EXPECT_EQ(client.Commit(), 0);
+    EXPECT_EQ(client.Upsert("/b"), 0);
+    EXPECT_EQ(client.Delete("/a"), 0);
+    EXPECT_EQ(client.Delete("/never"), 0);
+    EXPECT_EQ(client.All(), Ids{"/a"});
+    Restart();
+    EXPECT_EQ(client.All(), Ids{"/a"});
+    EXPECT_EQ(client.Commit(), 0);
+    EXPECT_EQ(client.All(), Ids{"/a"}) << "a batch does not survive the process";
+}
+
+TEST_P(ProtocolTest, SetChangesTheGivenMembersOnly) {
+    CreateIndex();
+    EXPECT_EQ(client.Set("/a", "{}"), kNoSuchDocument);
+    EXPECT_EQ(client.Upsert("/a", R"({"title": "one two two", "size": 5, "note": "two",
+                                      "KESTOMDTextContent": "body two"})"),
+              0);
+    EXPECT_EQ(client.Set("/a", R"({"title": "three", "size": 7})"), 0);
+    EXPECT_EQ(client.Commit(), 0);
+    const auto finds = [&](const std::string& qsl) {
+        return client.Ids("{\"qsl\": " + qsl + "}") == Ids{"/a"};
+    };
+    EXPECT_FALSE(finds(R"({"match": {"_all": "one"}})"));
+    EXPECT_TRUE(finds(R"({"match": {"_all": "three two"}})")) << "two is in other fields, still";
+    EXPECT_FALSE(finds(R"({"match": {"title": "two"}})"));
+    EXPECT_TRUE(finds(R"({"term": {"size": 7}})"));
+    EXPECT_EQ(client.Set("/a", R"({"note": null, "KESTOMDTextContent": "new body"})"), 0);
+    EXPECT_EQ(client.Set("/a", R"({"size": null})"), 0);
+    EXPECT_EQ(client.Commit(), 0);
+    EXPECT_FALSE(finds(R"({"match": {"_all": "two"}})"));
+    EXPECT_TRUE(finds(R"({"match": {"KESTOMDTextContent": "new"}})"));
+    EXPECT_FALSE(finds(R"({"range": {"size": {"gte": 0}}})"));
+    const Json::Value hit = client.Query(R"({"qsl": {"all": []}})")["data"][0];
+    EXPECT_EQ(quivra::toString(hit), R"({"path":"/a","title":"three"})");
+}
+
+/// The order of requests that a rename of a folder makes, with the members that were left over.
+TEST_P(ProtocolTest, ARenameMovesEveryDocumentAndKeepsItsText) {
+    CreateIndex();
+    client.Upsert("/v/old", R"({"name": "old"})");
+    client.Upsert("/v/old/x.txt", R"({"name": "x.txt", "KESTOMDTextContent": "some words"})");
+    client.Upsert("/v/old/sub/y.txt", R"({"name": "y.txt"})");
+    client.Upsert("/v/older", R"({"name": "older"})");
+    client.Upsert("/v/new/x.txt", R"({"name": "x.txt", "KESTOMDTextContent": "overwritten"})");
+    ASSERT_EQ(client.Commit(), 0);
+    ASSERT_EQ(client.Set("/v/old", R"({"path": "/v/new", "name": "new"})"), 0);
+    Json::Value compound;
+    compound["compound"] = Json::arrayValue;
+    for (const std::string name : {"x.txt", "sub/y.txt", "gone.txt"}) {
+        Json::Value element;
+        element["command"] = "document_set_by_id";
+        element["data"]["id"] = client.index;
+        element["data"]["doc_id"] = "/v/old/" + name;
+        element["data"]["data"]["path"] = "/v/new/" + name;
+        element["data"]["query"]["qsl"]["prefix"]["path"] = "/v/old/";
+        compound["compound"].append(element);
+    }
+    compound["compound"].append("nonsense");
+    compound["compound"].append(
+        ParseJson(R"({"command": "commit", "data": {"id": "fileindex_s"}})"));
+    const Json::Value reply = client.Ask(compound);
+    EXPECT_TRUE(reply["success"].asBool());
+    EXPECT_TRUE(reply["has_fail"].asBool());
+    ASSERT_EQ(reply["data"].size(), 5U);
+    EXPECT_TRUE(reply["data"][1]["success"].asBool());
+    EXPECT_EQ(reply["data"][2]["error"]["code"].asInt(), kNoSuchDocument);
+    EXPECT_EQ(reply["data"][3]["error"]["code"].asInt(), kBadRequest);
+    EXPECT_EQ(reply["data"][4]["error"]["code"].asInt(), kUnknownCommand);
+    ASSERT_EQ(client.Commit(), 0);
+    EXPECT_EQ(client.All(), (Ids{"/v/new", "/v/new/sub/y.txt", "/v/new/x.txt", "/v/older"}));
+    EXPECT_EQ(client.Ids(R"({"qsl": {"prefix": {"path": "/v/old/"}}})"), Ids{});
+    EXPECT_EQ(client.Ids(R"({"qsl": {"match": {"_all": "words"}}})"), Ids{"/v/new/x.txt"});
+    EXPECT_EQ(client.Ids(R"({"qsl": {"match": {"_all": "overwritten"}}})"), Ids{});
+    const Json::Value hit = client.Query(R"({"qsl": {"term": {"path": "/v/new/x.txt"}},
+                                             "fields": ["KESTOMDTextContent"]})")["data"][0];
+    EXPECT_EQ(hit["KESTOMDTextContent"].asString(), "some words");
+}
+
+TEST_P(ProtocolTest, DeletingByQueryCountsTheBatchIn) {
+    CreateIndex();
+    client.Upsert("/v/a");
+    client.Upsert("/v/a/1", R"({"KESTOMDTextContent": "text"})");
+    client.Upsert("/v/ab");
+    ASSERT_EQ(client.Commit(), 0);
+    client.Upsert("/v/a/2");
+    const Json::Value data = ParseJson(R"({"query": {"qsl": {"prefix": {"path": "/v/a/"}}}})");
+    EXPECT_EQ(client.Code("document_del_by_query", data), 0);
+    EXPECT_EQ(client.Code("document_del_by_query", data), 0);
+    ASSERT_EQ(client.Commit(), 0);
+    EXPECT_EQ(client.All(), (Ids{"/v/a", "/v/ab"}));
+    client.Upsert("/v/a/1");
+    ASSERT_EQ(client.Commit(), 0);
+    EXPECT_EQ(client.Ids(R"({"qsl": {"match": {"_all": "text"}}})"), Ids{});
+}
+
+TEST_P(ProtocolTest, APausedIndexAnswersButDoesNotChange) {
+    CreateIndex();
+    client.Upsert("/a");
+    ASSERT_EQ(client.Commit(), 0);
+    client.Upsert("/b");
+    for (int i = 0; i < 2; ++i) {
+        EXPECT_EQ(client.Code("index_pause"), 0);
+        EXPECT_EQ(client.Upsert("/c"), kPaused);
+        EXPECT_EQ(client.Commit(), kPaused);
+        EXPECT_EQ(client.All(), Ids{"/a"});
+        Restart();  // pausing is remembered
+    }
+    EXPECT_EQ(client.Code("index_resume"), 0);
+    EXPECT_EQ(client.Code("index_resume"), 0);
+    EXPECT_EQ(client.Commit(), 0);
+    EXPECT_EQ(client.All(), Ids{"/a"}) << "the batch was dropped";
+    EXPECT_EQ(client.Upsert("/d"), 0);
+}
+
+TEST_P(ProtocolTest, ShortMemoryAndFullDisksAreTold) {
+    CreateIndex();
+    client.Upsert("/a");
+    ASSERT_EQ(client.Commit(), 0);
+    ServiceOptions options;
+    options.min_free_space = UINT64_MAX;
+    Restart(options);
+    EXPECT_EQ(client.Upsert("/b"), kNoSpace);
+    EXPECT_EQ(client.Set("/a", "{}"), kNoSpace);
+    EXPECT_EQ(client.Delete("/a"), 0) << "what frees space is allowed";
+    EXPECT_EQ(client.Commit(), 0);
+    options.min_memory = UINT64_MAX;
+    Restart(options);
+    EXPECT_EQ(client.Commit(), kOutOfMemory);
+}
+
+TEST_P(ProtocolTest, ALostBatchFailsTheNextCommitOnly) {
+    CreateIndex();
+    client.Upsert("/a");
+    ASSERT_EQ(client.Commit(), 0);
+    client.Upsert("/b");
+    // The engine fails to write its files aside: the directory is gone from under it.
+    std::filesystem::rename(kDatabase + "/glass", kDatabase + "/away");
+    EXPECT_NE(client.Commit(), 0);
+    EXPECT_EQ(client.Upsert("/c"), kIndexUnavailable);
+    std::filesystem::rename(kDatabase + "/away", kDatabase + "/glass");
+    EXPECT_EQ(client.Upsert("/d"), 0);
+    EXPECT_EQ(client.Commit(), kBatchLost);
+    EXPECT_EQ(client.All(), Ids{"/a"});
+    EXPECT_EQ(client.Upsert("/e"), 0);
+    EXPECT_EQ(client.Commit(), 0);
+    EXPECT_EQ(client.All(), (Ids{"/a", "/e"}));
+}
+
+TEST_P(ProtocolTest, PathsOfEveryKindAreDocuments) {
+    CreateIndex();
+    std::string longest;
+    while (longest.size() < 4096) {
+        longest += "/\xc3\xa4" + std::string(longest.size() % 2 == 0 ? 1 : 250, 'x');
+    }
+    std::string deepest;
+    for (int i = 0; i < 2000; ++i) {
+        deepest += "/d";
+    }
+    Ids ids{longest.substr(0, 4096),  deepest,    "/raw\xff\xfe/\x80",
+            "/\"quoted\"\n\\",        "no slash", "//",
+            std::string("/nul\0l", 6)};
+    for (const std::string& id : ids) {
+        EXPECT_EQ(client.Upsert(id, R"({"name": "x"})"), 0);
+    }
+    ASSERT_EQ(client.Commit(), 0);
+    std::sort(ids.begin(), ids.end());
+    EXPECT_EQ(client.All(), ids);
+    EXPECT_EQ(client.Ids("{\"qsl\": {\"prefix\": {\"path\": \"/raw\xff\xfe/\"}}}"),
+              Ids{"/raw\xff\xfe/\x80"});
+    for (const std::string& id : ids) {
+        EXPECT_EQ(client.Delete(id), 0);
+    }
+    ASSERT_EQ(client.Commit(), 0);
+    EXPECT_EQ(client.All(), Ids{});
+}
+
+TEST_P(ProtocolTest, ManyClientsReadWhileOneWrites) {
+    CreateIndex();
+    std::atomic<bool> done = false;
+    std::vector<std::jthread> readers;
+    for (int i = 0; i < 3; ++i) {
+        readers.emplace_back([&] {
+            while (!done) {
+                // A query sees whole batches: pairs of documents.
+                EXPECT_EQ(
+                    client.Query(R"({"qsl": {"match": {"_all": "pair"}}})")["total"].asInt() % 2,
+                    0);
+            }
+        });
+    }
+    for (int i = 0; i < 40; ++i) {
+        client.Upsert("/a" + std::to_string(i), R"({"title": "pair"})");
+        client.Upsert("/b" + std::to_string(i), R"({"title": "pair"})");
+        EXPECT_EQ(client.Commit(), 0);
+    }
+    done = true;
+}
+
+}  // namespace
+}  // namespace elasticd

@@ -1,0 +1,109 @@
+#include "programs/kestoelasticd/terms.h"
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <limits>
+#include <set>
+
+#include "common/error.h"
+#include "programs/kestoelasticd/record.h"
+#include "tests/programs/kestoelasticd/client.h"
+
+namespace elasticd {
+namespace {
+
+TEST(Terms, EncodedNumbersCompareAsTheNumbersDo) {
+    using Limits = std::numeric_limits<std::int64_t>;
+    const std::int64_t ordered[] = {
+        Limits::min(), -(1LL << 53) - 1, -(1LL << 53),    -256,         -1, 0, 1, 255,
+        256,           1LL << 53,        (1LL << 53) + 1, Limits::max()};
+    for (std::size_t i = 1; i < std::size(ordered); ++i) {
+        EXPECT_LT(EncodeInt(ordered[i - 1]), EncodeInt(ordered[i])) << ordered[i];
+    }
+}
+
+TEST(Terms, NumbersAreTakenAsFarAsTheyFit) {
+    const struct {
+        FieldType type;
+        const char* json;
+        bool fits;
+    } cases[] = {
+        {FieldType::kInt, "5", true},
+        {FieldType::kInt, "\"-5\"", true},
+        {FieldType::kInt, "5.0", true},
+        {FieldType::kInt, "5.5", false},
+        {FieldType::kInt, "true", true},
+        {FieldType::kInt, "\"5x\"", false},
+        {FieldType::kInt, "\"\"", false},
+        {FieldType::kInt, "9223372036854775807", true},
+        {FieldType::kInt, "9223372036854775808", false},
+        {FieldType::kInt, "[5]", false},
+        {FieldType::kInt, "{}", false},
+        {FieldType::kDouble, "5", true},
+        {FieldType::kDouble, "\"1e3\"", true},
+        {FieldType::kDouble, "\"nan\"", false},
+        {FieldType::kDouble, "\"1e999\"", false},
+        {FieldType::kBool, "true", true},
+        {FieldType::kBool, "1", true},
+        {FieldType::kBool, "2", false},
+        {FieldType::kBool, "\"false\"", true},
+        {FieldType::kBool, "\"yes\"", false},
+    };
+    for (const auto& test : cases) {
+        EXPECT_EQ(EncodeNumber(test.type, ParseJson(test.json)).has_value(), test.fits)
+            << test.json;
+    }
+}
+
+TEST(Terms, NoFieldsPrefixBeginsAnother) {
+    std::set<std::string> prefixes;
+    for (unsigned int number = 0; number < FieldTable::kMaxFields; ++number) {
+        const std::string prefix = FieldPrefix(number);
+        EXPECT_EQ(prefix.find('\0'), std::string::npos);
+        EXPECT_TRUE(prefixes.insert(prefix).second) << number;
+        EXPECT_FALSE(prefix.size() == 3 && prefixes.contains(prefix.substr(0, 2))) << number;
+    }
+}
+
+TEST(Terms, LongTermsAreCutAndStayDifferent) {
+    const std::string base(kMaxTermSize, 'x');
+    EXPECT_EQ(FitTerm(base), base);
+    for (const std::string& tail : {std::string("1"), std::string("2"), std::string(99, '\0')}) {
+        const std::string term = FitTerm(base + tail);
+        const auto zeros = std::count(term.begin(), term.end(), '\0');
+        EXPECT_LE(term.size() + static_cast<std::size_t>(zeros), kMaxTermSize);
+        EXPECT_TRUE(term.starts_with(base.substr(0, kKeptOfTerm)));
+    }
+    EXPECT_NE(FitTerm(base + "1"), FitTerm(base + "2"));
+    EXPECT_LE(FitTerm(std::string(200, '\0')).size(), kMaxTermSize);
+}
+
+TEST(Record, DamagedRecordsAndTextsEndEarly) {
+    const Record record{{1, "\"a\""}, {300, std::string(500, 'x')}};
+    const std::string encoded = EncodeRecord(record);
+    EXPECT_EQ(DecodeRecord(encoded), record);
+    for (std::size_t size = 0; size < encoded.size(); ++size) {
+        EXPECT_LT(DecodeRecord(encoded.substr(0, size)).size(), 2U);
+    }
+    const std::string packed = PackText("some text");
+    EXPECT_EQ(UnpackText(packed), "some text");
+    for (std::size_t size = 0; size < packed.size(); ++size) {
+        EXPECT_EQ(UnpackText(packed.substr(0, size)), "") << size;
+    }
+}
+
+TEST(FieldTable, KeepsNumbersAndRefusesTooManyFields) {
+    FieldTable table;
+    for (std::size_t i = 0; i < FieldTable::kMaxFields; ++i) {
+        EXPECT_EQ(table.FindOrAdd("field" + std::to_string(i)), i);
+    }
+    EXPECT_THROW(table.FindOrAdd("one more"), quivra::Error);
+    FieldTable loaded;
+    loaded.Load(table.Save());
+    EXPECT_EQ(loaded.Find("field77"), 77U);
+    EXPECT_THROW(loaded.Load("{"), quivra::Error);
+}
+
+}  // namespace
+}  // namespace elasticd
