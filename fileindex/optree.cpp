@@ -1,6 +1,7 @@
 #include "fileindex/optree.h"
 
 #include <algorithm>
+#include <iterator>
 #include <string_view>
 #include <utility>
 
@@ -11,6 +12,9 @@
 
 namespace quivra::fileindex {
 namespace {
+
+/// How many directories a tree remembers, so that their paths take no noteworthy memory.
+constexpr std::size_t kMaxRemembered = 4096;
 
 using NodePtr = std::shared_ptr<OPNode>;
 using OPPtr = std::shared_ptr<OP>;
@@ -48,7 +52,7 @@ FileIndexOP TakeOverWork(const OPNode& old_node) {
 }  // namespace
 
 OPTree::OPTree(Empty, const std::string& path)
-    : queue_path(path), root(std::make_shared<OPNode>(nullptr, "")), last_directory_(root) {}
+    : queue_path(path), root(std::make_shared<OPNode>(nullptr, "")) {}
 
 // The delegation makes the destructor run, and break the cycles, when building throws.
 OPTree::OPTree(const std::string& path) : OPTree(Empty(), path) {
@@ -56,7 +60,12 @@ OPTree::OPTree(const std::string& path) : OPTree(Empty(), path) {
 }
 
 OPTree::~OPTree() {
-    for (const NodePtr& node : Subtree(root)) {
+    ops.clear();
+    std::vector<NodePtr> pending{std::move(root)};
+    while (!pending.empty()) {
+        const NodePtr node = std::move(pending.back());
+        pending.pop_back();
+        std::move(node->children.begin(), node->children.end(), std::back_inserter(pending));
         node->children.clear();
         node->ops.clear();
     }
@@ -82,9 +91,10 @@ void OPTree::BuildTree() {
 NodePtr OPTree::GetNodeByPath(const std::string& path) {
     const std::string_view whole = path;
     const std::size_t slash = whole.rfind('/');
-    if (slash != std::string_view::npos && slash + 1 < whole.size() &&
-        whole.substr(0, slash) == last_directory_path_) {
-        return last_directory_->GetChild(whole.substr(slash + 1));
+    if (slash != std::string_view::npos && slash + 1 < whole.size()) {
+        if (const NodePtr* directory = FindDirectory(whole.substr(0, slash))) {
+            return (*directory)->GetChild(whole.substr(slash + 1));
+        }
     }
     NodePtr directory;
     NodePtr node = root;
@@ -98,9 +108,26 @@ NodePtr OPTree::GetNodeByPath(const std::string& path) {
     if (!IsCanonical(path)) {
         throw Error(Error::kPathLookupFailed, "GetNodeByPath failed, path=" + path);
     }
-    last_directory_ = std::move(directory);
-    last_directory_path_ = whole.substr(0, slash);
+    RememberDirectory(whole.substr(0, slash), std::move(directory));
     return node;
+}
+
+const NodePtr* OPTree::FindDirectory(std::string_view path) {
+    if (last_directory_ == nullptr || last_directory_->first != path) {
+        const auto found = directories_.find(path);
+        if (found == directories_.end()) {
+            return nullptr;
+        }
+        last_directory_ = &*found;
+    }
+    return &last_directory_->second;
+}
+
+void OPTree::RememberDirectory(std::string_view path, NodePtr node) {
+    if (directories_.size() == kMaxRemembered) {
+        directories_.clear();
+    }
+    last_directory_ = &*directories_.emplace(path, std::move(node)).first;
 }
 
 void OPTree::InsertEvent(const std::shared_ptr<Event>& event) {

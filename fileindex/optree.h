@@ -4,6 +4,9 @@
 #include <functional>
 #include <memory>
 #include <string>
+#include <string_view>
+#include <unordered_map>
+#include <utility>
 #include <vector>
 
 #include "common/export.h"
@@ -84,9 +87,15 @@ class QUIVRA_EXPORT OPTree {
 
   private:
     struct Empty {};
+    struct PathHash : std::hash<std::string_view> {
+        using is_transparent = void;
+    };
     OPTree(Empty, const std::string& queue_path);
 
     void Insert(const Event& event);
+    /// The node of a directory that was looked up lately, else null.
+    const std::shared_ptr<OPNode>* FindDirectory(std::string_view path);
+    void RememberDirectory(std::string_view path, std::shared_ptr<OPNode> node);
     /// The op of the last event once more, when no list took it: most events of a busy file add
     /// none.
     std::shared_ptr<OP> NewOP(const std::shared_ptr<OPNode>& node);
@@ -104,9 +113,10 @@ class QUIVRA_EXPORT OPTree {
 
     std::size_t consumed_ = 0;
     std::shared_ptr<OP> unused_op_;
-    /// Queues name many files of one directory in a row: where the last look-up ended.
-    std::shared_ptr<OPNode> last_directory_;
-    std::string last_directory_path_;
+    /// Directories that were looked up lately: queues name many files of few of them.
+    std::unordered_map<std::string, std::shared_ptr<OPNode>, PathHash, std::equal_to<>>
+        directories_;
+    const std::pair<const std::string, std::shared_ptr<OPNode>>* last_directory_ = nullptr;
 };
 
 }  // namespace quivra::fileindex
