@@ -149,7 +149,7 @@ void Catalog::MakeFiles(const IndexEntry& entry) const {
     MakeIndexDirectory(entry.path, entry.uuid);
     try {
         IndexWriter::Create(DatabasePath(entry.path), mapping);
-    } catch (const Error&) {
+    } catch (...) {
         RemoveIndexDirectory(entry.path, entry.uuid);
         throw;
     }
@@ -177,7 +177,7 @@ void Catalog::Create(const std::string& id, const std::string& path, const Json:
         lock.lock();
         registry_.entries.at(id).deleting = false;
         registry_.Save();
-    } catch (const Error&) {
+    } catch (...) {
         RemoveIndexDirectory(entry.path, entry.uuid);
         if (!lock.owns_lock()) {
             lock.lock();
@@ -219,7 +219,7 @@ void Catalog::Delete(const std::string& id) {
             quivra::LogError({"catalog", __LINE__}, "%s is no index: left", entry.path.c_str());
         }
         lock.lock();
-    } catch (const Error&) {
+    } catch (...) {
         if (!lock.owns_lock()) {
             lock.lock();
         }
@@ -241,7 +241,7 @@ void Catalog::SetPaused(const std::string& id, bool paused) {
         entry.paused = paused;
         try {
             registry_.Save();
-        } catch (const Error&) {
+        } catch (...) {
             entry.paused = !paused;
             throw;
         }
@@ -299,7 +299,7 @@ void Catalog::Move(std::unique_lock<std::mutex>& lock, const std::string& id,
         lock.lock();
         Switch(id, copied ? old_path : std::string());
         lock.unlock();
-    } catch (const Error&) {
+    } catch (...) {
         if (lock.owns_lock()) {
             lock.unlock();
         }
@@ -358,7 +358,7 @@ void Catalog::Rename(const std::string& id, const std::string& new_id) {
     Rekey(registry_.entries.find(id), new_id);
     try {
         registry_.Save();
-    } catch (const Error&) {
+    } catch (...) {
         Rekey(registry_.entries.find(new_id), id);
         throw;
     }

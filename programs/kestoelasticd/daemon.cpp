@@ -1,5 +1,6 @@
 #include "programs/kestoelasticd/daemon.h"
 
+#include <sys/resource.h>
 #include <syslog.h>
 
 #include <csignal>
@@ -25,10 +26,20 @@ void HandleSignals(support::FrameServer& server) {
     std::signal(SIGPIPE, SIG_IGN);
 }
 
+/// An index in use takes some thirty descriptors; shares may be many.
+void RaiseDescriptorLimit() {
+    rlimit limit{};
+    if (getrlimit(RLIMIT_NOFILE, &limit) == 0) {
+        limit.rlim_cur = limit.rlim_max;
+        setrlimit(RLIMIT_NOFILE, &limit);
+    }
+}
+
 }  // namespace
 
 int RunDaemon(const DaemonOptions& options) {
     openlog("kestoelasticd", LOG_PID | (options.verbose ? LOG_PERROR : 0), LOG_DAEMON);
+    RaiseDescriptorLimit();
     try {
         Service service(options.service);
         support::FrameServerOptions server_options;
