@@ -17,10 +17,9 @@ thread_local ErrorState last_error;
 
 }  // namespace
 
-int SetError(int code, std::source_location where) {
-    const char* slash = std::strrchr(where.file_name(), '/');
-    last_error = {code, slash == nullptr ? where.file_name() : slash + 1,
-                  static_cast<int>(where.line())};
+int SetError(int code, const char* file, int line) {
+    const char* slash = std::strrchr(file, '/');
+    last_error = {code, slash == nullptr ? file : slash + 1, line};
     return -1;
 }
 

@@ -1,13 +1,12 @@
 #pragma once
 
 #include <cerrno>
-#include <source_location>
 
 namespace kesto {
 
 /// Records the failure that <kesto/error.h> reports for this thread, with the caller's place, and
 /// answers -1, so that a failing call reads `return SetError(code)`. Leaves errno alone.
-int SetError(int code, std::source_location where = std::source_location::current());
+int SetError(int code, const char* file = __builtin_FILE(), int line = __builtin_LINE());
 
 /// Gives errno its old value back at the end of a scope: a call that succeeds must not leave the
 /// errno of a try that did not matter, which would turn up in the caller's next log line.

@@ -25,13 +25,16 @@ std::uint64_t Hash(const std::string& text) {
 
 /// One file name per application and queue: readable where it fits, with a hash where it does not.
 std::string FilePath(const std::string& queue_path, const std::string& app) {
+    const std::string name = app + ":" + queue_path;
     std::string stem;
-    for (const char c : app + ":" + queue_path) {
-        const bool is_plain =
-            std::string_view("/%\n").find(c) == std::string_view::npos && c != '\0';
-        std::array<char, 4> code{};
-        std::snprintf(code.data(), code.size(), "%%%02X", static_cast<unsigned char>(c));
-        stem += is_plain ? std::string(1, c) : code.data();
+    for (const char c : name) {
+        if (c != '/' && c != '%' && c != '\n' && c != '\0') {
+            stem += c;
+        } else {
+            std::array<char, 4> code{};
+            std::snprintf(code.data(), code.size(), "%%%02X", static_cast<unsigned char>(c));
+            stem += code.data();
+        }
     }
     if (stem.size() > kMaxStem) {
         std::array<char, 18> hash{};

@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <kesto/error.h>
+#include <spawn.h>
 #include <sys/mman.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
@@ -59,8 +60,8 @@ bool WaitFor(pid_t pid, int& status) {
 }
 
 /// The supervisor's life: starts the program, waits for it and notes how it ended. `output` becomes
-/// the standard output; -1 keeps the caller's. Only calls that are safe after a fork from among
-/// several threads.
+/// the standard output; -1 keeps the caller's. It calls nothing that
+/// another thread of the caller could have left locked.
 [[noreturn]] void Supervise(const char* program, char* const* argv, int output,
                             const SharedResult& result) {
     struct sigaction action {};
@@ -76,14 +77,9 @@ bool WaitFor(pid_t pid, int& status) {
     sigset_t none;
     sigemptyset(&none);
     sigprocmask(SIG_SETMASK, &none, nullptr);
-    const pid_t pid = vfork();
-    if (pid == 0) {
-        execv(program, argv);
-        result->error = errno;
-        _exit(127);
-    }
-    if (pid < 0) {
-        result->error = errno;
+    pid_t pid = -1;
+    result->error = posix_spawn(&pid, program, nullptr, nullptr, argv, environ);
+    if (result->error != 0) {
         _exit(1);
     }
     int status = 0;

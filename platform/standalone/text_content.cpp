@@ -9,6 +9,7 @@
 #include <array>
 #include <cerrno>
 #include <chrono>
+#include <cstdint>
 #include <optional>
 #include <thread>
 
@@ -92,7 +93,7 @@ std::optional<std::string> RepairUtf8(std::string_view raw) {
 /// Converts with iconv; units that have no meaning in the encoding are replaced.
 std::string Convert(const char* encoding, std::size_t unit, std::string_view raw) {
     const iconv_t converter = iconv_open("UTF-8", encoding);
-    if (converter == reinterpret_cast<iconv_t>(-1)) {
+    if (reinterpret_cast<std::intptr_t>(converter) == -1) {
         return {};
     }
     std::string text;

@@ -1,10 +1,14 @@
 #include <syslog.h>
 
 #include <CLI/CLI.hpp>
+#include <cstdio>
+#include <exception>
 
 #include "programs/kestokosnotify/notice.h"
 
-int main(int argc, char** argv) {
+namespace {
+
+int Run(int argc, char** argv) {
     notify::Notice notice;
     bool shows_on_desktop = true;
     bool sends_mail = false;
@@ -29,4 +33,15 @@ int main(int argc, char** argv) {
     openlog("kestokosnotify", LOG_PID, LOG_DAEMON);
     notify::Send(notice);
     return 0;
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+    try {
+        return Run(argc, argv);
+    } catch (const std::exception& error) {
+        std::fprintf(stderr, "kestokosnotify: %s\n", error.what());
+        return 1;
+    }
 }

@@ -142,7 +142,7 @@ int KESTOShareGet(const char* name, KESTOShare** share) {
 }
 
 void KESTOShareFree(KESTOShare* share) {
-    Begin("KESTOShareFree", share);
+    Begin("KESTOShareFree", std::string(share == nullptr ? "null" : share->szName));
     delete share;
 }
 

@@ -74,7 +74,7 @@ inline std::string Text(const std::string& text) {
     return text;
 }
 inline std::string Text(const KESTOShare* share) {
-    return share == nullptr ? "null" : share->szName;
+    return share->szName;
 }
 inline std::string Text(unsigned long long number) {
     return std::to_string(number);

@@ -68,7 +68,7 @@ std::string InChild(const std::function<std::string()>& body) {
     return WIFSIGNALED(status) ? "signal " + std::to_string(WTERMSIG(status)) : result;
 }
 
-void DropCapability(unsigned int capability) {
+void DropCapability(int capability) {
     __user_cap_header_struct header{_LINUX_CAPABILITY_VERSION_3, 0};
     __user_cap_data_struct data[2];
     syscall(SYS_capget, &header, data);
@@ -120,7 +120,7 @@ TEST_F(RealCredentialsTest, FailuresLeaveTheIdentityWhole) {
                          std::to_string(KLIBCErrGet() == KESTO_ERR_NO_SUCH_USER) + " " + Identity();
               }),
               "0 1 0:0:0,7,");
-    for (const unsigned int capability : {CAP_SETGID, CAP_SETUID}) {
+    for (const int capability : {CAP_SETGID, CAP_SETUID}) {
         EXPECT_EQ(InChild([&] {
                       DropCapability(capability);
                       const bool switched = ResetCredentialsByName("alice", true);
