@@ -1,14 +1,12 @@
-#include <algorithm>
-#include <limits>
+#include <array>
 #include <memory>
 #include <ostream>
 #include <vector>
 
 #include "common/json.h"
 #include "common/util.h"
-#include "fileindex/elastic/elastic_control.h"
 #include "programs/fileindexctl/command_line.h"
-#include "programs/fileindexctl/error_text.h"
+#include "programs/fileindexctl/search.h"
 #include "programs/fileindexctl/search_query.h"
 #include "programs/fileindexctl/shares.h"
 #include "programs/fileindexctl/text.h"
@@ -17,7 +15,6 @@ namespace quivra::ctl {
 namespace {
 
 constexpr unsigned int kDefaultLimit = 20;
-constexpr unsigned int kNoLimit = std::numeric_limits<unsigned int>::max();
 /// Marks around the words found. File contents hardly ever hold these characters, and where they
 /// do, a wrong word is bold.
 constexpr char kMarkBegin = '\x02';
@@ -30,22 +27,10 @@ constexpr std::array kHighlightFields = {"KESTOMDTextContent", "KESTOMDTitle",
 struct Options {
     std::string share;
     std::string sort;
-    unsigned int limit = kDefaultLimit;
-    unsigned int offset = 0;
+    Page page{.offset = 0, .limit = kDefaultLimit};
     bool limit_given = false;
     bool paths = false;
     bool null = false;
-};
-
-struct SortOrder {
-    std::string field;  ///< empty: by relevance
-    bool descending = false;
-};
-
-struct Results {
-    std::vector<Json::Value> hits;
-    Json::UInt64 total = 0;
-    std::vector<std::string> failures;  ///< a sentence for each share that was not searched
 };
 
 SortOrder ParseSort(const std::string& sort) {
@@ -90,90 +75,6 @@ Json::Value MakeRequest(const Json::Value& qsl, const Options& options, const So
     return request;
 }
 
-/// Whether `a` comes before `b`. Hits without the field come last, whatever the direction.
-bool ComesBefore(const Json::Value& a, const Json::Value& b, const SortOrder& order) {
-    const Json::Value& x = a[order.field];
-    const Json::Value& y = b[order.field];
-    if (x.isNull() || y.isNull()) {
-        return !x.isNull() && y.isNull();
-    }
-    const Json::Value& smaller = order.descending ? y : x;
-    const Json::Value& larger = order.descending ? x : y;
-    if (x.isNumeric() && y.isNumeric()) {
-        return smaller.asDouble() < larger.asDouble();
-    }
-    return isJsonType<std::string>(x) && isJsonType<std::string>(y) &&
-           smaller.asString() < larger.asString();
-}
-
-/// One list from the lists of the shares. Relevance is no number that could be compared between
-/// indexes, so the best of each share come first, then the second best.
-std::vector<Json::Value> Merge(std::vector<Json::Value>& lists, const SortOrder& order) {
-    std::vector<Json::Value> merged;
-    std::vector<Json::ArrayIndex> next(lists.size(), 0);
-    while (true) {
-        std::size_t best = lists.size();
-        for (std::size_t i = 0; i < lists.size(); ++i) {
-            if (next[i] == lists[i].size()) {
-                continue;
-            }
-            const bool better = best == lists.size() ||
-                                (order.field.empty() ? next[i] < next[best]
-                                                     : ComesBefore(lists[i][next[i]],
-                                                                   lists[best][next[best]], order));
-            best = better ? i : best;
-        }
-        if (best == lists.size()) {
-            return merged;
-        }
-        merged.push_back(std::move(lists[best][next[best]++]));
-    }
-}
-
-/// Searches each share. A share whose index is not there (yet) or fails does not hide what the
-/// others hold; a daemon that is away fails the search.
-Results Search(const std::vector<std::string>& shares, Json::Value request, const Options& options,
-               const SortOrder& order, Session& session) {
-    const bool single = shares.size() == 1;
-    const Json::UInt64 wanted = static_cast<Json::UInt64>(options.offset) + options.limit;
-    if (single) {
-        request["offset"] = options.offset;
-    }
-    if (options.limit != kNoLimit) {
-        request["limit"] = single ? options.limit : static_cast<Json::UInt>(wanted);
-    }
-    Results results;
-    std::vector<Json::Value> lists;
-    for (const std::string& share : shares) {
-        session.doing = "search share " + share;
-        Json::Value reply;
-        try {
-            fileindex::elastic::IndexQuery(reply, share, request);
-        } catch (const Error& error) {
-            if (error.code == Error::kChannelFailed ||
-                results.failures.size() + 1 == shares.size()) {
-                throw;
-            }
-            results.failures.push_back(DescribeError(session.doing, error));
-            continue;
-        }
-        if (!reply["data"].isArray() || !reply["total"].isIntegral()) {
-            throw Error(Error::kQueryWithoutData, toString(reply));
-        }
-        results.total += reply["total"].asUInt64();
-        lists.push_back(std::move(reply["data"]));
-    }
-    results.hits = Merge(lists, order);
-    if (!single) {
-        const auto begin = results.hits.begin();
-        const std::size_t size = results.hits.size();
-        results.hits.erase(begin,
-                           begin + static_cast<long>(std::min<std::size_t>(options.offset, size)));
-        results.hits.resize(std::min<std::size_t>(results.hits.size(), options.limit));
-    }
-    return results;
-}
-
 /// The line as it is shown: on one line, safe for a terminal and there with the words in bold.
 std::string ShownHighlight(const std::string& text, const Session& session) {
     std::string line;
@@ -212,27 +113,27 @@ void PrintHit(const Json::Value& hit, const Options& options, Session& session) 
     }
 }
 
-void PrintJson(const Results& results, const Options& options, Session& session) {
+void PrintJson(const SearchResults& results, const Options& options, Session& session) {
     Json::Value document(Json::objectValue);
     Json::Value& hits = document["hits"] = Json::Value(Json::arrayValue);
     for (const Json::Value& hit : results.hits) {
         hits.append(hit);
     }
     document["total"] = results.total;
-    document["offset"] = options.offset;
+    document["offset"] = options.page.offset;
     session.out << toString(document) << "\n";
 }
 
-void TellAbout(const Results& results, const Options& options, Session& session) {
+void TellAbout(const SearchResults& results, const Options& options, Session& session) {
     for (const std::string& failure : results.failures) {
         session.err << "fileindexctl: " << EscapeControl(failure) << "\n";
     }
     if (results.total == 0) {
         session.err << "Nothing found.\n";
     } else if (results.hits.empty()) {
-        session.err << "Nothing from offset " << options.offset << " on: " << results.total
+        session.err << "Nothing from offset " << options.page.offset << " on: " << results.total
                     << " in all.\n";
-    } else if (options.offset + results.hits.size() < results.total) {
+    } else if (options.page.offset + results.hits.size() < results.total) {
         session.err << results.hits.size() << " of " << results.total << ", --limit for more\n";
     }
 }
@@ -241,8 +142,8 @@ int SearchCommand(Options options, const std::vector<std::string>& words, Sessio
     if (options.null) {
         options.paths = true;
     }
-    if (options.limit == 0 || (options.paths && !options.limit_given)) {
-        options.limit = kNoLimit;
+    if (options.page.limit == 0 || (options.paths && !options.limit_given)) {
+        options.page.limit = Page::kNoLimit;
     }
     const SortOrder order = ParseSort(options.sort);
     const Json::Value request = MakeRequest(MakeQuery(words), options, order, session.json);
@@ -253,7 +154,7 @@ int SearchCommand(Options options, const std::vector<std::string>& words, Sessio
         throw Failure(
             "nothing is indexed yet; choose a folder with 'fileindexctl folder add PATH'");
     }
-    const Results results = Search(shares, request, options, order, session);
+    const SearchResults results = SearchShares(shares, request, options.page, order, session);
     if (session.json) {
         PrintJson(results, options, session);
     } else {
@@ -314,9 +215,9 @@ void AddSearchCommand(CommandLine& line) {
     command.add_option("QUERY", *words, "The words to find");
     command.add_option("--share", options->share, "Search this share only");
     CLI::Option* limit =
-        command.add_option("--limit", options->limit,
+        command.add_option("--limit", options->page.limit,
                            "The largest number of hits (20; with --paths all); 0 stands for all");
-    command.add_option("--offset", options->offset, "Leave out that many hits at the front");
+    command.add_option("--offset", options->page.offset, "Leave out that many hits at the front");
     command.add_option("--sort", options->sort,
                        "Sort by a field, with - in front from the largest on; else the most "
                        "relevant come first");

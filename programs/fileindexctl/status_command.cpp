@@ -47,15 +47,13 @@ void PrintShare(const ShareLine& share, Session& session) {
                 << ", " << Number(pending, "change", "changes") << " waiting";
     if (share.worker.running) {
         session.out << ", " << session.Shown(share.worker.state);
-        if (share.worker.state == "processing") {
-            session.out << " " << Progress(share.worker, session);
-        }
     } else {
         session.out << ", no worker";
     }
     session.out << "\n";
-    if (share.worker.running && !share.worker.current.empty()) {
-        session.out << "    at " << session.Shown(share.worker.current) << "\n";
+    if (share.worker.running && share.worker.state == "processing") {
+        session.out << "    " << Progress(share.worker, session) << "  "
+                    << session.Shown(share.worker.current) << "\n";
     }
     for (const std::string& error : {share.worker.last_error, share.error}) {
         if (!error.empty()) {

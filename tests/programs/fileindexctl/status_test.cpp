@@ -55,7 +55,7 @@ TEST_F(StatusTest, CountsWhatIsDoneAndLeft) {
     const std::string text = OnTerminal({"status"}).out;
     EXPECT_NE(text.find("1234 documents, 3 changes waiting"), std::string::npos) << text;
     EXPECT_NE(text.find("[#####-----------------] 30 of 120"), std::string::npos) << text;
-    EXPECT_NE(text.find("at /volume1/s/\\x1b[2J"), std::string::npos) << text;
+    EXPECT_NE(text.find("30 of 120  /volume1/s/\\x1b[2J"), std::string::npos) << text;
     EXPECT_NE(text.find("last error: disk on fire"), std::string::npos) << text;
     EXPECT_NE(text.find("processing"), std::string::npos) << text;
 }
