@@ -45,6 +45,10 @@ class Backend {
     virtual bool AddRoot(const std::string& path) = 0;
     virtual void RemoveRoot(const std::string& path) = 0;
 
+    /// Looks for directories below the root that are not watched and should be. OnRootComplete
+    /// follows again.
+    virtual void Rescan(const std::string& path) = 0;
+
     /// Takes the events that are there and goes on with a piece of pending work, telling the sink.
     /// With `is_last` nothing waits for more to come.
     virtual void Work(bool is_last) = 0;

@@ -139,17 +139,23 @@ void FanotifyBackend::Work(bool is_last) {
     while (is_last && !is_empty) {
         is_empty = ReadEvents();
     }
-    if (is_empty || renames_.size() > kMaxUncheckedRenames) {
-        CheckRenames();
+    for (auto& [mount, view] : views_) {
+        if (is_empty || view.renames.size() > kMaxUncheckedRenames) {
+            FinishTurn(view);
+        }
     }
     if (is_empty) {
-        for (auto& [mount, view] : views_) {
-            // Only now nothing that is known is ahead of the events.
-            if (view.paths.Size() > kMaxKnownPaths) {
-                view.paths.Clear();
-            }
-        }
         CompleteRoots();
+    }
+}
+
+/// Everything that the kernel had queued has been processed.
+void FanotifyBackend::FinishTurn(View& view) {
+    CheckRenames(view);
+    view.renames_before = std::exchange(view.renames, {});
+    view.paths.Settle();
+    if (view.paths.Size() > kMaxKnownPaths) {
+        view.paths.Clear();
     }
 }
 
@@ -194,7 +200,7 @@ void FanotifyBackend::Handle(const FanotifyEvent& event) {
         for (const Change& change : TranslateFanotify(event, view.paths, lookup)) {
             sink_.OnChange(change);
             if (change.kind == Change::Kind::kRenamed) {
-                renames_.push_back({change.path_old, change.path, change.is_dir});
+                view.renames.push_back({change.path_old, change.path, change.is_dir});
             }
         }
     }
@@ -230,15 +236,25 @@ std::string FanotifyBackend::Lookup(View& view, const std::string& handle) const
 }
 
 /// The kernel merges equal renames: of a -> b, b -> a, a -> b the first two arrive, and the object
-/// seems to be at a. So when the queue is empty, each rename's result is compared with the disk.
-void FanotifyBackend::CheckRenames() {
-    for (const Rename& rename : std::exchange(renames_, {})) {
+/// seems to be at a. So each rename's result is compared with the disk. Where names were used too
+/// early, all results are indexed again: also those of the turn before, for the event of a rename
+/// is queued a moment after the disk shows it.
+void FanotifyBackend::CheckRenames(const View& view) {
+    using Kind = Change::Kind;
+    for (const Rename& rename : view.renames) {
         struct stat status {};
         if (lstat(rename.to.c_str(), &status) != 0) {
-            sink_.OnChange({Change::Kind::kDeleted, rename.is_dir, rename.to});
+            sink_.OnChange({Kind::kDeleted, rename.is_dir, rename.to});
         }
         if (lstat(rename.from.c_str(), &status) == 0) {
-            sink_.OnChange({Change::Kind::kCreated, S_ISDIR(status.st_mode), rename.from});
+            sink_.OnChange({Kind::kCreated, S_ISDIR(status.st_mode), rename.from});
+        }
+    }
+    if (view.paths.IsAhead()) {
+        for (const std::vector<Rename>* const turn : {&view.renames_before, &view.renames}) {
+            for (const Rename& rename : *turn) {
+                sink_.OnChange({Kind::kReindex, true, rename.to});
+            }
         }
     }
 }

@@ -27,20 +27,23 @@ class FanotifyBackend : public Backend {
     /// Also false when the file system does not support what is needed, which is tried out.
     bool AddRoot(const std::string& path) override;
     void RemoveRoot(const std::string& path) override;
+    void Rescan(const std::string& path) override { completed_.push_back(path); }
     void Work(bool is_last) override;
     std::optional<Time> NextDue() const override;
 
   private:
+    struct Rename {
+        std::string from;
+        std::string to;
+        bool is_dir;
+    };
     /// One mount, as far as roots lie in it.
     struct View {
         std::string file_system;
         std::set<std::string> roots{};
         HandlePaths paths{};
-    };
-    struct Rename {
-        std::string from;
-        std::string to;
-        bool is_dir;
+        std::vector<Rename> renames{};         ///< since the kernel's queue was last empty
+        std::vector<Rename> renames_before{};  ///< and in the turn before that
     };
 
     FanotifyBackend(BackendSink& sink, quivra::UniqueFd group);
@@ -49,14 +52,14 @@ class FanotifyBackend : public Backend {
     void Handle(const FanotifyEvent& event);
     void HandleOverflow();
     void CompleteRoots();
-    void CheckRenames();
+    void FinishTurn(View& view);
+    void CheckRenames(const View& view);
     std::string Lookup(View& view, const std::string& handle) const;
 
     BackendSink& sink_;
     quivra::UniqueFd group_;
     std::map<int, View> views_;  ///< by mount id
     std::vector<std::string> completed_;
-    std::vector<Rename> renames_;  ///< since the kernel's queue was last empty
 };
 
 }  // namespace kestotifyd

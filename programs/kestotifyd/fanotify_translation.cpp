@@ -42,8 +42,8 @@ std::vector<Change> TranslateRename(const FanotifyEvent& event, HandlePaths& pat
         return changes;
     }
     changes.push_back({Kind::kRenamed, is_dir, to, from});
-    if (is_dir && paths.Rename(event.target, from, to)) {
-        changes.push_back({Kind::kCreated, true, to});
+    if (is_dir) {
+        paths.Rename(event.target, from, to);
     }
     return changes;
 }

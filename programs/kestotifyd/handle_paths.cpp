@@ -31,17 +31,17 @@ std::string HandlePaths::Find(const std::string& handle) const {
 }
 
 void HandlePaths::Set(const std::string& handle, const std::string& path) {
-    const auto there = by_path_.find(path);
-    if (there != by_path_.end()) {
-        if (there->second == handle) {
-            return;
-        }
-        by_handle_.erase(there->second);
-        by_path_.erase(there);
+    if (is_ahead_) {
+        return;
     }
-    Erase(handle);
-    by_handle_[handle] = path;
-    by_path_[path] = handle;
+    const auto there = by_path_.find(path);
+    const auto known = by_handle_.find(handle);
+    if (there == by_path_.end() && known == by_handle_.end()) {
+        by_handle_[handle] = path;
+        by_path_[path] = handle;
+    } else if (there == by_path_.end() || there->second != handle) {
+        BecomeAhead();
+    }
 }
 
 void HandlePaths::Erase(const std::string& handle) {
@@ -59,22 +59,31 @@ void HandlePaths::EraseBelow(const std::string& path) {
     }
 }
 
-bool HandlePaths::Rename(const std::string& handle, const std::string& from,
+void HandlePaths::Rename(const std::string& handle, const std::string& from,
                          const std::string& to) {
     const std::string known = Find(handle);
     const auto occupant = by_path_.find(from);
-    const bool is_ahead = (!known.empty() && known != from) ||
-                          (occupant != by_path_.end() && occupant->second != handle) ||
-                          !Below(by_path_, to).empty();
+    if ((!known.empty() && known != from) ||
+        (occupant != by_path_.end() && occupant->second != handle) ||
+        !Below(by_path_, to).empty()) {
+        BecomeAhead();
+        return;
+    }
     const Entries moved = Below(by_path_, from);
     EraseBelow(from);
     for (const auto& [path, moved_handle] : moved) {
-        if (path != from) {
-            Set(moved_handle, to + path.substr(from.size()));
-        }
+        Set(moved_handle, to + path.substr(from.size()));
     }
     Set(handle, to);
-    return is_ahead;
+}
+
+void HandlePaths::BecomeAhead() {
+    Clear();
+    is_ahead_ = true;
+}
+
+void HandlePaths::Settle() {
+    is_ahead_ = false;
 }
 
 void HandlePaths::Clear() {

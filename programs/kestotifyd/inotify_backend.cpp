@@ -115,6 +115,13 @@ void InotifyBackend::RemoveRoot(const std::string& path) {
     }
 }
 
+void InotifyBackend::Rescan(const std::string& path) {
+    WatchNode* const root = tree_.FindRoot(path);
+    if (root != nullptr) {
+        scans_.push_back({{root, root->wd}, true, {{root, root->wd}}});
+    }
+}
+
 void InotifyBackend::Work(bool is_last) {
     ReadEvents();
     Process(is_last);
@@ -206,8 +213,7 @@ void InotifyBackend::StartRescans() {
     roots_with_gaps_.clear();
     limit_ = configured_limit_ == 0 ? ReadLimit() : configured_limit_;
     for (const std::string& path : tree_.RootPaths()) {
-        WatchNode* const root = tree_.FindRoot(path);
-        scans_.push_back({{root, root->wd}, true, {{root, root->wd}}});
+        Rescan(path);
     }
 }
 

@@ -30,6 +30,7 @@ class InotifyBackend : public Backend {
     int Fd() const override { return inotify_.Get(); }
     bool AddRoot(const std::string& path) override;
     void RemoveRoot(const std::string& path) override;
+    void Rescan(const std::string& path) override;
     void Work(bool is_last) override;
     std::optional<Time> NextDue() const override;
 

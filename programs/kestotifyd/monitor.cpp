@@ -181,11 +181,17 @@ void Monitor::LoadRegistrations(bool is_start) {
 }
 
 void Monitor::HandleMountChange() {
-    if (!mounts_.Reload()) {
-        return;
-    }
+    mounts_.Reload();
     UpdateRoots();
     CheckRoots();
+    // What a mount had covered lies open again, and has not been looked into.
+    for (const std::string& removed : mounts_.TakeRemoved()) {
+        for (const auto& [path, root] : roots_) {
+            if (root.backend != nullptr && path != removed && IsAtOrBelow(removed, path)) {
+                root.backend->Rescan(path);
+            }
+        }
+    }
 }
 
 /// The registered folders, and what is mounted below them.

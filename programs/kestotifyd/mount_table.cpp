@@ -3,7 +3,9 @@
 #include <fcntl.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
+#include <iterator>
 #include <sstream>
 
 #include "common/log.h"
@@ -52,7 +54,7 @@ MountTable::MountTable() : fd_(open(kMountInfo, O_RDONLY | O_CLOEXEC)) {
     Reload();
 }
 
-bool MountTable::Reload() {
+void MountTable::Reload() {
     std::set<std::string> points;
     std::istringstream lines(ReadWhole(fd_.Get()));
     for (std::string line; std::getline(lines, line);) {
@@ -64,9 +66,9 @@ bool MountTable::Reload() {
             points.insert(Unescape(point));
         }
     }
-    const bool is_changed = points != points_;
+    std::set_difference(points_.begin(), points_.end(), points.begin(), points.end(),
+                        std::inserter(removed_, removed_.end()));
     points_ = std::move(points);
-    return is_changed;
 }
 
 std::string MountTable::Covering(const std::string& path) const {

@@ -2,6 +2,7 @@
 
 #include <set>
 #include <string>
+#include <utility>
 
 #include "common/unique_fd.h"
 
@@ -15,8 +16,11 @@ class MountTable {
     /// Polls as exceptional (EPOLLPRI) when the table has changed since the last Reload.
     int Fd() const { return fd_.Get(); }
 
-    /// Reads the table again; whether the set of mount points is another one.
-    bool Reload();
+    /// Reads the table again.
+    void Reload();
+
+    /// The mount points that have gone since the last call.
+    std::set<std::string> TakeRemoved() { return std::exchange(removed_, {}); }
 
     bool IsMountPoint(const std::string& path) const { return points_.contains(path); }
 
@@ -30,6 +34,7 @@ class MountTable {
   private:
     quivra::UniqueFd fd_;
     std::set<std::string> points_;
+    std::set<std::string> removed_;
 };
 
 }  // namespace kestotifyd

@@ -162,6 +162,11 @@ void QueueSet::OnRootComplete(const std::string& root, Time now) {
             queue.translator->Apply({Change::Kind::kReindex, true, root}, now);
             Schedule(queue, now + kBatchTime);
         }
+        for (auto& [path, folder] : queue.folders) {
+            if (folder.owes_crash && !folder.owes_reindex && IsAtOrBelow(root, path)) {
+                Pay(queue, path, folder, now);
+            }
+        }
     }
 }
 
@@ -215,6 +220,7 @@ void QueueSet::FlushQueue(Queue& queue, Time now, Time held_until) {
     queue.writer->Add(queue.translator->TakeLines());
     switch (queue.writer->Write()) {
         case QueueWriter::Result::kDone:
+            queue.translator->OnWritten(queue.writer->HasBegunFile());
             queue.flush_due = queue.translator->NextDue();
             break;
         case QueueWriter::Result::kBusy:

@@ -21,6 +21,7 @@ constexpr std::uint32_t kUnmaskedEvents = EVENT_QUEUE_CRASH | EVENT_REINDEX;
 
 /// Above it everything held is reported at once, so that a storm of writes stays bounded in memory.
 constexpr std::size_t kMaxHeld = 65536;
+constexpr std::size_t kMaxDeleted = 65536;
 
 }  // namespace
 
@@ -63,6 +64,9 @@ bool QueueTranslator::Matches(const std::string& path, bool muted_too) const {
 void QueueTranslator::Apply(const Change& change, Time now) {
     using Kind = Change::Kind;
     if (change.kind == Kind::kReindex || change.kind == Kind::kCrashed) {
+        if (!Wants(change.path)) {
+            return;
+        }
         Emit(change.kind == Kind::kReindex ? EVENT_REINDEX : EVENT_QUEUE_CRASH, true, change.path);
         return;
     }
@@ -75,7 +79,7 @@ void QueueTranslator::Apply(const Change& change, Time now) {
     }
     switch (change.kind) {
         case Kind::kCreated:
-            Emit(EVENT_CREATE, change.is_dir, change.path);
+            EmitCreate(change.is_dir, change.path);
             break;
         case Kind::kWritten:
             Hold(change.path, now + kOpenFileInterval);
@@ -87,8 +91,7 @@ void QueueTranslator::Apply(const Change& change, Time now) {
             Emit(EVENT_ATTR, change.is_dir, change.path);
             break;
         default:
-            ReleaseBelow(change.path, false);
-            Emit(EVENT_DELETE, change.is_dir, change.path);
+            EmitDelete(change.is_dir, change.path);
             break;
     }
 }
@@ -100,11 +103,42 @@ void QueueTranslator::ApplyRename(const Change& change) {
         ReleaseBelow(change.path_old, true);  // under the name that the consumer knows
         Emit(EVENT_RENAME, change.is_dir, change.path, change.path_old);
     } else if (leaves) {
-        ReleaseBelow(change.path_old, false);
-        Emit(EVENT_DELETE, change.is_dir, change.path_old);
+        EmitDelete(change.is_dir, change.path_old);
     } else if (enters) {
-        Emit(EVENT_CREATE, change.is_dir, change.path);
+        EmitCreate(change.is_dir, change.path);
     }
+}
+
+/// A consumer that folds the lines of one queue file drops the creation of a directory behind the
+/// deletion of a file at the same path, but not the creation of a file. So that one goes before.
+void QueueTranslator::EmitCreate(bool is_dir, const std::string& path) {
+    const bool was_deleted = deleted_now_.erase(path) + deleted_.erase(path) > 0;
+    if (is_dir && (was_deleted || are_deletes_unknown_)) {
+        Emit(EVENT_CREATE, false, path);
+    }
+    Emit(EVENT_CREATE, is_dir, path);
+}
+
+void QueueTranslator::EmitDelete(bool is_dir, const std::string& path) {
+    ReleaseBelow(path, false);
+    Emit(EVENT_DELETE, is_dir, path);
+    if (!is_dir) {
+        deleted_now_.insert(path);
+        are_deletes_unknown_ |= deleted_now_.size() + deleted_.size() > kMaxDeleted;
+    }
+    if (are_deletes_unknown_) {
+        deleted_now_.clear();
+        deleted_.clear();
+    }
+}
+
+void QueueTranslator::OnWritten(bool is_new_file) {
+    if (is_new_file) {
+        deleted_.clear();
+        are_deletes_unknown_ = false;
+    }
+    deleted_.merge(deleted_now_);
+    deleted_now_.clear();
 }
 
 void QueueTranslator::Hold(const std::string& path, Time due) {

@@ -37,7 +37,7 @@ class QueueTranslator {
     void Apply(const Change& change, Time now);
 
     /// A muted folder's changes are dropped: whoever mutes it owes a kReindex of it, applied after
-    /// the unmuting. Reindex and crash lines pass.
+    /// the unmuting.
     void Mute(const std::string& folder) { muted_.insert(folder); }
     void Unmute(const std::string& folder) { muted_.erase(folder); }
 
@@ -46,6 +46,9 @@ class QueueTranslator {
 
     /// Turns the modifications that are due into lines; with Time::max() all of them.
     void Flush(Time now);
+
+    /// The lines taken so far have been written; to a new, empty file if `is_new_file`.
+    void OnWritten(bool is_new_file);
 
     std::size_t LineCount() const { return lines_.size(); }
 
@@ -59,6 +62,8 @@ class QueueTranslator {
     void Hold(const std::string& path, Time due);
     void ReleaseBelow(const std::string& path, bool emit);
     void ApplyRename(const Change& change);
+    void EmitCreate(bool is_dir, const std::string& path);
+    void EmitDelete(bool is_dir, const std::string& path);
     void Emit(std::uint32_t event, bool is_dir, const std::string& path,
               const std::string& path_old = std::string());
 
@@ -67,6 +72,10 @@ class QueueTranslator {
     std::set<std::string> muted_;
     std::map<std::string, Time> held_;  ///< by path: when its modification is due
     std::vector<std::string> lines_;
+
+    std::set<std::string> deleted_;      ///< files, by lines in the present queue file
+    std::set<std::string> deleted_now_;  ///< files, by lines that are not written yet
+    bool are_deletes_unknown_ = false;   ///< there were too many to remember
 };
 
 /// Whether `path` is `folder` or lies below it.

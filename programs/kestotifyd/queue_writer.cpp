@@ -45,6 +45,7 @@ void QueueWriter::Add(std::vector<std::string> lines) {
 }
 
 QueueWriter::Result QueueWriter::Write() {
+    has_begun_file_ = false;
     if (pending_.empty()) {
         return Result::kDone;
     }
@@ -100,8 +101,9 @@ QueueWriter::Result QueueWriter::OpenLocked(quivra::UniqueFd& queue) const {
     return Result::kBusy;
 }
 
-bool QueueWriter::EndTornLine(int fd) const {
+bool QueueWriter::EndTornLine(int fd) {
     const off_t size = lseek(fd, 0, SEEK_END);
+    has_begun_file_ = size == 0;
     char last = '\n';
     if (size < 0 || (size > 0 && pread(fd, &last, 1, size - 1) != 1)) {
         return false;

@@ -30,6 +30,9 @@ class QueueWriter {
     /// Takes whole lines, each with its "\n".
     void Add(std::vector<std::string> lines);
 
+    /// Whether the last Write that succeeded began a new file.
+    bool HasBegunFile() const { return has_begun_file_; }
+
     bool IsEmpty() const { return pending_.empty(); }
 
     /// Appends what is pending, in order, to the file that is at the path now; it is made with mode
@@ -40,7 +43,7 @@ class QueueWriter {
   private:
     Result Fail(const char* action);
     Result OpenLocked(quivra::UniqueFd& queue) const;
-    bool EndTornLine(int fd) const;
+    bool EndTornLine(int fd);
     Result Append(int fd);
     void DropWritten(std::size_t size);
 
@@ -49,6 +52,7 @@ class QueueWriter {
     std::size_t max_pending_;
     std::deque<std::string> pending_;
     std::size_t pending_bytes_ = 0;
+    bool has_begun_file_ = false;
     bool is_failure_logged_ = false;
 };
 

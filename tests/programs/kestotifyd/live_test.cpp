@@ -299,6 +299,98 @@ TEST_P(LiveTest, AFolderThatGoesIsADeleteAndThatReturnsAReindex) {
     EXPECT_TRUE(Comes(Line(0x2, false, share_ + "/new")));
 }
 
+TEST_P(LiveTest, ARefusedWatchBecomesACrashMarker) {
+    if (std::string(GetParam()) != "inotify") {
+        GTEST_SKIP() << "needs no watches";
+    }
+    for (int i = 0; i < 20; ++i) {
+        fs::create_directories(share_ + "/d" + std::to_string(i));
+    }
+    Register();
+    Start({"--max-watches", "12"});
+    EXPECT_TRUE(Comes(Line(0x200, true, kShare)));
+    EXPECT_EQ(Lines().front(), Line(0x10000, true, kShare));
+    EXPECT_TRUE(HasLog("sysctl fs.inotify.max_user_watches="));
+    EXPECT_TRUE(model_.Converges());
+    fs::create_directories(share_ + "/refused");
+    EXPECT_TRUE(Comes(Line(0x40, true, share_ + "/refused")));
+}
+
+TEST_P(LiveTest, WhatIsMountedBelowIsWatchedAndItsUnmountingIsNoDelete) {
+    fs::create_directories(share_ + "/disk/covered");
+    fs::create_directories(share_ + "/other");
+    ASSERT_EQ(mount("none", (share_ + "/disk").c_str(), "tmpfs", 0, nullptr), 0);
+    Register();
+    Start();
+    EXPECT_TRUE(Comes(Line(0x10000, true, share_ + "/disk")));
+    EXPECT_TRUE(Comes(Line(0x10000, true, share_)));
+    ASSERT_EQ(mount("none", (share_ + "/other").c_str(), "tmpfs", 0, nullptr), 0);
+    EXPECT_TRUE(Comes(Line(0x10000, true, share_ + "/other")));
+    fs::create_directories(share_ + "/disk/a");
+    WriteFile(share_ + "/disk/a/f");
+    EXPECT_TRUE(Comes(Line(0x40, true, share_ + "/disk/a")));
+    EXPECT_TRUE(model_.Converges());
+    ASSERT_EQ(umount((share_ + "/disk").c_str()), 0) << "the monitor keeps it busy";
+    EXPECT_TRUE(Eventually([&] {
+        WriteFile(share_ + "/disk/covered/under");
+        return Has(Line(0x2, false, share_ + "/disk/covered/under"));
+    }));
+    EXPECT_EQ(ReadAll(Queue()).find("\"event\":128"), std::string::npos);
+    monitor_.reset();
+    umount((share_ + "/other").c_str());
+}
+
+TEST_P(LiveTest, AVolumeThatIsAwayIsNotTakenForEmpty) {
+    StartAndSettle();
+    const std::string volume = "/volume2";
+    const std::string queue = "/volume1/video.queue";
+    fs::create_directories(volume);
+    ASSERT_EQ(mount("none", volume.c_str(), "tmpfs", 0, nullptr), 0);
+    Json::Value json;
+    json["queue"] = queue;
+    json["config"]["path"].append(volume);
+    json["config"]["mask"] = 65478;
+    ASSERT_TRUE(quivra::toFile(json, std::string(kRegistrations) + "/volume2.json"));
+    const auto queue_has = [&](const std::string& line) {
+        return ReadAll(queue).find(line) != std::string::npos;
+    };
+    EXPECT_TRUE(Eventually([&] {
+        WriteFile(volume + "/f");
+        return queue_has(volume + "/f");
+    }));
+    ASSERT_EQ(umount(volume.c_str()), 0) << "the monitor keeps it busy";
+    LinesUntilNow();
+    monitor_->Stop(SIGTERM);
+    Start();
+    EXPECT_TRUE(Comes(Line(0x10000, true, kShare)));
+    LinesUntilNow();
+    EXPECT_FALSE(queue_has("65536")) << ReadAll(queue);
+    ASSERT_EQ(mount("none", volume.c_str(), "tmpfs", 0, nullptr), 0);
+    EXPECT_TRUE(Eventually([&] { return queue_has(Line(0x10000, true, volume)); }));
+    EXPECT_FALSE(queue_has(":128")) << ReadAll(queue);
+    umount(volume.c_str());
+}
+
+TEST_P(LiveTest, ABindMountIsReportedAsEachFolderSeesIt) {
+    const std::string mirror = "/volume1/mirror";
+    fs::create_directories(share_ + "/sub/deep");
+    fs::create_directories(mirror);
+    ASSERT_EQ(mount((share_ + "/sub").c_str(), mirror.c_str(), nullptr, MS_BIND, nullptr), 0);
+    Register(mirror);
+    StartAndSettle();
+    WriteFile(mirror + "/deep/f");
+    EXPECT_TRUE(Comes(Line(0x40, false, mirror + "/deep/f"), mirror));
+    EXPECT_TRUE(Comes(Line(0x40, false, share_ + "/sub/deep/f")));
+    fs::rename(share_ + "/sub/deep", share_ + "/sub/moved");
+    EXPECT_TRUE(Comes(Line(0x100, true, mirror + "/moved", mirror + "/deep"), mirror));
+    EXPECT_TRUE(Comes(Line(0x100, true, share_ + "/sub/moved", share_ + "/sub/deep")));
+    fs::rename(share_ + "/sub/moved", share_ + "/out");
+    EXPECT_TRUE(Comes(Line(0x80, true, mirror + "/moved"), mirror));
+    EXPECT_TRUE(Comes(Line(0x100, true, share_ + "/out", share_ + "/sub/moved")));
+    monitor_.reset();
+    umount(mirror.c_str());
+}
+
 TEST_P(LiveTest, RenamesThatItReadsLate) {
     for (const char* const name : {"a", "b", "c"}) {
         fs::create_directories(share_ + "/" + name + "/sub");
@@ -331,7 +423,10 @@ TEST_P(LiveTest, RenamesThatItReadsLate) {
         for (auto move = moves[row].rbegin(); move != moves[row].rend(); ++move) {
             fs::rename(share_ + "/" + move->second, share_ + "/" + move->first);
         }
-        WriteFile(share_ + "/a/sub/x", "a");
+        for (const char* const name : {"a", "b", "c"}) {
+            WriteFile(share_ + "/" + name + "/sub/x", std::to_string(row) + name);
+            WriteFile(share_ + "/" + name + "/sub/y", std::to_string(row) + name);
+        }
         EXPECT_TRUE(model_.Converges()) << "back from row " << row;
         monitor_->Stop(SIGTERM);
     }

@@ -169,6 +169,23 @@ TEST_F(TranslationTest, EventsBecomeLines) {
     }
 }
 
+TEST_F(TranslationTest, ADirectoryInThePlaceOfADeletedFileIsNotFoldedAway) {
+    const auto replace = [&] {
+        Feed({1, IN_DELETE, 0, "f"});
+        Advance(milliseconds(0));
+        Feed({1, IN_MOVED_TO | kDir, 0, "f"});
+        translator_.Apply({Change::Kind::kCreated, true, "/r/f"}, now_);  // once it is scanned
+        return Advance(milliseconds(0));
+    };
+    EXPECT_EQ(replace(), (Lines{"create /r/f", "create dir /r/f"}));
+    Feed({1, IN_DELETE, 0, "g"});
+    translator_.OnWritten(false);
+    translator_.OnWritten(true);  // in another queue file
+    translator_.TakeLines();
+    translator_.Apply({Change::Kind::kCreated, true, "/r/g"}, now_);
+    EXPECT_EQ(Advance(milliseconds(0)), Lines{"create dir /r/g"});
+}
+
 TEST_F(TranslationTest, FirstHalfWaitsAndThenGivesUp) {
     Feed({1, IN_MOVED_FROM, 7, "f"});
     Feed({1, IN_CREATE, 0, "g"});
