@@ -2,6 +2,7 @@
 
 #include <sodium.h>
 
+#include <algorithm>
 #include <utility>
 
 #include "common/error.h"
@@ -102,20 +103,15 @@ std::shared_ptr<Index> Catalog::Use(const std::string& id) {
     if (found != in_use_.end()) {
         return found->second;
     }
-    auto entry = registry_.entries.find(id);
+    const auto entry = FindSettled(id);
     if (entry == registry_.entries.end()) {
-        CheckIdIsFree(id, std::string());
         throw Error(kNoSuchIndex, "No such index: " + id);
-    }
-    if (entry->second.move) {  // its disk was missing at the start
-        auto settled = entry;
-        if (Settle(settled)) {
-            registry_.Save();
-            return Use(id);
-        }
     }
     if (entry->second.deleting) {
         throw Error(kBusy, "The index is being made or deleted: " + id);
+    }
+    if (entry->second.move) {
+        throw Error(kIndexUnavailable, "The index was being moved, and is at neither place: " + id);
     }
     auto index = std::make_shared<Index>(entry->second.path,
                                          std::make_shared<Mapping>(entry->second.mappings),
@@ -124,12 +120,44 @@ std::shared_ptr<Index> Catalog::Use(const std::string& id) {
     return index;
 }
 
+/// The entry that has the id, or is about to get it. An interrupted move that could not be settled
+/// at the start, because its disk was missing, is settled now.
+Catalog::Entries::iterator Catalog::FindSettled(const std::string& id) {
+    auto entry = registry_.entries.find(id);
+    if (entry == registry_.entries.end()) {
+        entry = FindMovingTo(id);
+    }
+    if (entry == registry_.entries.end() || !entry->second.move) {
+        return entry;
+    }
+    CheckNotMoving(entry->first);
+    auto settled = entry;
+    if (Settle(settled)) {
+        registry_.Save();
+        return registry_.entries.find(id);
+    }
+    return entry;
+}
+
+Catalog::Entries::iterator Catalog::FindMovingTo(const std::string& id) {
+    return std::find_if(registry_.entries.begin(), registry_.entries.end(), [&](const auto& entry) {
+        return entry.second.move && entry.second.move->id == id;
+    });
+}
+
+void Catalog::CheckNotMoving(const std::string& id) const {
+    const auto index = in_use_.find(id);
+    if (index != in_use_.end() && index->second->IsMoving()) {
+        throw Error(kBusy, "The index is being moved: " + id);
+    }
+}
+
 /// The id that an index is about to get belongs to it already.
-void Catalog::CheckIdIsFree(const std::string& id, const std::string& own_id) const {
-    for (const auto& [other, entry] : registry_.entries) {
-        if (other != own_id && entry.move && entry.move->id == id) {
-            throw Error(kBusy, "An index is being moved to this id: " + id);
-        }
+void Catalog::CheckIdIsFree(const std::string& id) {
+    const auto mover = FindMovingTo(id);
+    if (mover != registry_.entries.end()) {
+        CheckNotMoving(mover->first);
+        throw Error(kIndexExists, "Another index is to get this id: " + id);
     }
 }
 
@@ -162,7 +190,7 @@ void Catalog::Create(const std::string& id, const std::string& path, const Json:
         CheckIsThere(id, found->second, path);
         return;
     }
-    CheckIdIsFree(id, std::string());
+    CheckIdIsFree(id);
     CheckPathIsFree(path, std::string());
     const Mapping checked(mappings);
     IndexEntry entry;
@@ -202,7 +230,7 @@ void Catalog::CheckIsThere(const std::string& id, const IndexEntry& entry,
 void Catalog::Delete(const std::string& id) {
     std::unique_lock lock(mutex_);
     if (!registry_.entries.contains(id)) {
-        CheckIdIsFree(id, std::string());
+        CheckIdIsFree(id);
         return;
     }
     const std::shared_ptr<Index> index = Use(id);
@@ -236,6 +264,7 @@ void Catalog::Delete(const std::string& id) {
 void Catalog::SetPaused(const std::string& id, bool paused) {
     std::unique_lock lock(mutex_);
     const std::shared_ptr<Index> index = Use(id);
+    CheckNotMoving(id);
     IndexEntry& entry = registry_.entries.at(id);
     if (entry.paused != paused) {
         entry.paused = paused;
@@ -269,11 +298,9 @@ void Catalog::Configure(const std::string& id, const std::string& new_id,
     if (move.id != id && target != registry_.entries.end()) {
         throw Error(kIndexExists, "Another index has this id: " + new_id);
     }
-    CheckIdIsFree(move.id, id);
+    CheckIdIsFree(move.id);
     CheckPathIsFree(move.path, id);
-    if (index->IsMoving() || registry_.entries.at(id).move) {
-        throw Error(kBusy, "The index is being moved: " + id);
-    }
+    CheckNotMoving(id);
     if (move.path == registry_.entries.at(id).path) {
         Rename(id, move.id);
     } else if (index->BeginMove()) {

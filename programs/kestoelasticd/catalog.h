@@ -22,7 +22,8 @@ class Catalog {
     /// Index.
     Catalog(const std::string& registry_path, std::uint64_t min_free);
 
-    /// Throws Error 1404 for an unknown id, 1401 for the id that an index is about to get.
+    /// Throws Error 1404 for an unknown id, 1401 while the index is being made or deleted, or is
+    /// about to get this id; 1413 when it was lost in an interrupted move.
     std::shared_ptr<Index> Find(const std::string& id);
 
     /// Throws Error 1405 when the id has another path or the path is another index's, 1406, 1414,
@@ -42,7 +43,10 @@ class Catalog {
     void SettleAll();
     bool Settle(Entries::iterator& entry);
     void CheckPathIsFree(const std::string& path, const std::string& own_id) const;
-    void CheckIdIsFree(const std::string& id, const std::string& own_id) const;
+    void CheckIdIsFree(const std::string& id);
+    void CheckNotMoving(const std::string& id) const;
+    Entries::iterator FindSettled(const std::string& id);
+    Entries::iterator FindMovingTo(const std::string& id);
     std::shared_ptr<Index> Use(const std::string& id);
     void MakeFiles(const IndexEntry& entry) const;
     Entries::iterator Rekey(Entries::iterator entry, const std::string& new_id);

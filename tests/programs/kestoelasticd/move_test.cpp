@@ -218,9 +218,9 @@ TEST_F(MoveTest, InterruptedWhileTheDiskWasMissing) {
     fs::rename(kOld, kState + "/unplugged");
     Start();
     EXPECT_EQ(client.All(), Ids{"error 1413"});
+    EXPECT_EQ(Renamed().All(), Ids{"error 1413"});
+    EXPECT_EQ(Renamed().Create(kState + "/another", TestMappings()), kIndexExists);
     fs::rename(kState + "/unplugged", kNew);
-    EXPECT_EQ(Renamed().All(), Ids{"error 1401"});
-    Start();
     EXPECT_EQ(Renamed().All(), kBoth);
 }
 
