@@ -28,6 +28,8 @@ struct Pipe {
     UniqueFd write_end;
 };
 
+constexpr int kNever = 0;
+
 /// Interrupts the running call every millisecond, and writes a byte to a pipe at the given signal.
 class Interruptions {
   public:
@@ -79,7 +81,7 @@ TEST_F(CommunicationTest, TenInterruptionsArePassedOverAndTheEleventhFails) {
     }
     EXPECT_EQ(byte, 'x');
     const Error error = ErrorOf([&] {
-        const Interruptions interruptions(pipe.write_end.Get(), 12);
+        const Interruptions interruptions(pipe.write_end.Get(), kNever);
         BufferRead(pipe.read_end.Get(), 1, &byte);
     });
     EXPECT_EQ(error.code, 502);

@@ -1,6 +1,9 @@
+#include <fcntl.h>
 #include <poll.h>
 #include <sys/wait.h>
 #include <unistd.h>
+
+#include <array>
 
 #include "fileindex/folder_mgr.h"
 #include "fileindex/index_mgr.h"
@@ -279,14 +282,19 @@ TEST_F(FolderOperationsTest, AnInterruptedRequestLeavesTheOldSetOrTheNewOne) {
 
 TEST_F(FolderOperationsTest, TwoProcessesLoseNothing) {
     // Lock attempts are few, and a faked sleep would use them up at once.
-    fake::OnSleep([](auto) { poll(nullptr, 0, 20); });
+    fake::OnSleep([](auto) { poll(nullptr, 0, 50); });
     constexpr int kEach = 10;
+    // Both wait for the start, so that the servers' threads hold no lock while this process forks.
+    std::array<int, 2> start{};
+    ASSERT_EQ(pipe2(start.data(), O_CLOEXEC), 0);
     for (const std::string share : {"a", "b"}) {
         for (int i = 0; i < kEach; ++i) {
             std::filesystem::create_directories("/volume1/" + share + "/" + std::to_string(i));
         }
         if (fork() == 0) {
-            int code = 0;
+            close(start[1]);
+            char none = 0;
+            int code = read(start[0], &none, 1) == 0 ? 0 : 1;
             for (int i = 0; i < kEach && code == 0; ++i) {
                 code = ErrorOf([&] {
                            FolderAdd(List({"/" + share + "/" + std::to_string(i)}), false);
@@ -295,6 +303,8 @@ TEST_F(FolderOperationsTest, TwoProcessesLoseNothing) {
             _exit(code == 0 ? 0 : 1);
         }
     }
+    close(start[0]);
+    close(start[1]);
     int status = 0;
     while (wait(&status) > 0) {
         EXPECT_EQ(status, 0);
