@@ -42,12 +42,12 @@ class OPNode::ChildIndex {
   public:
     using Children = std::vector<std::shared_ptr<OPNode>>;
 
-    std::shared_ptr<OPNode> Find(const Children& children, std::string_view name) {
-        TakeIn(children);
-        const std::uint32_t hash = Hash(name);
+    std::shared_ptr<OPNode> Find(const Children& nodes, std::string_view wanted) {
+        TakeIn(nodes);
+        const std::uint32_t hash = Hash(wanted);
         for (std::size_t i = hash & mask_; slots_[i].count != 0; i = (i + 1) & mask_) {
-            const std::shared_ptr<OPNode>& child = children[slots_[i].count - 1];
-            if (slots_[i].hash == hash && child->name == name) {
+            const std::shared_ptr<OPNode>& child = nodes[slots_[i].count - 1];
+            if (slots_[i].hash == hash && child->name == wanted) {
                 return child;
             }
         }
@@ -60,17 +60,17 @@ class OPNode::ChildIndex {
         std::uint32_t count = 0;  ///< the position plus one; 0 marks a free slot
     };
 
-    static std::uint32_t Hash(std::string_view name) {
-        return static_cast<std::uint32_t>(std::hash<std::string_view>()(name));
+    static std::uint32_t Hash(std::string_view text) {
+        return static_cast<std::uint32_t>(std::hash<std::string_view>()(text));
     }
 
-    void TakeIn(const Children& children) {
-        if (children.size() < indexed_) {  // somebody removed children: start again
+    void TakeIn(const Children& nodes) {
+        if (nodes.size() < indexed_) {  // somebody removed children: start again
             *this = ChildIndex();
         }
-        Reserve(children.size());
-        for (; indexed_ < children.size(); ++indexed_) {
-            Put({Hash(children[indexed_]->name), static_cast<std::uint32_t>(indexed_ + 1)});
+        Reserve(nodes.size());
+        for (; indexed_ < nodes.size(); ++indexed_) {
+            Put({Hash(nodes[indexed_]->name), static_cast<std::uint32_t>(indexed_ + 1)});
         }
     }
 
