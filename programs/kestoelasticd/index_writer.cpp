@@ -243,7 +243,7 @@ void IndexWriter::Delete(const std::string& id) {
 void IndexWriter::DeleteByQuery(const Json::Value& qsl) {
     Guarded([&] {
         Open();
-        const ParsedQuery parsed = ParseQuery(qsl, *mapping_, fields_, *database_);
+        const ParsedQuery parsed = ParseQuery(qsl, *mapping_, fields_);
         std::vector<Xapian::docid> found;
         Xapian::Enquire enquire(*database_);
         enquire.set_query(parsed.query);

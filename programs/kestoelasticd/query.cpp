@@ -28,8 +28,8 @@ constexpr double kGramWeight = 8.0;
 
 class QueryParser {
   public:
-    QueryParser(const Mapping& mapping, const FieldTable& fields, const Xapian::Database& database)
-        : mapping_(mapping), fields_(fields), database_(database) {}
+    QueryParser(const Mapping& mapping, const FieldTable& fields)
+        : mapping_(mapping), fields_(fields) {}
 
     ParsedQuery Parse(const Json::Value& qsl) {
         result_.query = ParseForm(qsl);
@@ -410,7 +410,6 @@ class QueryParser {
 
     const Mapping& mapping_;
     const FieldTable& fields_;
-    const Xapian::Database& database_;
     ParsedQuery result_;
     unsigned int nesting_ = 0;
     unsigned int parts_ = 0;
@@ -418,9 +417,8 @@ class QueryParser {
 
 }  // namespace
 
-ParsedQuery ParseQuery(const Json::Value& qsl, const Mapping& mapping, const FieldTable& fields,
-                       const Xapian::Database& database) {
-    return QueryParser(mapping, fields, database).Parse(qsl);
+ParsedQuery ParseQuery(const Json::Value& qsl, const Mapping& mapping, const FieldTable& fields) {
+    return QueryParser(mapping, fields).Parse(qsl);
 }
 
 }  // namespace elasticd

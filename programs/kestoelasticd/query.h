@@ -23,7 +23,6 @@ struct ParsedQuery {
 /// data: nothing in them is syntax. Throws Error 1410 for a form that cannot be followed, one
 /// nested too deep or one with too many parts. The result may refer to `database`, and is for it
 /// alone.
-ParsedQuery ParseQuery(const Json::Value& qsl, const Mapping& mapping, const FieldTable& fields,
-                       const Xapian::Database& database);
+ParsedQuery ParseQuery(const Json::Value& qsl, const Mapping& mapping, const FieldTable& fields);
 
 }  // namespace elasticd

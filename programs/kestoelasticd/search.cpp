@@ -86,7 +86,7 @@ class Searcher {
         if (!query.isObject()) {
             Refuse("no object");
         }
-        parsed_ = ParseQuery(query["qsl"], mapping, fields, database);
+        parsed_ = ParseQuery(query["qsl"], mapping, fields);
         offset_ = ReadCount(query, "offset", 0);
         limit_ = ReadCount(query, "limit", database.get_doccount());
         ReadSort(query["sort"]);
