@@ -21,8 +21,7 @@ struct ParsedQuery {
 
 /// Builds the engine's query from a "qsl" form; see docs/search-daemon.md. The texts in it are
 /// data: nothing in them is syntax. Throws Error 1410 for a form that cannot be followed, one
-/// nested too deep or one with too many parts. The result may refer to `database`, and is for it
-/// alone.
+/// nested too deep or one with too many parts.
 ParsedQuery ParseQuery(const Json::Value& qsl, const Mapping& mapping, const FieldTable& fields);
 
 }  // namespace elasticd
