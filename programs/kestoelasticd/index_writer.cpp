@@ -247,7 +247,6 @@ void IndexWriter::DeleteByQuery(const Json::Value& qsl) {
         std::vector<Xapian::docid> found;
         Xapian::Enquire enquire(*database_);
         enquire.set_query(parsed.query);
-        enquire.set_weighting_scheme(Xapian::BoolWeight());
         enquire.set_docid_order(Xapian::Enquire::DONT_CARE);
         const Xapian::MSet hits = enquire.get_mset(0, database_->get_doccount());
         for (Xapian::MSetIterator hit = hits.begin(); hit != hits.end(); ++hit) {

@@ -92,7 +92,9 @@ class QueryParser {
     /// Everything at weight 0. (The empty term stands for all documents.)
     static Query Everything() { return Unweighted(Query(std::string())); }
     static Query Unweighted(const Query& query) {
-        return Query(Query::OP_SCALE_WEIGHT, query, 0.0);
+        // Not OP_SCALE_WEIGHT by 0: Xapian 1.4.22 then reads the list of all documents in the place
+        // of a term that all documents have, and takes it for corrupt once one was deleted.
+        return Query(Query::OP_FILTER, Query(std::string()), query);
     }
 
     Query ParseList(const std::string& name, const Json::Value& forms) {
@@ -141,9 +143,10 @@ class QueryParser {
     /// folder.
     static Query IdPrefix(const std::string& text) {
         const std::size_t slash = text.rfind('/');
-        const Query folder = slash == std::string::npos
-                                 ? Query(std::string())
-                                 : Query(FolderTerm(std::string_view(text).substr(0, slash)));
+        const Query folder =
+            slash == std::string::npos
+                ? Query(std::string())
+                : Unweighted(Query(FolderTerm(std::string_view(text).substr(0, slash))));
         if (text.empty() || slash == text.size() - 1) {
             return folder;
         }

@@ -98,14 +98,14 @@ class Searcher {
         Xapian::Enquire enquire(database_);
         enquire.set_query(parsed_.query);
         std::unique_ptr<SortKeys> keys;
+        // The weights are not used for a sort, but a scheme that does without them (BoolWeight)
+        // makes Xapian 1.4.22 take a long posting list for corrupt once a document was deleted.
         if (!sort_.empty()) {
-            enquire.set_weighting_scheme(Xapian::BoolWeight());
             keys = std::make_unique<SortKeys>(sort_);
             enquire.set_sort_by_key(keys.get(), false);
         } else if (parsed_.has_words) {
             enquire.set_sort_by_relevance_then_value(kIdSlot, false);
         } else {
-            enquire.set_weighting_scheme(Xapian::BoolWeight());
             enquire.set_sort_by_value(kIdSlot, false);
         }
         // Looking at every match is what makes the total exact.

@@ -270,6 +270,24 @@ TEST_P(ProtocolTest, DeletingByQueryCountsTheBatchIn) {
     EXPECT_EQ(client.Ids(R"({"qsl": {"match": {"_all": "text"}}})"), Ids{});
 }
 
+// The engine has a way of its own to read a term that every document has.
+TEST_P(ProtocolTest, AFolderThatHoldsEveryDocumentCanLoseOne) {
+    CreateIndex();
+    for (int i = 0; i < 3000; ++i) {
+        ASSERT_EQ(client.Upsert("/v/d/" + std::to_string(i)), 0);
+    }
+    ASSERT_EQ(client.Commit(), 0);
+    ASSERT_EQ(client.Delete("/v/d/7"), 0);
+    ASSERT_EQ(client.Commit(), 0);
+    const Json::Value below = ParseJson(R"({"qsl": {"prefix": {"path": "/v/d/"}}})");
+    EXPECT_EQ(client.Ids(quivra::toString(below)).size(), 2999U);
+    Json::Value request;
+    request["query"] = below;
+    EXPECT_EQ(client.Code("document_del_by_query", request), 0);
+    ASSERT_EQ(client.Commit(), 0);
+    EXPECT_TRUE(client.All().empty());
+}
+
 TEST_P(ProtocolTest, APausedIndexAnswersButDoesNotChange) {
     CreateIndex();
     client.Upsert("/a");
