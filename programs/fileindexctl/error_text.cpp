@@ -57,7 +57,8 @@ constexpr std::array kErrorTexts = {
     ErrorText{Error::kMalformedEvent, "the change queue holds a damaged line",
               "it is skipped when the queue is processed; try again then", Reason::kTell},
     ErrorText{Error::kChannelFailed, "the search daemon does not answer",
-              "start it with 'service kestoelasticd start'", Reason::kTell},
+              "run this as root, and start the daemon with 'service kestoelasticd start'",
+              Reason::kTell},
     ErrorText{Error::kParseFailed, "the file could not be read",
               "check that it exists and the disk is sound", Reason::kTell},
     ErrorText{Error::kQueryWithoutData, "the search daemon answered without data",
@@ -85,9 +86,10 @@ constexpr std::array kErrorTexts = {
               Reason::kLeaveOut},
 };
 
-constexpr ErrorText kIndexerAway = {Error::kSystemCallFailed, "the indexing daemon does not answer",
-                                    "start it with 'service pkg-Quivra-fileindexd start'",
-                                    Reason::kTell};
+constexpr ErrorText kIndexerAway = {
+    Error::kSystemCallFailed, "the indexing daemon does not answer",
+    "run this as root, and start the daemon with 'service pkg-Quivra-fileindexd start'",
+    Reason::kTell};
 
 /// The channel to the indexing daemon shares its code with system calls; its reasons are its own.
 bool IsIndexerAway(const Error& error) {

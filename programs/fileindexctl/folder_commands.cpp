@@ -10,6 +10,7 @@
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/index_mgr.h"
+#include "fileindex/util.h"
 #include "programs/fileindexctl/command_line.h"
 #include "programs/fileindexctl/folder_status.h"
 #include "programs/fileindexctl/output.h"
@@ -171,15 +172,33 @@ int List(const ListOptions& options, Session& session) {
     return kSuccess;
 }
 
+/// A failure behind the save: the folder is gone from the set, so it cannot be deleted again.
+std::string DoingAfterDelete(const std::string& path) {
+    std::string share;
+    std::string root;
+    fileindex::GetShareNameByPath(share, path);
+    fileindex::GetFullPath(root, "/" + share);
+    const std::string rest = fileindex::FolderMgr().IsShareIndexed(share)
+                                 ? "the daemon learns of it at its next start"
+                                 : "'fileindexctl share clear " + share + " " + root +
+                                       "' removes what is left of its index";
+    return "finish deleting " + path + " (it is chosen no longer; " + rest + ")";
+}
+
 int Delete(const Options& options, Session& session) {
     session.doing = "delete " + options.path;
     const std::string path = FolderPath(options.path);
     session.doing = "delete " + path;
     Json::Value folder;
     fileindex::FolderGet(folder, path);
-    {
+    try {
         const Silence silence;
         fileindex::FolderDelete(ListOf(path));
+    } catch (const Error&) {
+        if (!fileindex::FolderMgr().HasFolder(path)) {
+            session.doing = DoingAfterDelete(path);
+        }
+        throw;
     }
     return Report(session, folder, "No longer indexing ");
 }

@@ -132,6 +132,18 @@ TEST_F(FolderTest, DeleteAlsoFindsAFolderWhosePathIsTypedInFull) {
     EXPECT_EQ(Folders().size(), 0U);
 }
 
+TEST_F(FolderTest, ADeletionThatWasCutOffSaysWhatIsLeft) {
+    Piped({"folder", "add", "/photo"});
+    fake::FailNext("MonitorQueue::Delete");
+    const Result result = Piped({"folder", "delete", "/photo"});
+    EXPECT_EQ(result.status, kFailure);
+    EXPECT_NE(result.err.find("share clear photo /volume1/photo'"), std::string::npos)
+        << result.err;
+    EXPECT_EQ(Folders().size(), 0U);
+    EXPECT_EQ(Piped({"share", "clear", "photo", "/volume1/photo"}).status, kSuccess);
+    EXPECT_EQ(search_.Requests().back()["command"], "index_delete");
+}
+
 TEST_F(FolderTest, SharesVolumesAndPauseReachTheLibrary) {
     Piped({"folder", "add", "/photo"});
     struct Row {
