@@ -21,13 +21,16 @@ namespace {
 constexpr const char* kUnit = "share_worker";
 
 /// Held during a pass, so that `--once` and a worker do not take the same working copy.
-quivra::UniqueFd LockShare(const std::string& share) {
+quivra::UniqueFd LockShare(const std::string& share, const std::function<void()>& between) {
     const std::string path = std::string(kRunDirectory) + "/" + share + ".lock";
     quivra::UniqueFd fd(open(path.c_str(), O_RDWR | O_CREAT | O_NOFOLLOW | O_CLOEXEC, 0600));
-    int result = -1;
-    do {
-        result = fd.IsValid() ? flock(fd.Get(), LOCK_EX) : -1;
-    } while (fd.IsValid() && result != 0 && errno == EINTR);
+    int result = fd.IsValid() ? flock(fd.Get(), LOCK_EX) : -1;
+    while (fd.IsValid() && result != 0 && errno == EINTR) {
+        if (between) {
+            between();
+        }
+        result = flock(fd.Get(), LOCK_EX);
+    }
     if (result != 0) {
         quivra::Fail({kUnit, __LINE__}, "flock(fd.Get(), LOCK_EX) != 0",
                      Error(Error::kLockFailed,
@@ -44,12 +47,20 @@ void CheckIndexable(const quivra::sdk::SDKShare& share, const std::string& name)
     }
 }
 
+bool IsSpaceShort(const std::string& share) {
+    try {
+        return !quivra::sdk::SDKShare(share).IsSpaceEnough();
+    } catch (const Error&) {
+        return false;  // the share has gone, which is another matter
+    }
+}
+
 }  // namespace
 
 ShareWorker::ShareWorker(std::string share) : share_(std::move(share)), state_(share_) {}
 
 PassResult ShareWorker::RunPass(const std::function<void()>& between) {
-    const quivra::UniqueFd lock = LockShare(share_);
+    const quivra::UniqueFd lock = LockShare(share_, between);
     try {
         PassResult result = RunLocked(between);
         space_notified_ = false;
@@ -59,8 +70,10 @@ PassResult ShareWorker::RunPass(const std::function<void()>& between) {
         }
         state_.Set(StateFile::State::kIdle);
         return result;
-    } catch (const Error& error) {
-        if (error.code == Error::kSpaceNotEnough && !space_notified_) {
+    } catch (const Stopped&) {
+        throw;
+    } catch (const std::exception& error) {
+        if (!space_notified_ && IsSpaceShort(share_)) {
             space_notified_ = true;
             quivra::fileindex::SendKOSNotify();
         }

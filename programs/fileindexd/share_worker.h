@@ -14,8 +14,8 @@ class ShareWorker {
 
     /// One pass (see Pass::Run), for which the share is looked up and the folder set read afresh.
     /// `between` is called between two operations and may throw Stopped. Waits while another
-    /// process is at work on the share. Throws quivra::Error; administrators have been notified
-    /// when it was for lack of space, once until a pass succeeds again.
+    /// process is at work on the share. Throws what Pass::Run does; administrators have been
+    /// notified when it was for lack of space, once until a pass succeeds again.
     PassResult RunPass(const std::function<void()>& between = {});
 
     StateFile& State() { return state_; }

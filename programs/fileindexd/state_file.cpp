@@ -74,6 +74,9 @@ void MakeRunDirectory() {
 StateFile::StateFile(std::string share) : share_(std::move(share)) {}
 
 void StateFile::Set(State state) {
+    if (state == state_ && !is_new_) {
+        return;
+    }
     state_ = state;
     progress_ = {};
     Write();
@@ -90,10 +93,12 @@ void StateFile::SetProgress(const PassState& progress) {
 }
 
 void StateFile::SetLastPass(std::int64_t seconds_since_epoch) {
+    is_new_ |= last_pass_ != seconds_since_epoch;
     last_pass_ = seconds_since_epoch;
 }
 
 void StateFile::SetLastError(const std::string& error) {
+    is_new_ |= last_error_ != error;
     last_error_ = error;
 }
 
@@ -102,6 +107,7 @@ void StateFile::Remove() {
 }
 
 void StateFile::Write() {
+    is_new_ = false;
     written_ = std::chrono::steady_clock::now();
     Json::Value state;
     state["share"] = share_;

@@ -25,13 +25,15 @@ class StateFile {
     StateFile(const StateFile&) = delete;
     StateFile& operator=(const StateFile&) = delete;
 
-    /// Writes at once.
-    void Set(State state);
-    /// State kProcessing; writes at most once a second.
-    void SetProgress(const PassState& progress);
+    /// Shown with the next Set.
     void SetLastPass(std::int64_t seconds_since_epoch);
     /// Empty when the last pass succeeded.
     void SetLastError(const std::string& error);
+
+    /// Writes at once, unless the file says so already.
+    void Set(State state);
+    /// State kProcessing; writes at most once a second.
+    void SetProgress(const PassState& progress);
     void Remove();
 
   private:
@@ -39,6 +41,7 @@ class StateFile {
 
     const std::string share_;
     State state_ = State::kIdle;
+    bool is_new_ = true;  ///< there is more to tell than the file does
     PassState progress_;
     std::int64_t last_pass_ = 0;
     std::string last_error_;

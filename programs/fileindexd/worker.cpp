@@ -100,15 +100,20 @@ class Worker {
         }
     }
 
+    /// While something is pending, news are not waited for but looked at a few times a second, so
+    /// that a storm of changes does not wake the worker for each.
     void Wait() const {
-        int timeout = -1;
-        if (const auto due = schedule_.Due()) {
-            const auto left =
-                std::chrono::ceil<std::chrono::milliseconds>(*due - Clock::now()).count();
-            timeout = static_cast<int>(std::clamp<std::int64_t>(left, 0, 3600000));
+        pollfd descriptors[] = {{stop_event, POLLIN, 0}, {watch_.Fd(), POLLIN, 0}};
+        const auto due = schedule_.Due();
+        if (!due) {
+            poll(descriptors, 2, -1);
+            return;
         }
-        pollfd descriptors[] = {{watch_.Fd(), POLLIN, 0}, {stop_event, POLLIN, 0}};
-        poll(descriptors, 2, timeout);
+        const auto left = std::chrono::ceil<std::chrono::milliseconds>(*due - Clock::now());
+        const auto longest = schedule_.HasFailed() ? std::chrono::milliseconds(Schedule::kLastRetry)
+                                                   : Schedule::kQuiet;
+        const auto timeout = std::clamp(left, std::chrono::milliseconds(0), longest);
+        poll(descriptors, 1, static_cast<int>(timeout.count()));
     }
 
     void RunPass() {
