@@ -11,6 +11,8 @@
 namespace quivra::ctl {
 namespace {
 
+/// The one place where a failure is worded for the terminal. What an error is about may be hostile,
+/// so that the sentence is escaped even where the output is not.
 int Complain(Session& session, const std::string& sentence, int status) {
     session.err << "fileindexctl: " << EscapeControl(sentence) << "\n";
     return status;
@@ -24,6 +26,7 @@ int AnswerParser(CommandLine& line, Session& session, const CLI::Error& error) {
     return Complain(session, std::string(error.what()) + "; see 'fileindexctl --help'", kWrongCall);
 }
 
+/// Nothing may leave the program as an exception: a script sees a status and a sentence.
 int RunAction(const Action& action, Session& session) {
     try {
         return action(session);

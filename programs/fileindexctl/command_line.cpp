@@ -25,6 +25,7 @@ CommandLine::CommandLine()
           "searches them.",
           "fileindexctl") {
     root_.footer(kExamples);
+    // One command a call, and with it no later word can be taken for a command ("search status").
     root_.require_subcommand(1);
     root_.set_version_flag("--version", "fileindexctl " FILEINDEX_VERSION,
                            "Print the version and exit");
@@ -56,6 +57,7 @@ CLI::App& CommandLine::AddCommand(CLI::App& parent, const std::string& name,
 }
 
 void CommandLine::OnCommand(CLI::App& command, Action action) {
+    // Only remembered here: an exception of the action must not pass through the parser.
     command.callback([this, action = std::move(action)] { chosen_ = action; });
 }
 

@@ -43,7 +43,7 @@ constexpr std::array kErrorTexts = {
               "run the command as root and check the space on the system volume", Reason::kTell},
     ErrorText{Error::kLockFailed, "another program holds the lock for too long",
               "try again later, as root", Reason::kTell},
-    ErrorText{Error::kNoSuchShare, "there is no such share",
+    ErrorText{Error::kNoSuchShare, "no share has that name or holds that path",
               "see 'fileindexctl share list' for the shares of /etc/kesto/shares.conf",
               Reason::kLeaveOut},
     ErrorText{Error::kTooManyFolders, "the limit of 1000 indexed folders is reached",

@@ -8,6 +8,7 @@
 #include <memory>
 #include <ostream>
 
+#include "common/error.h"
 #include "common/json.h"
 #include "common/lock_file.h"
 #include "common/log.h"
@@ -40,10 +41,16 @@ struct Options {
     bool is_dir = false;
 };
 
+/// The share that holds the path: its queue takes the event.
 std::string ShareOf(const std::string& full_path) {
     std::string name;
     std::string root;
-    fileindex::GetShareNamePathByFullPath(name, root, full_path);
+    try {
+        fileindex::GetShareNamePathByFullPath(name, root, full_path);
+    } catch (const Error&) {
+        // Its 502 stands for any system call; here it means one thing.
+        throw Error(Error::kNoSuchShare, full_path);
+    }
     return name;
 }
 
@@ -67,6 +74,7 @@ void AppendLine(const std::string& queue, std::string line) {
     }
 }
 
+/// The line as the file monitor would write it: one bit each, "data" for no kind but settings.
 Json::Value MakeEvent(const Options& options, const std::string& path, const std::string& from) {
     const auto* const kind =
         std::find_if(kKinds.begin(), kKinds.end(),
@@ -78,6 +86,21 @@ Json::Value MakeEvent(const Options& options, const std::string& path, const std
     event["path_old"] = from;
     event["data"] = Json::Value();
     return event;
+}
+
+int Report(Session& session, const std::string& share, const std::string& queue,
+           const Json::Value& event, const std::string& kind) {
+    if (session.json) {
+        Json::Value result(Json::objectValue);
+        result["share"] = share;
+        result["queue"] = queue;
+        result["event"] = event;
+        session.out << toString(result) << "\n";
+    } else {
+        session.out << "Queued for share " << session.Shown(share) << ": " << kind << " "
+                    << session.Shown(event["path"].asString()) << "\n";
+    }
+    return kSuccess;
 }
 
 int Add(const Options& options, Session& session) {
@@ -95,21 +118,12 @@ int Add(const Options& options, Session& session) {
     }
     const std::string queue = sdk::SDKShare(share).GetQueuePath();
     const Json::Value event = MakeEvent(options, path, from);
+    // Held for the append alone: the indexer waits for it before it takes the queue away.
     {
         const LockFile lock(queue, true);
         AppendLine(queue, toString(event));
     }
-    if (session.json) {
-        Json::Value result(Json::objectValue);
-        result["share"] = share;
-        result["queue"] = queue;
-        result["event"] = event;
-        session.out << toString(result) << "\n";
-    } else {
-        session.out << "Queued for share " << session.Shown(share) << ": " << options.kind << " "
-                    << session.Shown(path) << "\n";
-    }
-    return kSuccess;
+    return Report(session, share, queue, event, options.kind);
 }
 
 }  // namespace

@@ -35,12 +35,14 @@ struct ListOptions {
     std::string sort = "name";
 };
 
+/// The library takes lists; one command line changes one folder.
 Json::Value ListOf(const Json::Value& element) {
     Json::Value list(Json::arrayValue);
     list.append(element);
     return list;
 }
 
+/// Changes what the command line names and leaves the rest.
 void Apply(Json::Value& folder, const Options& options) {
     for (std::size_t i = 0; i < kSwitches.size(); ++i) {
         if (options.switches[i]) {
@@ -136,6 +138,7 @@ int Get(const Options& options, Session& session) {
     return kSuccess;
 }
 
+/// The table goes to the output and the notes beside it, so that the table can be processed.
 void PrintList(const Json::Value& list, Session& session) {
     std::vector<std::vector<std::string>> rows = {{"PATH", "NAME", "CONTENT", "STATUS"}};
     for (const Json::Value& folder : list["folder"]) {
@@ -228,6 +231,7 @@ std::string Capital(std::string text) {
 
 using Command = int (*)(const Options&, Session&);
 
+/// The commands on one folder differ in little but what they do with it.
 std::shared_ptr<Options> AddFolderCommand(CommandLine& line, CLI::App& group,
                                           const std::string& name, const std::string& description,
                                           const std::string& examples, Command command,

@@ -32,6 +32,7 @@ int DescriptorBuffer::sync() {
     if (error_ == 0 && !WriteAll(fd_, pbase(), static_cast<std::size_t>(pptr() - pbase()))) {
         error_ = errno;
     }
+    // Also after a failure: a buffer that stays full would be written again and again.
     setp(buffer_.data(), buffer_.data() + buffer_.size());
     return error_ == 0 ? 0 : -1;
 }

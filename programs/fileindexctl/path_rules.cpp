@@ -26,6 +26,7 @@ Finding Failed(const std::string& detail, const std::string& remedy = std::strin
     return {"", false, detail, remedy};
 }
 
+/// No rule of the library, but what the others would report as something else.
 Finding Exists(const Place& place) {
     struct stat status {};
     if (lstat(place.full_path.c_str(), &status) != 0) {
@@ -78,6 +79,7 @@ Finding NotInRecycleBin(const Place& place) {
                : Passed("no");
 }
 
+/// Only an encrypted share is itself a mount point, once unlocked.
 Finding NoStrayMountPoint(const Place& place) {
     if (!IsMountPoint(place.full_path)) {
         return Passed("no");
@@ -87,6 +89,7 @@ Finding NoStrayMountPoint(const Place& place) {
                : Failed("something else is mounted there", "index it as a share of its own");
 }
 
+/// The index knows each object by one path, the one without links.
 Finding ReachedDirectly(const Place& place) {
     const std::unique_ptr<char, void (*)(void*)> resolved(
         realpath(place.full_path.c_str(), nullptr), std::free);

@@ -27,6 +27,7 @@ std::string MadeAbsolute(const std::string& path) {
     return path[0] == '/' ? path : std::filesystem::current_path().native() + "/" + path;
 }
 
+/// False for a path that lies in no share.
 bool FindFullPath(Place& place, const std::string& path) {
     std::string root;
     try {
@@ -59,6 +60,7 @@ Place FindPlace(const std::string& path) {
     if (path[0] != '/') {
         throw Error(Error::kNoSuchShare, absolute);
     }
+    // Not below any root, so its first component can only be the name of a share.
     place.share_path = absolute;
     fileindex::GetShareNameByPath(place.share, absolute);
     fileindex::GetFullPath(place.full_path, absolute);

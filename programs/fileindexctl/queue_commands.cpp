@@ -47,6 +47,7 @@ int ShowAsJson(fileindex::OPTree& queue, Session& session) {
     return kSuccess;
 }
 
+/// What the library itself prints of an operation, so that log and front end read alike.
 int ShowAsText(fileindex::OPTree& queue, Session& session) {
     const int consumed = queue.ProcessOP([&session](std::shared_ptr<OP> op) {
         std::ostringstream printed;

@@ -48,6 +48,7 @@ SortOrder ParseSort(const std::string& sort) {
     return {name == "name" ? "KESTOMDFSName" : field.name, descending};
 }
 
+/// People see paths and one line, so the daemon need not send more; programs get all fields.
 Json::Value MakeRequest(const Json::Value& qsl, const Options& options, const SortOrder& order,
                         bool json) {
     Json::Value request(Json::objectValue);
@@ -124,6 +125,7 @@ void PrintJson(const SearchResults& results, const Options& options, Session& se
     session.out << toString(document) << "\n";
 }
 
+/// To the error stream: what a script reads from the output is hits alone.
 void TellAbout(const SearchResults& results, const Options& options, Session& session) {
     for (const std::string& failure : results.failures) {
         session.err << "fileindexctl: " << EscapeControl(failure) << "\n";
@@ -169,6 +171,7 @@ int SearchCommand(Options options, const std::vector<std::string>& words, Sessio
 
 }  // namespace
 
+// The parser would read "-draft" as a row of short options and split "[2024]" at its commas.
 std::vector<std::string> TakeSearchWords(CommandLine& line,
                                          const std::vector<std::string>& arguments) {
     if (arguments.empty() || arguments[0] != "search") {

@@ -61,6 +61,7 @@ Json::Value Clause(const char* form, const std::string& field, const Json::Value
     return clause;
 }
 
+/// A number with an optional unit, the powers of 1024. Nothing for anything else.
 std::optional<double> ParseSize(std::string_view text) {
     double factor = 1;
     const std::size_t unit = text.empty()
@@ -149,6 +150,7 @@ Json::Value RangeClause(const Field& field, const std::string& value) {
     return Clause("range", field.name, range);
 }
 
+/// A word matches as a whole anywhere, or as a part of the file name.
 Json::Value AnywhereClause(const std::string& text) {
     Json::Value clause(Json::objectValue);
     clause["any"].append(Clause("match", "_all", text));
@@ -156,6 +158,7 @@ Json::Value AnywhereClause(const std::string& text) {
     return clause;
 }
 
+/// Exact fields hold one term each; extensions are kept in lower case.
 Json::Value FieldClause(const Field& field, const std::string& value) {
     switch (field.kind) {
         case FieldKind::kText:
@@ -209,6 +212,7 @@ std::vector<Word> SplitWords(const std::string& argument) {
     return words;
 }
 
+/// A colon makes a field only where the field is known, so that "http://x" stays a word.
 Json::Value WordClause(const Word& word) {
     Field field;
     Json::Value clause;

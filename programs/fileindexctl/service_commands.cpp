@@ -22,6 +22,7 @@ int LongestPause() {
     return static_cast<int>(left / kSecondsPerHour);
 }
 
+/// Tells the state that was reached, in local time.
 void PrintPause(Session& session, std::int64_t resume_time) {
     if (session.json) {
         Json::Value result(Json::objectValue);

@@ -103,6 +103,7 @@ void NeedsFoldersBelow(const std::string& mount_point) {
                   " has no indexed folder; see 'fileindexctl status' for those that have");
 }
 
+/// Without one the library would report success and do nothing.
 void NeedsFoldersToClean(const std::string& mount_point) {
     const fileindex::FolderMgr folders;
     for (const auto& folder : folders.GetFolders()) {
@@ -113,6 +114,7 @@ void NeedsFoldersToClean(const std::string& mount_point) {
     throw Failure("volume " + mount_point + " has no paused folder that waits to be cleared");
 }
 
+/// A share whose flags cannot be read is listed with the reason, not left out.
 Json::Value DescribeShare(const std::string& name, const fileindex::FolderMgr& folders) {
     Json::Value result(Json::objectValue);
     const sdk::SDKShare share(name);

@@ -59,6 +59,8 @@ std::uint64_t Count(const Json::Value& value) {
     return value.isUInt64() ? value.asUInt64() : 0;
 }
 
+/// The state file is replaced atomically but outlives a worker that was killed: only while its
+/// process exists does it count. Members of the wrong type count as missing.
 WorkerStatus ReadWorkerStatus(const std::string& share) {
     WorkerStatus worker;
     Json::Value state;
@@ -79,6 +81,7 @@ WorkerStatus ReadWorkerStatus(const std::string& share) {
     return worker;
 }
 
+/// Counted by path, not by "everything": both forms are answered from one term of the index.
 std::int64_t CountDocuments(const std::string& share, const std::string& root) {
     Json::Value own(Json::objectValue);
     own["term"]["KESTOMDPath"] = root;
@@ -95,6 +98,7 @@ std::int64_t CountDocuments(const std::string& share, const std::string& root) {
     return total;
 }
 
+/// Every part is tried on its own account: a daemon or a share that is away hides no other line.
 ShareLine TakeShareLine(const std::string& name, bool elastic_answers) {
     ShareLine status;
     status.name = name;

@@ -29,6 +29,7 @@ std::string Number(std::uint64_t value, const char* one, const char* many) {
     return std::to_string(value) + " " + (value == 1 ? one : many);
 }
 
+/// The bar is for eyes; a program finds the two numbers.
 std::string Progress(const WorkerStatus& worker, const Session& session) {
     const std::string counts = std::to_string(worker.done) + " of " + std::to_string(worker.total);
     if (!session.out_is_terminal || worker.total == 0) {
@@ -71,6 +72,7 @@ void PrintFolders(const Status& status, Session& session) {
     PrintTable(session, rows);
 }
 
+/// What stops the whole system comes first.
 void PrintDaemons(const Status& status, Session& session) {
     if (!status.elastic_answers) {
         session.out << "kestoelasticd does not answer: nothing can be found until it runs.\n";
@@ -102,6 +104,7 @@ void PrintStatus(const Status& status, Session& session) {
     }
 }
 
+/// The frame as text, so that the screen knows its lines before it draws.
 std::string Rendered(const Status& status, const Session& session) {
     std::ostringstream text;
     if (session.json) {

@@ -30,6 +30,7 @@ struct Answer {
     Json::Value AsJson() const { return yes ? Json::Value(*yes) : Json::Value(); }
 };
 
+/// A daemon that is away, or a damaged queue, makes one answer unknown and leaves the others.
 template <typename Question>
 Answer Ask(Question question) {
     try {
@@ -50,6 +51,7 @@ struct Report {
     Answer in_index;
 };
 
+/// A reindex of an ancestor covers the path without naming it.
 bool IsPending(const Place& place) {
     const fileindex::QueueMgr queue(sdk::SDKShare(place.share).GetQueuePath());
     return queue.IsFullPathProcessing(place.full_path) ||
@@ -70,6 +72,8 @@ bool IsPausedNow() {
     return resume_time == fileindex::kPausedWithoutEnd || std::time(nullptr) < resume_time;
 }
 
+/// Every question is asked even when a rule has failed: the index may still hold what it should
+/// not, and the queue tell why.
 Report Examine(const Place& place) {
     Report report;
     report.place = place;
@@ -89,6 +93,7 @@ std::string WithRemedy(const std::string& text, const std::string& remedy) {
     return text + (remedy.empty() ? "" : "; " + remedy) + ".";
 }
 
+/// Empty when nothing stands against indexing.
 std::string VerdictOfRules(const Report& report) {
     const Finding& last = report.findings.back();
     if (!last.passed) {

@@ -83,6 +83,7 @@ TEST_F(EventAddTest, PathsOutsideTheShareAreRefused) {
     const Result outside = Piped({"event", "add", "/etc/passwd", "--kind", "modify"});
     EXPECT_EQ(outside.status, kFailure);
     EXPECT_NE(outside.err.find("/etc/passwd"), std::string::npos);
+    EXPECT_NE(outside.err.find("[800]"), std::string::npos) << outside.err;
     EXPECT_EQ(Piped({"event", "add", "/volume1/s/a", "--kind", "rename", "--from", "/volume1/t/a"})
                   .status,
               kFailure);

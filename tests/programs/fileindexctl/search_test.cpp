@@ -120,7 +120,8 @@ TEST_F(SearchTest, SharesAreMergedByTheirOrder) {
         R"([{"KESTOMDPath": "a9", "KESTOMDFSSize": 9}, {"KESTOMDPath": "a3", "KESTOMDFSSize": 3},
                  {"KESTOMDPath": "a"}])");
     Put("b",
-        R"([{"KESTOMDPath": "b10", "KESTOMDFSSize": 10}, {"KESTOMDPath": "b5", "KESTOMDFSSize": 5}])");
+        R"([{"KESTOMDPath": "b10", "KESTOMDFSSize": 10},
+                 {"KESTOMDPath": "b5", "KESTOMDFSSize": 5}])");
     Put("c", "[]");
     EXPECT_EQ(Piped({"search", "x", "--sort", "-size"}).out, "b10\na9\nb5\na3\na\n");
     EXPECT_EQ(LastQuery()["sort"], Parse(R"([{"field": "KESTOMDFSSize", "order": "desc"}])"));
