@@ -22,6 +22,9 @@ constexpr const char* kUnit = "pass";
 /// How much older than its event, in seconds, a change may be: the monitor may lag behind.
 constexpr std::int64_t kMonitorLag = 2;
 
+/// With more changes than this at once, none is the one of a file that is too busy.
+constexpr std::size_t kMaxChanged = 1000;
+
 ContentClasses ClassesOf(const Json::Value& settings) {
     ContentClasses classes;
     quivra::GetJsonValue(classes.document, settings, "document", false);
@@ -71,11 +74,7 @@ PassResult Pass::Run() {
     batch_->Commit();
     tree.CheckMounted();
 
-    for (const auto& op : singles_) {
-        if (op->op == quivra::fileindex::OP_UPSERT) {
-            result.changed.push_back(op->node->GetPath());
-        }
-    }
+    result.changed = ChangedFiles();
     result.counts = batch_->GetCounts();
     if (queue.DeleteTmp() != 0 && errno != ENOENT) {
         const std::string reason = "The working copy cannot be deleted: " + queue_path_ + ".tmp";
@@ -84,6 +83,18 @@ PassResult Pass::Run() {
     }
     progress_->Remove();
     return result;
+}
+
+std::vector<std::string> Pass::ChangedFiles() const {
+    std::vector<std::string> changed;
+    if (singles_.size() <= kMaxChanged) {
+        for (const auto& op : singles_) {
+            if (op->op == quivra::fileindex::OP_UPSERT) {
+                changed.push_back(op->node->GetPath());
+            }
+        }
+    }
+    return changed;
 }
 
 void Pass::CheckShare(const ShareTree& tree) const {

@@ -16,7 +16,7 @@ struct PassResult {
     bool had_work = false;  ///< there was a queue or a working copy
     int consumed = 0;       ///< queue entries
     Counts counts;
-    std::vector<std::string> changed;  ///< the files that the queue named as changed
+    std::vector<std::string> changed;  ///< files that the queue named, unless they were many
 };
 
 /// One pass over a share's queue: carries out what the queue holds, or what an interrupted pass
@@ -46,6 +46,7 @@ class Pass {
     };
 
     void Sort(const std::vector<std::shared_ptr<quivra::fileindex::OP>>& ops);
+    std::vector<std::string> ChangedFiles() const;
     void CheckShare(const ShareTree& tree) const;
     bool HasDocuments(const std::string& path) const;
     void RunRenames(const ShareTree& tree);

@@ -98,13 +98,18 @@ bool StayValid(const Rename& rename, bool is_dir, const ShareTree& tree, const S
            quivra::GetFileExtension(rename.from, true) == quivra::GetFileExtension(rename.to, true);
 }
 
+/// Whether the object, or of a directory something in it, is to be indexed.
+bool IsCovered(const std::string& path, bool is_dir, const Scope& scope) {
+    return is_dir ? !scope.RootsWithin(path).empty() : scope.Covers(path, false);
+}
+
 /// The last word on a plan, now that the disk is looked at.
 void CheckPlan(Rename& rename, Batch& batch, const ShareTree& tree, const Scope& scope) {
     std::optional<Attributes> there;
     if (rename.plan != Rename::Plan::kMove) {
         return;
     }
-    if (!batch.Look(there, rename.to) || !there || !scope.Covers(rename.to, there->is_dir)) {
+    if (!batch.Look(there, rename.to) || !there || !IsCovered(rename.to, there->is_dir, scope)) {
         rename.plan = Rename::Plan::kNone;  // settling both ends will do
     } else if (!StayValid(rename, there->is_dir, tree, scope)) {
         rename.plan = Rename::Plan::kReplace;

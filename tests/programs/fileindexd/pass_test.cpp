@@ -42,20 +42,26 @@ namespace {
 using quivra::Error;
 using namespace quivra::fileindex;
 
-/// The rules of a test: what lies below one of `excluded` is not indexed, what lies below one of
-/// `without_meta` without content.
+/// The rules of a test: what lies below one of `excluded`, or not below `only`, is not indexed,
+/// what lies below one of `without_meta` without content.
 class TestScope : public Scope {
   public:
-    bool Covers(const std::string& path, bool) const override { return !IsIn(path, excluded); }
+    bool Covers(const std::string& path, bool) const override {
+        return !IsIn(path, excluded) && IsAtOrBelow(path, only);
+    }
     bool NeedsMeta(const std::string& path) const override { return !IsIn(path, without_meta); }
     std::vector<std::string> RootsWithin(const std::string& path) const override {
-        return IsIn(path, excluded) ? std::vector<std::string>{} : std::vector{path};
+        if (Covers(path, true)) {
+            return {path};
+        }
+        return IsBelow(only, path) ? std::vector{only} : std::vector<std::string>{};
     }
     bool HaveSameRules(const std::string& one, const std::string& other) const override {
         return IsIn(one, excluded) == IsIn(other, excluded) &&
                IsIn(one, without_meta) == IsIn(other, without_meta);
     }
 
+    std::string only = "/volume1";
     std::set<std::string> excluded;
     std::set<std::string> without_meta;
 
@@ -283,6 +289,30 @@ TEST_F(PassTest, WhatLeavesTheScopeIsDroppedAndWhatEntersIsWalked) {
     Queue(EVENT_UPDATE_CFG, "/out");
     Run();
     EXPECT_EQ(index_.Committed(), Expected());
+}
+
+TEST_F(PassTest, ARenamedShareTakesItsDocumentsAlong) {
+    Put("/in/d/f.txt", "text");
+    Put("/out/g.txt", "text");
+    age_of_files = 1000;
+    scope_.only = Full("/in");
+    IndexAll();
+    const std::string renamed = "/volume1/renamed";
+    fs::remove_all(renamed);
+    fs::rename(root_, renamed);
+    scope_.only = renamed + "/in";
+    const std::string queue = renamed + "/@eaDir/fileindex/queue";
+    std::ofstream(queue) << R"({"event":256,"is_dir":true,"path":"/volume1/renamed",)"
+                         << R"("path_old":"/volume1/share"})"
+                         << "\n";
+    Pass(queue, renamed, index_, scope_, {}).Run();
+    FakeIndex::Documents expected;
+    for (const char* path : {"/in", "/in/d", "/in/d/f.txt"}) {
+        expected[renamed + path] = Extract(renamed + path, true);
+    }
+    EXPECT_EQ(index_.Committed(), expected);
+    EXPECT_EQ(index_.extracted, 0);
+    fs::remove_all(renamed);
 }
 
 TEST_F(PassTest, LinksMountsAndPreservedNamesAreNoFiles) {
