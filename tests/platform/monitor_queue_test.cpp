@@ -1,6 +1,8 @@
 #include <kesto/monitor_queue.h>
+#include <sys/resource.h>
 
 #include <cerrno>
+#include <csignal>
 #include <set>
 
 #include "tests/platform/platform_test.h"
@@ -9,6 +11,7 @@ namespace {
 
 using namespace platform_test;
 using KESTO::KESTOTIFYD::MonitorQueue;
+using Set = std::multiset<std::string>;
 
 class MonitorQueueTest : public PlatformTest {
   protected:
@@ -21,17 +24,15 @@ class MonitorQueueTest : public PlatformTest {
         description["config"]["path"].append(path);
         return MonitorQueue::Upsert(MonitorQueue(description), app, MONITOR_QUEUE_TYPE_APPLICATION);
     }
-    static bool Delete(const std::string& queue, const std::string& app = "fileindex") {
-        return MonitorQueue::Delete(queue, app, MONITOR_QUEUE_TYPE_APPLICATION);
+    static bool Delete(const std::string& queue) {
+        return MonitorQueue::Delete(queue, "fileindex", MONITOR_QUEUE_TYPE_APPLICATION);
     }
-    /// "QUEUE|APP|PATH" of every registration on disk.
-    static std::multiset<std::string> Registered() {
-        std::multiset<std::string> found;
+    /// "QUEUE|APP|PATH" of every registration on disk, where nothing else may be.
+    static Set Registered() {
+        Set found;
         for (const auto& entry : std::filesystem::directory_iterator(KESTO_MONITOR_DIRECTORY)) {
-            EXPECT_EQ(entry.path().extension(), ".json");
             Json::Value value;
-            EXPECT_TRUE(Json::Reader().parse(ReadFile(entry.path()), value));
-            EXPECT_EQ(value["type"].asInt(), 1);
+            EXPECT_TRUE(Json::Reader().parse(ReadFile(entry.path()), value)) << entry;
             found.insert(value["queue"].asString() + "|" + value["app"].asString() + "|" +
                          value["config"]["path"][0].asString());
         }
@@ -40,51 +41,40 @@ class MonitorQueueTest : public PlatformTest {
 };
 
 TEST_F(MonitorQueueTest, OneRegistrationPerQueueAndApplication) {
-    using Set = std::multiset<std::string>;
+    const std::string common = "/volume1/" + std::string(4000, 'x');
+    const std::string queues[] = {"/v/a%2Fqueue", "/v/\xff\n/queue", common + "a", common + "b"};
     errno = 0;
     EXPECT_TRUE(Delete("/v/a/queue"));  // before the directory exists
     EXPECT_TRUE(Upsert("/v/a/queue", "/v/a/1"));
-    EXPECT_EQ(ModeOf(KESTO_MONITOR_DIRECTORY), 0700U);
     EXPECT_TRUE(Upsert("/v/a/queue", "/v/a/2"));
     EXPECT_TRUE(Upsert("/v/a/queue", "/v/a/3", "other"));
-    EXPECT_TRUE(Upsert("/v/a%2Fqueue", "/v/a/4"));
-    EXPECT_TRUE(Upsert("/v/\xff\n/queue", "/v/\xff"));
-    EXPECT_EQ(errno, 0);
-    EXPECT_EQ(Registered(),
-              (Set{"/v/a/queue|fileindex|/v/a/2", "/v/a/queue|other|/v/a/3",
-                   "/v/a%2Fqueue|fileindex|/v/a/4", "/v/\xff\n/queue|fileindex|/v/\xff"}));
-    EXPECT_TRUE(Delete("/v/a/queue"));
-    EXPECT_TRUE(Delete("/v/a/queue"));
-    EXPECT_TRUE(Delete("/v/a%2Fqueue"));
-    EXPECT_TRUE(Delete("/v/\xff\n/queue"));
-    EXPECT_EQ(errno, 0);
-    EXPECT_EQ(Registered(), Set{"/v/a/queue|other|/v/a/3"});
-}
-
-TEST_F(MonitorQueueTest, LongQueuePathsStayApart) {
-    const std::string common = "/volume1/" + std::string(4000, 'x');
-    EXPECT_TRUE(Upsert(common + "a", "/a"));
-    EXPECT_TRUE(Upsert(common + "b", "/b"));
-    EXPECT_EQ(Registered().size(), 2U);
-    EXPECT_TRUE(Delete(common + "a"));
-    EXPECT_EQ(Registered(), std::multiset<std::string>{common + "b|fileindex|/b"});
-}
-
-TEST_F(MonitorQueueTest, RefusesDescriptionsThatDescribeNothing) {
-    for (const char* text : {"null", "[]", "{}", "{\"queue\": 1, \"config\": {}}",
-                             "{\"queue\": \"/q\"}", "{\"queue\": \"/q\", \"config\": []}"}) {
-        Json::Value description;
-        Json::Reader().parse(std::string("{\"v\": ") + text + "}", description);
-        errno = 0;
-        EXPECT_FALSE(MonitorQueue::Upsert(MonitorQueue(description["v"]), "fileindex",
-                                          MONITOR_QUEUE_TYPE_APPLICATION))
-            << text;
-        EXPECT_EQ(errno, EINVAL);
+    EXPECT_EQ(ModeOf(KESTO_MONITOR_DIRECTORY), 0700U);
+    Set expected{"/v/a/queue|fileindex|/v/a/2", "/v/a/queue|other|/v/a/3"};
+    for (const std::string& queue : queues) {
+        EXPECT_TRUE(Upsert(queue, "/v/\xff"));
+        expected.insert(queue + "|fileindex|/v/\xff");
     }
-    EXPECT_FALSE(std::filesystem::exists("/var/lib/kesto"));
-    WriteFile(KESTO_MONITOR_DIRECTORY, "in the way");
-    EXPECT_FALSE(Upsert("/q", "/p"));
-    EXPECT_EQ(errno, ENOTDIR);
+    EXPECT_EQ(Registered(), expected);
+    for (const std::string& queue : queues) {
+        EXPECT_TRUE(Delete(queue));
+        expected.erase(queue + "|fileindex|/v/\xff");
+        EXPECT_EQ(Registered(), expected);
+    }
+    EXPECT_EQ(errno, 0);
+}
+
+TEST_F(MonitorQueueTest, FailedUpsertLeavesTheOldRegistration) {
+    EXPECT_TRUE(Upsert("/q", "/old"));
+    rlimit old_limit{};
+    getrlimit(RLIMIT_FSIZE, &old_limit);
+    const auto old_handler = std::signal(SIGXFSZ, SIG_IGN);
+    const rlimit limit{10, old_limit.rlim_max};
+    setrlimit(RLIMIT_FSIZE, &limit);
+    EXPECT_FALSE(Upsert("/q", "/new"));
+    EXPECT_EQ(errno, EFBIG);
+    setrlimit(RLIMIT_FSIZE, &old_limit);
+    std::signal(SIGXFSZ, old_handler);
+    EXPECT_EQ(Registered(), Set{"/q|fileindex|/old"});
 }
 
 }  // namespace
