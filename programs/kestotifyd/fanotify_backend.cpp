@@ -8,6 +8,8 @@
 
 #include <array>
 #include <cerrno>
+#include <cstddef>
+#include <cstdint>
 #include <cstring>
 #include <utility>
 
@@ -36,16 +38,23 @@ std::string FileSystemOf(int fd) {
     return std::string(reinterpret_cast<const char*>(&status.f_fsid), sizeof(status.f_fsid));
 }
 
+/// A structure of the kernel's at any address: events follow each other at multiples of four bytes
+/// only.
+template <typename T>
+T Load(const char* bytes) {
+    T value;
+    std::memcpy(&value, bytes, sizeof(value));
+    return value;
+}
+
 /// Reads one information record of an event.
-void ReadRecord(const fanotify_event_info_header& header, FanotifyEvent& event) {
-    const auto& record = reinterpret_cast<const fanotify_event_info_fid&>(header);
-    const auto* const bytes = reinterpret_cast<const char*>(record.handle);
-    file_handle handle{};
-    std::memcpy(&handle, bytes, sizeof(handle));
-    const std::size_t size = sizeof(handle) + handle.handle_bytes;
+void ReadRecord(const char* record, std::uint8_t type, FanotifyEvent& event) {
+    const char* const bytes = record + offsetof(fanotify_event_info_fid, handle);
+    const std::size_t size = sizeof(file_handle) + Load<file_handle>(bytes).handle_bytes;
     const std::string key(bytes, size);
-    event.file_system.assign(reinterpret_cast<const char*>(&record.fsid), sizeof(record.fsid));
-    switch (header.info_type) {
+    event.file_system.assign(record + offsetof(fanotify_event_info_fid, fsid),
+                             sizeof(fanotify_event_info_fid::fsid));
+    switch (type) {
         case FAN_EVENT_INFO_TYPE_FID:
             event.target = key;
             break;
@@ -63,13 +72,12 @@ void ReadRecord(const fanotify_event_info_header& header, FanotifyEvent& event) 
     }
 }
 
-FanotifyEvent ReadEvent(const fanotify_event_metadata& metadata) {
+FanotifyEvent ReadEvent(const char* begin, const fanotify_event_metadata& metadata) {
     FanotifyEvent event;
     event.mask = metadata.mask;
-    const auto* const begin = reinterpret_cast<const char*>(&metadata);
     for (std::size_t at = metadata.metadata_len; at < metadata.event_len;) {
-        const auto& header = *reinterpret_cast<const fanotify_event_info_header*>(begin + at);
-        ReadRecord(header, event);
+        const auto header = Load<fanotify_event_info_header>(begin + at);
+        ReadRecord(begin + at, header.info_type, event);
         at += header.len;
     }
     return event;
@@ -171,19 +179,20 @@ void FanotifyBackend::CompleteRoots() {
 
 /// True when no event was left.
 bool FanotifyBackend::ReadEvents() {
-    alignas(fanotify_event_metadata) std::array<char, 65536> buffer;
+    std::array<char, 65536> buffer;
     for (int reads = 0; reads < kMaxReads; ++reads) {
-        ssize_t size = read(group_.Get(), buffer.data(), buffer.size());
+        const ssize_t size = read(group_.Get(), buffer.data(), buffer.size());
         if (size <= 0) {
             return true;
         }
-        const auto* metadata = reinterpret_cast<const fanotify_event_metadata*>(buffer.data());
-        for (; FAN_EVENT_OK(metadata, size); metadata = FAN_EVENT_NEXT(metadata, size)) {
-            if ((metadata->mask & FAN_Q_OVERFLOW) != 0) {
+        for (const char* at = buffer.data(); at < buffer.data() + size;) {
+            const auto metadata = Load<fanotify_event_metadata>(at);
+            if ((metadata.mask & FAN_Q_OVERFLOW) != 0) {
                 HandleOverflow();
-            } else if (metadata->pid != getpid()) {
-                Handle(ReadEvent(*metadata));
+            } else if (metadata.pid != getpid()) {
+                Handle(ReadEvent(at, metadata));
             }
+            at += metadata.event_len;
         }
     }
     return false;
