@@ -43,15 +43,20 @@ void Settler::SettleMoved(const std::string& path) {
         return;
     }
     const std::vector<Document> found = index_.Find({path});
-    const bool same = !found.empty() && !found.front().attributes.is_dir &&
-                      found.front().attributes.size == there->size &&
-                      found.front().attributes.modified == there->modified;
+    const bool same = !found.empty() && IsSameContent(found.front().attributes, *there);
     batch_.DropBelow(path);
     if (same) {
         batch_.Refresh(path, false);
     } else {
         batch_.Upsert(path, false);
     }
+}
+
+/// Whether a document that was moved is the file's. An earlier pass may already have seen, at the
+/// old place, what came there after the rename: such a document is a young one.
+bool Settler::IsSameContent(const Attributes& moved, const Attributes& there) const {
+    return !moved.is_dir && moved.size == there.size && moved.modified == there.modified &&
+           std::max(moved.modified, moved.changed) < fresh_since_;
 }
 
 void Settler::SettleThere(const std::string& path, const Attributes& there) {

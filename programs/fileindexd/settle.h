@@ -27,7 +27,7 @@ class Settler {
     void Settle(const std::string& path, const ContentClasses& again = {});
 
     /// The same for a path whose documents were just moved there: a file of the same size and
-    /// modification time only gets its new attributes.
+    /// modification time, which has not changed lately, only gets its new attributes.
     void SettleMoved(const std::string& path);
 
     /// The file has been indexed in this pass: once is enough.
@@ -39,6 +39,7 @@ class Settler {
         Attributes attributes;
     };
 
+    bool IsSameContent(const Attributes& moved, const Attributes& there) const;
     void SettleThere(const std::string& path, const Attributes& there);
     void DropStale(const std::string& path);
     void DropIfStale(const Document& document);

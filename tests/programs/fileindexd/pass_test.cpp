@@ -252,6 +252,24 @@ TEST_F(PassTest, ChangesHiddenByAReindexWithinOneSecondAreSeen) {
     EXPECT_EQ(index_.Committed(), Expected());
 }
 
+// The first pass sees what the second one's events are about.
+TEST_F(PassTest, ADocumentOfALaterObjectIsNotMovedAlong) {
+    Put("/a", "one");
+    Put("/d/x", "one");
+    IndexAll();
+    Queue(EVENT_MODIFY, "/a");
+    Queue(EVENT_MODIFY, "/d/x");
+    fs::rename(queue_, queue_ + ".tmp");
+    Move("/a", "/b");
+    Write("/a", "two");
+    Move("/d", "/e");
+    Mkdir("/d");
+    Write("/d/x", "two");
+    Run();
+    Run();
+    EXPECT_EQ(index_.Committed(), Expected());
+}
+
 TEST_F(PassTest, AFileThatIsIndexedForItselfIsNotExtractedTwice) {
     Mkdir("/d");
     Write("/d/f.txt", "text");
