@@ -3,6 +3,7 @@
 #include <sys/un.h>
 
 #include <cerrno>
+#include <csignal>
 #include <cstdint>
 #include <cstring>
 #include <thread>
@@ -71,8 +72,12 @@ TEST_F(DaemonSocketTest, SendsWholeFramesAndSurvivesAHangUp) {
     reader.join();
     EXPECT_TRUE(received == Frame(3U << 20, large));
     close(peer);
-    EXPECT_FALSE(connection_.Send(large));  // and no SIGPIPE
+    static volatile std::sig_atomic_t broken_pipes = 0;
+    const auto old_handler = std::signal(SIGPIPE, [](int /*signal*/) { broken_pipes = 1; });
+    EXPECT_FALSE(connection_.Send(large));
     EXPECT_EQ(errno, EPIPE);
+    EXPECT_EQ(broken_pipes, 0);
+    std::signal(SIGPIPE, old_handler);
     EXPECT_FALSE(DomainSockConnection("/volume1/none").Connect());
     EXPECT_FALSE(DomainSockConnection("/" + std::string(200, 'x')).Connect());
     EXPECT_EQ(errno, ENAMETOOLONG);
