@@ -26,6 +26,11 @@ if(FILEINDEX_SANITIZE)
                         -fno-sanitize-recover=all)
     add_link_options(-fsanitize=${FILEINDEX_SANITIZE})
 endif()
+if(FILEINDEX_BUILD_FUZZ)
+    # Without it in the code under test, the fuzzers would not see which inputs reach new places.
+    add_compile_options(-fsanitize=fuzzer-no-link)
+    add_link_options(-fsanitize=fuzzer-no-link)
+endif()
 
 # Headers are included from the repository root ("common/error.h") and the platform's as
 # <kesto/...>.

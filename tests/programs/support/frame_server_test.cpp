@@ -92,9 +92,9 @@ TEST(FrameServer, ServesManyClientsAtOnce) {
     std::vector<std::jthread> clients;
     for (int client = 0; client < 8; ++client) {
         clients.emplace_back([client] {
-            for (int round = 0; round < 100; ++round) {
+            for (unsigned int round = 0; round < 100; ++round) {
                 // Some requests and replies are larger than any socket buffer.
-                const std::string text(round % 25 == 0 ? 4 << 20 : 10 + round,
+                const std::string text(round % 25 == 0 ? 4U << 20 : 10 + round,
                                        static_cast<char>('a' + client));
                 EXPECT_TRUE(Ask(text) == "echo " + text);
             }
