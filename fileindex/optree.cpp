@@ -227,10 +227,8 @@ void OPTree::HandleRename(const NodePtr& node, const OPPtr& op) {
         }
     }
     const FileIndexOP work = TakeOverWork(*old_node);
-    if (old_node != node) {
-        MoveOPs(*old_node, node, [](const OP&) { return true; });
-        MoveDescendants(old_node, op->path.size(), node->GetPath(), *op);
-    }
+    MoveOPs(*old_node, node, [](const OP&) { return true; });
+    MoveDescendants(old_node, op->path.size(), node->GetPath(), *op);
     Attach(node, op);
     if (work != OP_NONE) {
         Attach(node, std::make_shared<OP>(node, work, std::string(), Json::Value()));
@@ -299,12 +297,15 @@ template <typename Predicate>
 void OPTree::MoveOPs(OPNode& from, const NodePtr& to, const Predicate& moves) {
     const auto stays = [&](const OPPtr& op) { return !moves(*op); };
     const auto first = std::stable_partition(from.ops.begin(), from.ops.end(), stays);
+    from.settled_ = 0;
+    if (&from == to.get()) {
+        return;  // a rename onto itself: what moves is behind what stays now
+    }
     for (auto op = first; op != from.ops.end(); ++op) {
         (*op)->node = to;
         to->ops.push_back(std::move(*op));
     }
     from.ops.erase(first, from.ops.end());
-    from.settled_ = 0;
 }
 
 void OPTree::MoveDescendants(const NodePtr& old_top, std::size_t old_length,
