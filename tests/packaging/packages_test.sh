@@ -14,10 +14,12 @@ root=$work/root
     { cat "$work/cpack.log"; exit 1; }
 for package in libfileindex1 libfileindex-dev fileindex; do
     dpkg-deb -x "$work"/packages/"$package"_*.deb "$root"
-    dpkg-deb -I "$work"/packages/"$package"_*.deb | grep -q "Package: $package\$"
 done
-dpkg-deb -f "$work"/packages/fileindex_*.deb Depends | grep -q 'libfileindex1'
-dpkg-deb -f "$work"/packages/fileindex_*.deb Depends | grep -q 'libxapian30'
+depends=$(dpkg-deb -f "$work"/packages/fileindex_*.deb Depends)
+case $depends in
+    *libfileindex1*libxapian30*) ;;
+    *) echo "fileindex depends on: $depends"; exit 1 ;;
+esac
 
 for file in usr/bin/fileindexctl usr/sbin/{fileindexd,kestoelasticd,kestotifyd} \
     usr/kesto/bin/kestokosnotify lib/systemd/system/pkg-Quivra-fileindexd.service \
