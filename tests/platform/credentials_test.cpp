@@ -65,11 +65,6 @@ TEST_F(RealCredentialsTest, ScopesSwitchDownAndBack) {
                   return trace + Identity();
               }),
               "1026:100:100,2001, 1027:101:101, 0:0:0, 0:0:0, ");
-    EXPECT_EQ(AsRoot([] {
-                  { const SDKCredentials credentials("root"); }  // which needs no switch
-                  return Identity();
-              }),
-              "0:0:0,7, ");
 }
 
 TEST_F(RealCredentialsTest, FailuresLeaveTheIdentityWhole) {
