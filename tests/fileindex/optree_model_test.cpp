@@ -282,11 +282,11 @@ TEST(OPTreeModelTest, AgreesOnEveryShortSequence) {
 
 TEST(OPTreeModelTest, AgreesOnARenameOntoItself) {
     // It moves the reindex behind the delete, which then is not the last work to be taken along.
-    const Step steps[] = {{EVENT_REINDEX, "/d/d"},
-                          {EVENT_DELETE, "/d/d"},
-                          {EVENT_RENAME, "/d", "/d", true},
-                          {EVENT_CREATE, "/d/d"},
-                          {EVENT_RENAME, "/e", "/d/d", true}};
+    const Step steps[] = {{EVENT_REINDEX, "/d/d", "", false, ""},
+                          {EVENT_DELETE, "/d/d", "", false, ""},
+                          {EVENT_RENAME, "/d", "/d", true, ""},
+                          {EVENT_CREATE, "/d/d", "", false, ""},
+                          {EVENT_RENAME, "/e", "/d/d", true, ""}};
     std::vector<const Step*> sequence;
     for (const Step& step : steps) {
         sequence.push_back(&step);
