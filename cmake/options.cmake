@@ -28,7 +28,8 @@ if(FILEINDEX_SANITIZE)
 endif()
 if(FILEINDEX_BUILD_FUZZ)
     # Without it in the code under test, the fuzzers would not see which inputs reach new places.
-    add_compile_options(-fsanitize=fuzzer-no-link)
+    add_compile_options(-fsanitize=fuzzer-no-link
+                        -fsanitize-ignorelist=${PROJECT_SOURCE_DIR}/fuzz/ignorelist.txt)
     add_link_options(-fsanitize=fuzzer-no-link)
 endif()
 
