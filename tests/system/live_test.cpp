@@ -19,6 +19,7 @@
 #include "fileindex/status_mgr.h"
 #include "tests/support/index_state.h"
 #include "tests/support/program.h"
+#include "tests/system/file_user.h"
 
 namespace {
 
@@ -210,6 +211,24 @@ TEST_F(LiveTest, KilledDaemonsLoseNothing) {
     ExpectSettled();
 }
 
+TEST_F(LiveTest, StormsAreFollowedWithDaemonsDyingInBetween) {
+    fs::create_directory(kVolume + "/outside");
+    FileUser user(1, kRoot, kVolume + "/outside", nullptr);
+    for (int round = 0; round < 9; ++round) {
+        for (int left = 60; left > 0; --left) {
+            user.DoSomething();
+        }
+        if (round % 3 == 0) {
+            engine_->Stop(SIGKILL);
+            StartEngine();
+        } else if (round % 3 == 1) {
+            indexer_->Stop(SIGKILL);
+            StartIndexer();
+        }
+        ExpectSettled();
+    }
+}
+
 TEST_F(LiveTest, PausesAndResumes) {
     for (const bool volume : {false, true}) {
         volume ? VolumePause(kVolume) : SharePause("photo");
@@ -217,10 +236,6 @@ TEST_F(LiveTest, PausesAndResumes) {
         fs::rename(kRoot + "/first.txt", kRoot + "/tmp");
         fs::rename(kRoot + "/tmp", kRoot + "/first.txt");
         volume ? VolumeResume(kVolume) : ShareResume("photo");
-        // What happened unwatched is found by a reindex.
-        Json::Value paths;
-        paths.append("/photo");
-        FolderReindex(paths);
         ExpectSettled();
     }
 

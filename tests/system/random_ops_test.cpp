@@ -4,23 +4,20 @@
 
 #include <gtest/gtest.h>
 #include <signal.h>
-#include <sys/stat.h>
 
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
-#include <iomanip>
 #include <memory>
-#include <random>
 #include <thread>
 
 #include "common/json.h"
 #include "common/lock_file.h"
 #include "common/log.h"
 #include "fileindex/elastic/elastic_control.h"
-#include "fileindex/event.h"
 #include "tests/support/index_state.h"
 #include "tests/support/program.h"
+#include "tests/system/file_user.h"
 
 namespace {
 
@@ -35,165 +32,17 @@ const std::string kOutside = "/volume1/outside";
 const std::string kQueue = kRoot + "/@eaDir/fileindex/queue";
 const std::string kEngineSocket = "/var/run/kestoelasticd.sock";
 
-Contents OnDisk() {
-    return support::ContentsOnDisk(kRoot);
+/// Writes the line of a monitor that watches.
+void WriteLine(unsigned int event, bool is_dir, const std::string& path,
+               const std::string& path_old) {
+    Json::Value line;
+    line["event"] = event;
+    line["is_dir"] = is_dir;
+    line["path"] = path;
+    line["path_old"] = path_old;
+    const quivra::LockFile lock(kQueue, true);
+    std::ofstream(kQueue, std::ios::app) << quivra::toString(line) << '\n';
 }
-
-/// Does things to the files below the share, and writes the lines of a monitor that watches.
-class FileUser {
-  public:
-    explicit FileUser(unsigned int seed) : random_(seed) {}
-
-    void DoSomething() {
-        static constexpr void (FileUser::*kActions[])() = {
-            &FileUser::CreateFile,   &FileUser::CreateFile, &FileUser::CreateDirectory,
-            &FileUser::ModifyFile,   &FileUser::ModifyFile, &FileUser::DeleteSomething,
-            &FileUser::Rename,       &FileUser::Rename,     &FileUser::ReplaceByRename,
-            &FileUser::ChangeRights, &FileUser::MoveOut,    &FileUser::MoveIn};
-        (this->*kActions[Below(std::size(kActions))])();
-    }
-
-    std::size_t Below(std::size_t limit) { return random_() % limit; }
-
-  private:
-    void Line(unsigned int event, bool is_dir, const std::string& path,
-              const std::string& path_old = "") {
-        Json::Value line;
-        line["event"] = event;
-        line["is_dir"] = is_dir;
-        line["path"] = path;
-        line["path_old"] = path_old;
-        const quivra::LockFile lock(kQueue, true);
-        std::ofstream(kQueue, std::ios::app) << quivra::toString(line) << '\n';
-    }
-
-    std::vector<std::string> Existing(bool directories) {
-        std::vector<std::string> found;
-        for (const auto& [path, content] : OnDisk()) {
-            if ((content == "/") == directories) {
-                found.push_back(path);
-            }
-        }
-        return found;
-    }
-
-    std::string SomeFile() { return Pick(Existing(false)); }
-    std::string SomeDirectory() { return Pick(Existing(true)); }
-    std::string Pick(const std::vector<std::string>& from) {
-        return from.empty() ? std::string() : from[Below(from.size())];
-    }
-
-    /// Few names, so that they come back after a delete or a rename.
-    std::string FreeName() {
-        std::vector<std::string> parents = Existing(true);
-        parents.push_back(kRoot);
-        for (int attempt = 0; attempt < 20; ++attempt) {
-            const std::string path = Pick(parents) + "/" + "abcde\xff"[Below(6)];
-            if (!fs::exists(path)) {
-                return path;
-            }
-        }
-        return kRoot + "/n" + std::to_string(++counter_);
-    }
-
-    void Write(const std::string& path) {
-        // All of one size, so that size and second often stay the same.
-        std::ofstream(path) << "token" << std::setw(8) << std::setfill('0') << ++counter_ << '\n';
-    }
-
-    void CreateFile() {
-        const std::string path = FreeName();
-        Write(path);
-        Line(EVENT_CREATE, false, path);
-        Line(EVENT_MODIFY, false, path);
-    }
-
-    void CreateDirectory() {
-        const std::string path = FreeName();
-        fs::create_directory(path);
-        Line(EVENT_CREATE, true, path);
-    }
-
-    void ModifyFile() {
-        const std::string path = SomeFile();
-        if (!path.empty()) {
-            Write(path);
-            Line(EVENT_MODIFY, false, path);
-        }
-    }
-
-    void ChangeRights() {
-        const std::string path = SomeFile();
-        if (!path.empty()) {
-            chmod(path.c_str(), Below(2) == 0 ? 0600 : 0644);
-            Line(EVENT_ATTR, false, path);
-        }
-    }
-
-    void DeleteTree(const std::string& path) {
-        if (fs::is_directory(path)) {
-            const std::vector<fs::path> children(fs::directory_iterator{path}, {});
-            for (const fs::path& child : children) {
-                DeleteTree(child);
-            }
-        }
-        const bool is_dir = fs::is_directory(path);
-        fs::remove(path);
-        Line(EVENT_DELETE, is_dir, path);
-    }
-
-    void DeleteSomething() {
-        const std::string path = Below(3) == 0 ? SomeDirectory() : SomeFile();
-        if (!path.empty()) {
-            DeleteTree(path);
-        }
-    }
-
-    void Rename() {
-        const std::string from = Below(2) == 0 ? SomeDirectory() : SomeFile();
-        const std::string to = FreeName();
-        if (!from.empty() && (to + "/").compare(0, from.size() + 1, from + "/") != 0) {
-            const bool is_dir = fs::is_directory(from);
-            fs::rename(from, to);
-            Line(EVENT_RENAME, is_dir, to, from);
-        }
-    }
-
-    void ReplaceByRename() {
-        const std::string from = SomeFile();
-        const std::string to = SomeFile();
-        if (from != to) {
-            fs::rename(from, to);
-            Line(EVENT_RENAME, false, to, from);
-        }
-    }
-
-    void MoveOut() {
-        const std::string from = Below(2) == 0 ? SomeDirectory() : SomeFile();
-        if (!from.empty()) {
-            const bool is_dir = fs::is_directory(from);
-            fs::rename(from, kOutside + "/" + std::to_string(++counter_));
-            Line(EVENT_DELETE, is_dir, from);
-        }
-    }
-
-    void MoveIn() {
-        std::vector<std::string> outside;
-        for (const auto& entry : fs::directory_iterator(kOutside)) {
-            outside.push_back(entry.path());
-        }
-        const std::string from = Pick(outside);
-        if (!from.empty()) {
-            const bool is_dir = fs::is_directory(from);
-            const std::string to = FreeName();
-            fs::rename(from, to);
-            Line(EVENT_CREATE, is_dir, to);
-        }
-    }
-
-    std::mt19937 random_;
-    int counter_ = 0;
-};
 
 class RandomOpsTest : public testing::TestWithParam<unsigned int> {
   protected:
@@ -237,7 +86,7 @@ class RandomOpsTest : public testing::TestWithParam<unsigned int> {
 };
 
 TEST_P(RandomOpsTest, IndexEqualsDisk) {
-    FileUser user(GetParam());
+    FileUser user(GetParam(), kRoot, kOutside, WriteLine);
     for (int round = 0; round < 12; ++round) {
         for (std::size_t left = user.Below(40) + 1; left > 0; --left) {
             user.DoSomething();
@@ -250,7 +99,7 @@ TEST_P(RandomOpsTest, IndexEqualsDisk) {
         }
         if (chance < 3) {
             ASSERT_NO_FATAL_FAILURE(Pass());
-            const Contents disk = OnDisk();
+            const Contents disk = support::ContentsOnDisk(kRoot);
             const Contents index = support::ContentsInIndex(kShare, kRoot);
             ASSERT_TRUE(disk == index) << "seed " << GetParam() << ", round " << round << "\n"
                                        << support::Difference(disk, index);
