@@ -25,6 +25,8 @@ constexpr std::int64_t kMonitorLag = 2;
 /// With more changes than this at once, none is the one of a file that is too busy.
 constexpr std::size_t kMaxChanged = 1000;
 
+constexpr ContentClasses kAllClasses{true, true, true, true};
+
 ContentClasses ClassesOf(const Json::Value& settings) {
     ContentClasses classes;
     quivra::GetJsonValue(classes.document, settings, "document", false);
@@ -48,7 +50,9 @@ Pass::Pass(std::string queue_path, std::string root, Index& index, const Scope& 
       root_(std::move(root)),
       index_(index),
       scope_(scope),
-      listener_(std::move(listener)) {}
+      listener_(std::move(listener)),
+      rules_(scope_.Describe(root_)),
+      applied_rules_(queue_path_ + ".rules") {}
 
 PassResult Pass::Run() {
     PassResult result;
@@ -73,6 +77,7 @@ PassResult Pass::Run() {
     RunRoots();
     batch_->Commit();
     tree.CheckMounted();
+    applied_rules_.Store(rules_);
 
     result.changed = ChangedFiles();
     result.counts = batch_->GetCounts();
@@ -109,6 +114,8 @@ void Pass::CheckShare(const ShareTree& tree) const {
 
 void Pass::Sort(const std::vector<std::shared_ptr<OP>>& ops) {
     using namespace quivra::fileindex;
+    const ContentClasses reindexed =
+        applied_rules_.AreEqualTo(rules_) ? ContentClasses{} : kAllClasses;
     for (const auto& op : ops) {
         const std::string path = op->op == OP_REINDEX_ALL ? root_ : op->node->GetPath();
         switch (op->op) {
@@ -125,7 +132,7 @@ void Pass::Sort(const std::vector<std::shared_ptr<OP>>& ops) {
                 break;
             case OP_REINDEX:
             case OP_REINDEX_ALL:
-                roots_.push_back({path, {}, false});
+                roots_.push_back({path, reindexed, false});
                 break;
             case OP_NONE:
                 break;

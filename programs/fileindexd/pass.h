@@ -5,6 +5,7 @@
 #include <vector>
 
 #include "fileindex/op.h"
+#include "programs/fileindexd/applied_rules.h"
 #include "programs/fileindexd/batch.h"
 #include "programs/fileindexd/progress.h"
 #include "programs/fileindexd/renames.h"
@@ -62,6 +63,8 @@ class Pass {
     Index& index_;
     const Scope& scope_;
     const PassListener listener_;
+    const std::string rules_;
+    const AppliedRules applied_rules_;
 
     // Of the pass at work.
     std::vector<Rename> renames_;

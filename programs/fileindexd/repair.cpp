@@ -25,7 +25,19 @@ std::vector<std::shared_ptr<Folder>> FoldersOf(const std::string& share) {
     return folders;
 }
 
+void Reindex(const std::vector<std::shared_ptr<Folder>>& folders) {
+    Json::Value paths(Json::arrayValue);
+    for (const auto& folder : folders) {
+        paths.append(folder->GetPath());
+    }
+    FolderReindex(paths);
+}
+
 }  // namespace
+
+void QueueReindex(const std::string& share) {
+    Reindex(FoldersOf(share));
+}
 
 void RepairIfNeeded(const std::string& share) {
     if ((StatusMgr().GetShareStatus(share) & kShareNeedReindex) == 0) {
@@ -36,11 +48,7 @@ void RepairIfNeeded(const std::string& share) {
     if (folders.empty() || !record.IsSpaceEnough()) {
         return;
     }
-    Json::Value paths(Json::arrayValue);
-    for (const auto& folder : folders) {
-        paths.append(folder->GetPath());
-    }
-    FolderReindex(paths);
+    Reindex(folders);
     // An event that could not be queued has set the flag, which was then taken back all the same.
     const QueueMgr queue(record.GetQueuePath());
     if (!std::all_of(folders.begin(), folders.end(), [&](const auto& folder) {

@@ -9,4 +9,7 @@ namespace fileindexd {
 /// quivra::Error.
 void RepairIfNeeded(const std::string& share);
 
+/// Queues a reindex of each of the share's folders. Throws quivra::Error.
+void QueueReindex(const std::string& share);
+
 }  // namespace fileindexd

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <climits>
 
+#include "common/json.h"
 #include "common/util.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/util.h"
@@ -24,6 +25,7 @@ class WholeShareScope : public Scope {
     }
     std::vector<std::string> RootsWithin(const std::string& path) const override { return {path}; }
     bool HaveSameRules(const std::string&, const std::string&) const override { return true; }
+    std::string Describe(const std::string&) const override { return "whole"; }
 };
 
 ContentClasses ClassesOf(const Folder& folder) {
@@ -68,6 +70,18 @@ class FolderScope : public Scope {
                    return IsBelow(folder->GetFullPath(), one) ||
                           IsBelow(folder->GetFullPath(), other);
                });
+    }
+
+    std::string Describe(const std::string& root) const override {
+        Json::Value rules(Json::arrayValue);
+        for (const auto& folder : list_) {
+            if (IsAtOrBelow(folder->GetFullPath(), root)) {
+                Json::Value rule = folder->GetIndexCfg();
+                rule["path"] = folder->GetFullPath().substr(root.size());  // the share may move
+                rules.append(rule);
+            }
+        }
+        return quivra::toString(rules);
     }
 
   private:

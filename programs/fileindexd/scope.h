@@ -39,6 +39,9 @@ class Scope {
 
     /// Whether the same rules hold at both places and everywhere below them.
     virtual bool HaveSameRules(const std::string& one, const std::string& other) const = 0;
+
+    /// The rules for a share with that root as a text: as long as it is the same, so are they.
+    virtual std::string Describe(const std::string& root) const = 0;
 };
 
 /// The scope by the configured folders as they are now; a share with all its content where no

@@ -10,6 +10,7 @@
 #include "common/unique_fd.h"
 #include "fileindex/index_mgr.h"
 #include "programs/fileindexd/elastic_index.h"
+#include "programs/fileindexd/repair.h"
 #include "sdk/share.h"
 
 namespace fileindexd {
@@ -94,7 +95,13 @@ PassResult ShareWorker::RunLocked(const std::function<void()>& between) {
         }
         state_.SetProgress(state);
     });
-    return pass.Run();
+    PassResult result = pass.Run();
+    // Settings that changed meanwhile may have been left to a reindex of this very pass.
+    if (result.had_work &&
+        LoadScope()->Describe(share.GetPath()) != scope->Describe(share.GetPath())) {
+        QueueReindex(share_);
+    }
+    return result;
 }
 
 }  // namespace fileindexd

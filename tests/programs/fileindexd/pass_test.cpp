@@ -60,6 +60,9 @@ class TestScope : public Scope {
         return IsIn(one, excluded) == IsIn(other, excluded) &&
                IsIn(one, without_meta) == IsIn(other, without_meta);
     }
+    std::string Describe(const std::string&) const override {
+        return std::to_string(without_meta.size());
+    }
 
     std::string only = "/volume1";
     std::set<std::string> excluded;
@@ -291,6 +294,25 @@ TEST_F(PassTest, ChangedSettingsExtractTheirClassesAgain) {
     Run();
     EXPECT_EQ(index_.Committed().at(Full("/a.txt")).text, "text");
     EXPECT_EQ(index_.Committed().at(Full("/b.mp3")).text, "");
+}
+
+// The folding lets a reindex take changed settings along.
+TEST_F(PassTest, AReindexAppliesSettingsThatChangedMeanwhile) {
+    Put("/a.txt", "text");
+    age_of_files = 1000;
+    scope_.without_meta = {Full("")};
+    IndexAll();
+    scope_.without_meta.clear();
+    Json::Value settings;
+    settings["document"] = true;
+    Queue(EVENT_UPDATE_CFG, "", "", true, settings);
+    Queue(EVENT_REINDEX, "");
+    Run();
+    EXPECT_EQ(index_.Committed().at(Full("/a.txt")).text, "text");
+    const int extracted = index_.extracted;
+    Queue(EVENT_REINDEX, "");
+    Run();
+    EXPECT_EQ(index_.extracted, extracted);
 }
 
 TEST_F(PassTest, WhatLeavesTheScopeIsDroppedAndWhatEntersIsWalked) {
