@@ -6,7 +6,6 @@
 #include <unistd.h>
 
 #include "common/lock_file.h"
-#include "fileindex/folder_mgr.h"
 #include "tests/fileindex/queue_support.h"
 
 namespace quivra::fileindex {
@@ -35,6 +34,10 @@ TEST_F(QueueMgrTest, PassMovesTheQueueAsideAndKeepsTheCopy) {
     EXPECT_TRUE(!Exists("") && Exists(".tmp"));
     EXPECT_EQ(Process(false, 0), Ops{});
 
+    // A pass that fails leaves the copy.
+    const auto fail = [](auto) { throw Error(1401, "busy"); };
+    EXPECT_EQ(ErrorOf([&] { QueueMgr(queue_).ProcessOP(fail, true); }).first, 1401);
+
     // The copy comes first again, whatever has been queued meanwhile, until it is deleted.
     Write(queue_, {Line(EVENT_DELETE, "/b")});
     EXPECT_EQ(Process(true, 2), Ops{"[02] /a"});
@@ -46,27 +49,6 @@ TEST_F(QueueMgrTest, PassMovesTheQueueAsideAndKeepsTheCopy) {
     EXPECT_EQ(manager.DeleteTmp(), 0);
     EXPECT_EQ(Process(true, 0), Ops{});
     EXPECT_FALSE(Exists("")) << "looking at an absent queue made one";
-}
-
-TEST_F(QueueMgrTest, FailedPassLeavesTheCopy) {
-    Write(queue_, {Line(EVENT_CREATE, "/a")});
-    QueueMgr manager(queue_);
-    const auto fail = [](auto) { throw Error(1401, "busy"); };
-    EXPECT_EQ(ErrorOf([&] { manager.ProcessOP(fail, true); }),
-              std::make_pair(1401, std::string("busy")));
-    EXPECT_EQ(Process(true, 1), Ops{"[02] /a"});
-}
-
-TEST_F(QueueMgrTest, FailedRenameLeavesTheQueue) {
-    Write(queue_, {Line(EVENT_CREATE, "/a")});
-    std::filesystem::create_directories(queue_ + ".tmp/in the way");
-    EXPECT_EQ(ErrorOf([&] { QueueMgr(queue_).PrepareTmpQueue(); }),
-              std::make_pair(502, std::string("rename failed, reason=Is a directory")));
-    const auto lines = fake::LogLinesWith(
-        "Failed [0 > rename(queue_path_.c_str(), queue_path_tmp_.c_str())], reason: rename failed");
-    ASSERT_EQ(lines.size(), 1U);
-    EXPECT_TRUE(lines[0].starts_with("queue_mgr:136 ("));
-    EXPECT_EQ(Process(false, 1), Ops{"[02] /a"});
 }
 
 TEST_F(QueueMgrTest, WaitsForAWriter) {
@@ -137,41 +119,9 @@ TEST_F(QueueMgrTest, TellsWhatIsPending) {
             std::filesystem::remove(queue_ + ".tmp");
         }
     }
-}
-
-TEST_F(QueueMgrTest, QuestionsStopAtTheFirstMatchOrBadLine) {
-    QueueMgr manager(queue_);
-    EXPECT_FALSE(manager.IsFullPathProcessing("/a"));
-    Write(queue_, {Line(EVENT_REINDEX, "/a"), "bad", Line(EVENT_REINDEX, "/b")});
-    EXPECT_TRUE(manager.IsFullPathProcessing("/a"));
-    EXPECT_EQ(ErrorOf([&] { manager.IsFullPathProcessing("/b"); }),
-              std::make_pair(906, std::string("Malformed event_raw: bad")));
-    EXPECT_EQ(ErrorOf([&] { manager.IsFullPathHasReindex("/b"); }).first, 906);
-}
-
-TEST_F(QueueMgrTest, BrokenFolderSetRaises) {
-    const std::filesystem::path path = kFileIndexFoldersCfgPath;
-    std::filesystem::create_directories(path.parent_path());
-    std::ofstream(path) << "{";
-    EXPECT_EQ(ErrorOf([&] { QueueMgr(queue_).IsFullPathProcessing("/a"); }).first, 504);
-    EXPECT_EQ(ErrorOf([&] { QueueMgr(queue_).IsFullPathHasReindex("/a"); }).first, 0);
-    std::filesystem::remove(path);
-}
-
-TEST_F(QueueMgrTest, UnreadableFileRaises) {
-    if (geteuid() != 0) {
-        GTEST_SKIP() << "needs another user";
-    }
-    Write(queue_, {Line(EVENT_REINDEX, "/a")});
-    std::filesystem::permissions(queue_, std::filesystem::perms::none);
-    std::filesystem::permissions(directory_, std::filesystem::perms(0755));
-    ASSERT_EQ(seteuid(65534), 0);
-    const auto [code, reason] = ErrorOf([&] { QueueMgr(queue_).IsFullPathHasReindex("/a"); });
-    ASSERT_EQ(seteuid(0), 0);
-    EXPECT_EQ(code, 502);
-    EXPECT_EQ(reason, "Failed to open queue, reason=Permission denied");
-    EXPECT_EQ(fake::LogLinesWith("Failed [!input_stream], reason: Failed to open queue").size(),
-              1U);
+    // A bad line is no reason to believe that nothing is pending.
+    Write(queue_, {"bad", rows[0].line});
+    EXPECT_EQ(ErrorOf([&] { QueueMgr(queue_).IsFullPathProcessing("/b"); }).first, 906);
 }
 
 }  // namespace
