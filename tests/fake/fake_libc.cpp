@@ -4,11 +4,10 @@
 #include <time.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cerrno>
 #include <cstdarg>
 #include <cstdio>
-#include <iterator>
+#include <cstdlib>
 #include <mutex>
 #include <optional>
 
@@ -18,28 +17,33 @@ namespace {
 using std::chrono::microseconds;
 
 struct State {
-    std::mutex mutex;
     std::vector<std::string> log_lines;
     std::vector<microseconds> sleeps;
     std::function<void(microseconds)> on_sleep;
     std::optional<microseconds> now;  // since the epoch
 };
 
-State& GetState() {
-    static State* state = new State;  // outlives every thread that still logs at exit
-    return *state;
-}
+class Locked {
+  public:
+    State* operator->() {
+        static State* state = new State;  // outlives every thread that still logs at exit
+        return state;
+    }
+
+  private:
+    static inline std::mutex mutex_;
+    std::lock_guard<std::mutex> lock_{mutex_};
+};
 
 void Sleep(microseconds duration) {
     std::function<void(microseconds)> action;
     {
-        State& state = GetState();
-        const std::lock_guard lock(state.mutex);
-        state.sleeps.push_back(duration);
-        if (state.now) {
-            *state.now += duration;
+        Locked state;
+        state->sleeps.push_back(duration);
+        if (state->now) {
+            *state->now += duration;
         }
-        action = state.on_sleep;
+        action = state->on_sleep;
     }
     if (action) {
         action(duration);
@@ -47,61 +51,41 @@ void Sleep(microseconds duration) {
 }
 
 void Log(const char* format, va_list arguments) {
-    const int saved_errno = errno;
-    va_list measured;
-    va_copy(measured, arguments);
-    const int length = std::vsnprintf(nullptr, 0, format, measured);
-    va_end(measured);
-    std::string line(static_cast<std::size_t>(std::max(length, 0)), '\0');
-    errno = saved_errno;  // for %m
-    std::vsnprintf(line.data(), line.size() + 1, format, arguments);
-    State& state = GetState();
-    const std::lock_guard lock(state.mutex);
-    state.log_lines.push_back(line);
+    const int saved_errno = errno;  // for %m, and for the caller
+    char* line = nullptr;
+    if (vasprintf(&line, format, arguments) >= 0) {
+        Locked()->log_lines.emplace_back(line);
+        std::free(line);
+    }
     errno = saved_errno;
 }
 
 }  // namespace
 
 void ResetLibc() {
-    State& state = GetState();
-    const std::lock_guard lock(state.mutex);
-    state.log_lines.clear();
-    state.sleeps.clear();
-    state.on_sleep = nullptr;
-    state.now.reset();
+    *Locked().operator->() = State();
 }
 
 std::vector<std::string> LogLines() {
-    State& state = GetState();
-    const std::lock_guard lock(state.mutex);
-    return state.log_lines;
+    return Locked()->log_lines;
 }
 
 std::vector<std::string> LogLinesWith(const std::string& text) {
-    std::vector<std::string> found;
-    const std::vector<std::string> lines = LogLines();
-    std::copy_if(lines.begin(), lines.end(), std::back_inserter(found),
-                 [&](const std::string& line) { return line.find(text) != std::string::npos; });
-    return found;
+    std::vector<std::string> lines = LogLines();
+    std::erase_if(lines, [&](const auto& line) { return line.find(text) == line.npos; });
+    return lines;
 }
 
 std::vector<microseconds> Sleeps() {
-    State& state = GetState();
-    const std::lock_guard lock(state.mutex);
-    return state.sleeps;
+    return Locked()->sleeps;
 }
 
 void OnSleep(std::function<void(microseconds)> action) {
-    State& state = GetState();
-    const std::lock_guard lock(state.mutex);
-    state.on_sleep = std::move(action);
+    Locked()->on_sleep = std::move(action);
 }
 
 void SetTime(std::int64_t seconds) {
-    State& state = GetState();
-    const std::lock_guard lock(state.mutex);
-    state.now = std::chrono::seconds(seconds);
+    Locked()->now = std::chrono::seconds(seconds);
 }
 
 }  // namespace fake
@@ -142,14 +126,9 @@ int nanosleep(const struct timespec* duration, struct timespec* /*remaining*/) {
 time_t time(time_t* out) noexcept {
     struct timespec real {};
     clock_gettime(CLOCK_REALTIME, &real);
-    time_t now = real.tv_sec;
-    {
-        fake::State& state = fake::GetState();
-        const std::lock_guard lock(state.mutex);
-        if (state.now) {
-            now = std::chrono::duration_cast<std::chrono::seconds>(*state.now).count();
-        }
-    }
+    const auto fixed = fake::Locked()->now;
+    const time_t now =
+        fixed ? std::chrono::duration_cast<std::chrono::seconds>(*fixed).count() : real.tv_sec;
     if (out != nullptr) {
         *out = now;
     }

@@ -1,7 +1,5 @@
 #include "tests/fake/scripted_server.h"
 
-#include <poll.h>
-#include <sys/eventfd.h>
 #include <sys/socket.h>
 #include <sys/un.h>
 #include <unistd.h>
@@ -24,59 +22,32 @@ using quivra::UniqueFd;
 struct ScriptedServer::State {
     std::string path;
     UniqueFd listener;
-    UniqueFd stop;
     std::thread thread;
     std::vector<UniqueFd> kept_open;  // the thread's own
     mutable std::mutex mutex;
     std::deque<Turn> turns;
     Handler handler;
-    std::vector<std::string> texts;
+    std::vector<Json::Value> requests;
     int connections = 0;
 
     void Run();
     void Serve(UniqueFd connection);
-    bool WaitReadable(int fd) const;
-    bool ReadBytes(int fd, std::size_t size, std::string& out) const;
-    bool ReadRequest(int fd, std::string& text) const;
 };
 
 std::string Frame(const std::string& text) {
     const auto size = static_cast<std::uint32_t>(text.size());
-    std::string bytes(sizeof(size), '\0');
-    std::memcpy(bytes.data(), &size, sizeof(size));
-    return bytes + text;
+    return std::string(reinterpret_cast<const char*>(&size), sizeof(size)) + text;
 }
 
-bool ScriptedServer::State::WaitReadable(int fd) const {
-    pollfd fds[] = {{fd, POLLIN, 0}, {stop.Get(), POLLIN, 0}};
-    while (poll(fds, 2, -1) < 0 && errno == EINTR) {
-    }
-    return fds[1].revents == 0;
-}
-
-bool ScriptedServer::State::ReadBytes(int fd, std::size_t size, std::string& out) const {
-    out.clear();
-    char buffer[65536];
-    while (out.size() < size) {
-        if (!WaitReadable(fd)) {
-            return false;
-        }
-        const ssize_t got = recv(fd, buffer, std::min(sizeof(buffer), size - out.size()), 0);
-        if (got <= 0) {
-            return false;
-        }
-        out.append(buffer, static_cast<std::size_t>(got));
-    }
-    return true;
-}
-
-bool ScriptedServer::State::ReadRequest(int fd, std::string& text) const {
+bool ReadRequest(int fd, Json::Value& request) {
     std::uint32_t size = 0;
-    if (!ReadBytes(fd, sizeof(size), text)) {
+    if (recv(fd, &size, sizeof(size), MSG_WAITALL) != static_cast<ssize_t>(sizeof(size))) {
         return false;
     }
-    std::memcpy(&size, text.data(), sizeof(size));
-    return ReadBytes(fd, size, text);
+    std::string text(size, '\0');
+    const ssize_t got = recv(fd, text.data(), size, MSG_WAITALL);
+    quivra::fromString(request, text);
+    return got == static_cast<ssize_t>(size);
 }
 
 void ScriptedServer::State::Serve(UniqueFd connection) {
@@ -93,14 +64,12 @@ void ScriptedServer::State::Serve(UniqueFd connection) {
         }
         answer = handler;
     }
-    std::string text;
-    if (turn.read_request && ReadRequest(connection.Get(), text)) {
+    Json::Value request;
+    if (turn.read_request && ReadRequest(connection.Get(), request)) {
         {
             const std::lock_guard lock(mutex);
-            texts.push_back(text);
+            requests.push_back(request);
         }
-        Json::Value request;
-        quivra::fromString(request, text);
         const std::string bytes = scripted ? turn.bytes : answer(request);
         // What does not fit is lost: the client has gone or reads no more.
         [[maybe_unused]] const ssize_t sent =
@@ -112,10 +81,12 @@ void ScriptedServer::State::Serve(UniqueFd connection) {
 }
 
 void ScriptedServer::State::Run() {
-    while (WaitReadable(listener.Get())) {
+    for (;;) {
         UniqueFd connection(accept4(listener.Get(), nullptr, nullptr, SOCK_CLOEXEC));
         if (connection.IsValid()) {
             Serve(std::move(connection));
+        } else if (errno != EINTR) {
+            return;  // shut down
         }
     }
 }
@@ -124,7 +95,6 @@ ScriptedServer::ScriptedServer(const std::string& path) : state_(std::make_uniqu
     State& state = *state_;
     state.path = path;
     state.handler = [](const Json::Value&) { return Frame(R"({"success":true})"); };
-    state.stop = UniqueFd(eventfd(0, EFD_CLOEXEC));
     state.listener = UniqueFd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
     sockaddr_un address{};
     address.sun_family = AF_UNIX;
@@ -139,7 +109,7 @@ ScriptedServer::ScriptedServer(const std::string& path) : state_(std::make_uniqu
 }
 
 ScriptedServer::~ScriptedServer() {
-    eventfd_write(state_->stop.Get(), 1);
+    shutdown(state_->listener.Get(), SHUT_RDWR);
     state_->thread.join();
     unlink(state_->path.c_str());
 }
@@ -154,17 +124,9 @@ void ScriptedServer::SetHandler(Handler handler) {
     state_->handler = std::move(handler);
 }
 
-std::vector<std::string> ScriptedServer::RequestTexts() const {
-    const std::lock_guard lock(state_->mutex);
-    return state_->texts;
-}
-
 std::vector<Json::Value> ScriptedServer::Requests() const {
-    std::vector<Json::Value> requests;
-    for (const std::string& text : RequestTexts()) {
-        quivra::fromString(requests.emplace_back(), text);
-    }
-    return requests;
+    const std::lock_guard lock(state_->mutex);
+    return state_->requests;
 }
 
 int ScriptedServer::Connections() const {

@@ -40,9 +40,8 @@ class ScriptedServer {
     void ThenReply(const std::string& text) { Then({Frame(text)}); }
     void SetHandler(Handler handler);
 
-    /// The requests read so far, oldest first, and the texts that they came as.
+    /// The requests read so far, oldest first.
     std::vector<Json::Value> Requests() const;
-    std::vector<std::string> RequestTexts() const;
     int Connections() const;
 
   private:

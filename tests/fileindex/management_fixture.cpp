@@ -1,8 +1,6 @@
 #include "tests/fileindex/management_fixture.h"
 
 #include "common/lock_file.h"
-#include "fileindex/folder_mgr.h"
-#include "fileindex/status_mgr.h"
 
 namespace quivra::fileindex {
 namespace {
@@ -32,7 +30,7 @@ ManagementTest::ManagementTest() {
 }
 
 ManagementTest::~ManagementTest() {
-    fake::OnCall(nullptr);
+    fake::Platform()->on_call = nullptr;
 }
 
 void ManagementTest::Reset() {
@@ -42,14 +40,11 @@ void ManagementTest::Reset() {
     std::filesystem::remove_all("/volume10");
     std::filesystem::remove(kFileIndexFoldersCfgPath);
     std::filesystem::remove(kFileIndexStatusCfgPath);
-    fake::OnCall([this](const std::string& call) { OnPlatformCall(call); });
+    fake::Platform()->on_call = [this](const std::string& call) { OnPlatformCall(call); };
     StartSteps();
 }
 
 void ManagementTest::OnPlatformCall(const std::string& call) {
-    if (call.starts_with("KESTOShareFree") || call.starts_with("KESTOUserFree")) {
-        return;  // these cannot fail
-    }
     std::string step;
     if (HasEffect(call)) {
         step = call;
@@ -92,40 +87,22 @@ void ManagementTest::ExpectNothingHeld() {
     EXPECT_EQ(ErrorOf([] { LockFile(kFileIndexFoldersLockPath, true); }).code, 0);
 }
 
-Json::Value ManagementTest::FolderData(const std::string& path, bool photo) {
-    Json::Value data =
-        Parse(R"({"name":"n","document":true,"audio":true,"video":true,"paused":false,
-                  "volume_to_be_clean":""})");
-    data["path"] = path;
-    data["photo"] = photo;
-    return data;
-}
-
 Json::Value ManagementTest::List(const std::vector<std::string>& paths) {
     Json::Value list(Json::arrayValue);
     for (const std::string& path : paths) {
-        list.append(FolderData(path));
+        Json::Value folder = Parse(R"({"name":"n","document":true,"audio":true,"video":true,
+                                       "photo":true,"paused":false,"volume_to_be_clean":""})");
+        folder["path"] = path;
+        list.append(folder);
     }
     return list;
-}
-
-Json::Value ManagementTest::Folders() {
-    Json::Value folders;
-    fromFile(folders, kFileIndexFoldersCfgPath);
-    return folders;
-}
-
-Json::Value ManagementTest::Status() {
-    Json::Value status;
-    fromFile(status, kFileIndexStatusCfgPath);
-    return status;
 }
 
 std::vector<Json::Value> ManagementTest::Queue(const std::string& root) {
     std::ifstream file(QueuePath(root));
     std::vector<Json::Value> lines;
     for (std::string line; std::getline(file, line);) {
-        lines.push_back(Parse(line));
+        fromString(lines.emplace_back(), line);
     }
     return lines;
 }

@@ -5,6 +5,8 @@
 #include <string>
 #include <vector>
 
+#include "fileindex/folder_mgr.h"
+#include "fileindex/status_mgr.h"
 #include "tests/fake/scripted_server.h"
 #include "tests/fileindex/library_fixture.h"
 
@@ -33,10 +35,10 @@ class ManagementTest : public LibraryTest {
     /// Whether the folder lock is free and no descriptor was left open.
     void ExpectNothingHeld();
 
-    static Json::Value FolderData(const std::string& path, bool photo = true);
+    /// Folders with all content switched on, as they are stored.
     static Json::Value List(const std::vector<std::string>& paths);
-    static Json::Value Folders();
-    static Json::Value Status();
+    static Json::Value Folders() { return Parse(ReadFile(kFileIndexFoldersCfgPath)); }
+    static Json::Value Status() { return Parse(ReadFile(kFileIndexStatusCfgPath)); }
     static std::string QueuePath(const std::string& root) {
         return root + "/@eaDir/fileindex/queue";
     }

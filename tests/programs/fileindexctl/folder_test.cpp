@@ -109,7 +109,7 @@ TEST_F(FolderTest, AFailureAfterTheSaveSaysHowToGoOn) {
     EXPECT_EQ(Piped({"queue", "show", QueueOf("photo")}).out, "[06] /volume1/photo\nconsumed: 1\n");
     EXPECT_EQ(Piped({"folder", "set", "/photo"}).status, kSuccess);
     EXPECT_EQ(search_.Requests().back()["command"], "index_create");
-    EXPECT_EQ(fake::MonitorQueues().size(), 1U);
+    EXPECT_EQ(fake::Platform()->monitor_queues.size(), 1U);
 }
 
 TEST_F(FolderTest, ListPagesAndSorts) {
@@ -190,10 +190,10 @@ TEST_F(FolderTest, APauseThatTheDaemonDidNotHearOfIsRecorded) {
 }
 
 TEST_F(FolderTest, WhatServicesPrintDoesNotMixWithTheOutput) {
-    fake::OnCall([](const std::string&) {
+    fake::Platform()->on_call = [](const std::string&) {
         EXPECT_EQ(write(STDOUT_FILENO, "chatter", 7), 7);
         EXPECT_EQ(write(STDERR_FILENO, "chatter", 7), 7);
-    });
+    };
     testing::internal::CaptureStdout();
     testing::internal::CaptureStderr();
     Piped({"services", "prepare"});
@@ -203,7 +203,7 @@ TEST_F(FolderTest, WhatServicesPrintDoesNotMixWithTheOutput) {
 
 TEST_F(FolderTest, ShareListTellsHowEachStands) {
     AddShare("locked");
-    fake::SetFlag("locked", fake::ShareFlag::kReadOnly);
+    fake::Platform()->shares.at("locked").read_only = 1;
     Piped({"folder", "add", "/photo"});
     EXPECT_EQ(Piped({"share", "list"}).out,
               "SHARE   PATH             FOLDERS  INDEXING\n"

@@ -1,3 +1,5 @@
+#include <kesto/filesystem.h>
+
 #include "fileindex/util.h"
 #include "tests/programs/fileindexctl/ctl_fixture.h"
 
@@ -17,12 +19,11 @@ class WhyTest : public CtlTest {
             WriteFile(path, "x");
         }
         std::filesystem::create_directory_symlink("real", "/volume1/s/link");
-        fake::SetFlag("s", fake::ShareFlag::kRecycle);
-        fake::SetInSnapshot("/volume1/s/#snapshot/x");
-        fake::SetMountPoint("/volume1/s/mounted");
-        fake::SetFSType("/volume1/s/virtual", fake::kFSVirtual);
-        fake::SetFSType("/volume1/s/remote", fake::kFSRemote);
-        fake::SetFSType("/volume1/s/image", fake::kFSImage);
+        fake::Platform()->shares.at("s").recycle = 1;
+        fake::Platform()->mount_points.insert("/volume1/s/mounted");
+        fake::Platform()->fs_types = {{"/volume1/s/virtual", KESTO_FS_VIRTUAL},
+                                      {"/volume1/s/remote", KESTO_FS_REMOTE},
+                                      {"/volume1/s/image", KESTO_FS_IMAGE}};
     }
 
     void SetInIndex(bool held) {
@@ -61,7 +62,7 @@ TEST_F(WhyTest, TheRuleThatFailsIsTheLastAndAgreesWithTheLibrary) {
         }
     }
     EXPECT_FALSE(PipedJson({"why", "/volume1/s/.DS_Store/x", "--json"})["may_be_indexed"].asBool());
-    fake::SetFlag("s", fake::ShareFlag::kReadOnly);
+    fake::Platform()->shares.at("s").read_only = 1;
     EXPECT_NE(Verdict("/volume1/s/a.txt").find("read-only"), std::string::npos);
 }
 
