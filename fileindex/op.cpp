@@ -137,15 +137,15 @@ std::shared_ptr<OPNode> OPNode::GetChild(std::string_view child_name) {
 }
 
 std::string OPNode::GetPath() const {
-    std::size_t length = 0;
-    for (const OPNode* node = this; node->parent != nullptr; node = node->parent.get()) {
-        length += 1 + node->name.size();
+    std::size_t length = name.size();
+    for (const OPNode* node = parent.get(); node != nullptr; node = node->parent.get()) {
+        length += node->name.size() + 1;
     }
     std::string path(length, '/');
-    for (const OPNode* node = this; node->parent != nullptr; node = node->parent.get()) {
+    for (const OPNode* node = this; node != nullptr; node = node->parent.get()) {
         length -= node->name.size();
         path.replace(length, node->name.size(), node->name);
-        --length;
+        length -= length > 0 ? 1 : 0;
     }
     return path;
 }

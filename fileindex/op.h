@@ -69,7 +69,7 @@ struct QUIVRA_EXPORT OPNode : std::enable_shared_from_this<OPNode> {
     /// time in a directory of any size.
     std::shared_ptr<OPNode> GetChild(std::string_view name);
 
-    /// The full path: the names from the root down, joined by "/". Empty for the root.
+    /// The full path: the names from the root down, joined by "/". Empty for a tree's root.
     std::string GetPath() const;
 
     /// Calls `fn` once for each op that is on the node at the start of the call; `fn` may change
