@@ -70,13 +70,13 @@ void UpsertFolder(FolderMgr& folder_mgr, Changes& changes, const Json::Value& el
     changes.shares.insert(folder_new->GetShare());
 }
 
-/// Queues the content that a change adds or drops; a change without any sends nothing.
-void QueueConfigEvents(const std::vector<FolderPtr>& diffs) {
-    for (const FolderPtr& diff : diffs) {
-        if (diff->GetDocument() || diff->GetAudio() || diff->GetVideo() || diff->GetPhoto()) {
-            AddCustomEvent(EVENT_UPDATE_CFG, diff->GetFullPath(), "", diff->GetIndexCfg());
-        }
-    }
+bool HasChangedContent(const Folder& diff) {
+    return diff.GetDocument() || diff.GetAudio() || diff.GetVideo() || diff.GetPhoto();
+}
+
+/// Queues the content that a change adds or drops.
+void QueueConfigEvent(const Folder& diff) {
+    AddCustomEvent(EVENT_UPDATE_CFG, diff.GetFullPath(), "", diff.GetIndexCfg());
 }
 
 void UpsertFolders(const Json::Value& folder_list, bool create, bool updater_mode) {
@@ -97,7 +97,11 @@ void UpsertFolders(const Json::Value& folder_list, bool create, bool updater_mod
         NotifySettingChanged(share, true);
         UpsertMonitorQueue(share);
     }
-    QueueConfigEvents(changes.diffs);
+    for (const FolderPtr& diff : changes.diffs) {
+        if (HasChangedContent(*diff)) {
+            QueueConfigEvent(*diff);
+        }
+    }
 }
 
 /// A share without folders left: its index and data go.
@@ -131,7 +135,11 @@ void FolderDelete(const Json::Value& path_list) {
         changes.shares.insert(share_name);
     }
     folder_mgr.Save();
-    QueueConfigEvents(changes.diffs);
+    for (const FolderPtr& diff : changes.diffs) {
+        // Also when an enclosing folder has the same switches: it does not index all that a folder
+        // of its own does (see updater_mode).
+        QueueConfigEvent(*diff);
+    }
     for (const std::string& share : changes.shares) {
         NotifySettingChanged(share, false);
         if (folder_mgr.IsShareIndexed(share)) {
