@@ -19,12 +19,8 @@ namespace {
 
 using FolderPtr = FolderMgr::FolderPtr;
 
-/// Component-wise: /v/s/a covers itself and /v/s/a/b, not /v/s/ab. Compares in place, since every
-/// question about a path asks it of every folder.
 bool Covers(const Folder& folder, const std::string& full_path) {
-    const std::string& root = folder.GetFullPath();
-    return full_path.starts_with(root) &&
-           (full_path.size() == root.size() || full_path[root.size()] == '/');
+    return IsPathWithin(full_path, folder.GetFullPath());
 }
 
 bool (*OrderBy(const std::string& key))(const FolderPtr&, const FolderPtr&) {
