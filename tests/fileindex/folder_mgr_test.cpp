@@ -30,12 +30,9 @@ TEST_F(FolderMgrTest, TheFirstStatusRuleThatAppliesCounts) {
     };
     const Row rows[] = {
         {"/volume1/s/a2/f", "{}", "finished"},
-        {"/volume1/s/a2/f", R"({"resume_time":0})", "finished"},
-        {"/volume1/s/a/f", "{}", "processing"},
         {"/volume1/s/a/f", R"({"resume_time":0})", "paused"},
         {"/volume1/s/a/f", R"({"resume_time":1001})", "paused"},
         {"/volume1/s/a/f", R"({"resume_time":1000})", "processing"},
-        {"/volume1/s/a/f", R"({"resume_time":-5})", "processing"},
         {"/volume1/s/a/f", R"({"resume_time":0,"share":{"s":1}})", "need_reindex"},
         {"/volume1/s/a/f", R"({"resume_time":0,"share":{"s":2}})", "paused"},
     };
@@ -58,8 +55,6 @@ TEST_F(FolderMgrTest, TheFirstStatusRuleThatAppliesCounts) {
 TEST_F(FolderMgrTest, FilesThatCannotBeReadOrWrittenAreErrors) {
     const std::pair<std::string, int> rows[] = {
         {"", 504},
-        {"{}", 120},
-        {"[5]", 120},
         {"[" + Stored("/s") + ",{}]", 120},
         {"[" + Stored("/s", R"(,"photo":"yes")") + "]", 120},
         {"[" + Stored("no slash") + "]", 0},

@@ -51,16 +51,6 @@ TEST_F(QueueMgrTest, PassMovesTheQueueAsideAndKeepsTheCopy) {
     EXPECT_FALSE(Exists("")) << "looking at an absent queue made one";
 }
 
-TEST_F(QueueMgrTest, WaitsForAWriter) {
-    Write(queue_, {Line(EVENT_CREATE, "/a")});
-    auto writer = std::make_unique<LockFile>(queue_, true);
-    fake::OnSleep([&](auto) {
-        Write(queue_, {Line(EVENT_CREATE, "/a"), Line(EVENT_CREATE, "/b")});
-        writer.reset();
-    });
-    EXPECT_EQ(Process(true, 2), (Ops{"[02] /a", "[02] /b"}));
-}
-
 TEST_F(QueueMgrTest, NoEventIsLostBetweenWritersAndPasses) {
     constexpr int kWriters = 3;
     constexpr int kLines = 200;
@@ -99,12 +89,10 @@ TEST_F(QueueMgrTest, TellsWhatIsPending) {
     } rows[] = {
         {Line(EVENT_CREATE, "/v/s/dir/file"), "/v/s/dir", true, false},
         {Line(EVENT_CREATE, "/v/s/dir2/file"), "/v/s/dir", false, false},
-        {Line(EVENT_CREATE, "/v/s/dir"), "/v/s/dir", true, false},
         {Line(EVENT_CREATE, "/v/s"), "/v/s/dir", false, false},
         {Line(EVENT_RENAME, "/w/x", "/v/s/dir/x"), "/v/s/dir", true, false},
         {Line(EVENT_REINDEX, "/v/s/dir"), "/v/s/dir/sub", false, true},
         {Line(EVENT_REINDEX, "/v/s/dir"), "/v/s/dir", true, true},
-        {Line(EVENT_REINDEX, "/v/s/dir/sub2"), "/v/s/dir/sub", false, false},
         {Line(EVENT_REINDEX | EVENT_ATTR, "/v/s/dir"), "/v/s/dir/sub", false, false},
     };
     for (const auto& row : rows) {

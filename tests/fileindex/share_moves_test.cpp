@@ -51,21 +51,28 @@ TEST_F(ShareMovesTest, ARenamedShareTakesEverythingAlong) {
               Parse(R"(["/volume1/new","/volume1/new/x"])"));
 }
 
-TEST_F(ShareMovesTest, WhatIsNotIndexedOrHasNotMovedIsPassedOver) {
-    AddShare("free");
-    ShareRename("free", "new");
-    ShareRename("free", "other");  // indexed, but nothing is left to be done
-    ShareMigrate("free", "/volume9/free");
-    ShareMigrate("other", "/volume1/other");  // has not moved
-    ShareCheckRecycle("free");
-    EXPECT_TRUE(Steps().empty());
-
+TEST_F(ShareMovesTest, APausedShareStaysPaused) {
     Json::Value folders = List({"/old", "/other"});
     folders[0]["paused"] = true;
     EXPECT_TRUE(toFile(folders, kFileIndexFoldersCfgPath));
-    ShareRename("old", "new");  // a paused share stays paused
+    ShareRename("old", "new");
     EXPECT_TRUE(fake::Platform()->monitor_queues.empty());
     EXPECT_EQ(daemon_.Requests().back()["type"], "worker_delete");
+    StartSteps();
+    ShareMigrate("other", "/volume1/other");  // has not moved
+    EXPECT_TRUE(Steps().empty());
+}
+
+TEST_F(ShareMovesTest, ASwitchedRecycleBinIsSettled) {
+    AddShare("homes");
+    std::filesystem::create_directories("/volume1/homes/alice/#recycle");
+    EXPECT_TRUE(toFile(List({"/homes"}), kFileIndexFoldersCfgPath));
+    ShareCheckRecycle("homes");
+    const auto queue = Queue("/volume1/homes");
+    ASSERT_EQ(queue.size(), 2U);
+    EXPECT_EQ(queue[0]["event"], 65536);
+    EXPECT_EQ(queue[0]["path"], "/volume1/homes/#recycle");
+    EXPECT_EQ(queue[1]["path"], "/volume1/homes/alice/#recycle");
 }
 
 /// Every outside call fails in turn; the second call must bring the same end, and must have queued
@@ -123,23 +130,6 @@ TEST_F(ShareMovesTest, ASecondCallFinishesWhatTheFirstLeft) {
             ExpectNothingHeld();
         }
     }
-}
-
-TEST_F(ShareMovesTest, ASwitchedRecycleBinIsSettled) {
-    AddShare("homes");
-    for (const char* directory : {"alice/#recycle", "bob"}) {
-        std::filesystem::create_directories(std::string("/volume1/homes/") + directory);
-    }
-    EXPECT_TRUE(toFile(List({"/homes", "/other"}), kFileIndexFoldersCfgPath));
-    ShareCheckRecycle("other");
-    ShareCheckRecycle("homes");
-    const auto other = Queue("/volume1/other");
-    const auto homes = Queue("/volume1/homes");
-    ASSERT_TRUE(other.size() == 1 && homes.size() == 2);
-    EXPECT_EQ(other[0]["event"], 65536);
-    EXPECT_EQ(other[0]["path"], "/volume1/other/#recycle");
-    EXPECT_EQ(homes[0]["path"], "/volume1/homes/#recycle");
-    EXPECT_EQ(homes[1]["path"], "/volume1/homes/alice/#recycle");
 }
 
 }  // namespace

@@ -2,6 +2,11 @@
 
 #include <gtest/gtest.h>
 
+#include <filesystem>
+#include <fstream>
+
+#include "programs/fileindexd/queue_watch.h"
+
 namespace fileindexd {
 namespace {
 
@@ -34,15 +39,10 @@ TEST(ScheduleTest, ABurstIsWaitedOutButNotForever) {
         schedule.PassBegins();
         EXPECT_FALSE(schedule.Due());
     }
-}
-
-TEST(ScheduleTest, ABusyFileWaitsUnlessAnotherChanges) {
-    Schedule schedule;
-    schedule.QueueChangedLater(kStart + seconds(20));
-    schedule.QueueChangedLater(kStart + seconds(10));
-    EXPECT_EQ(schedule.Due(), kStart + seconds(10));
-    schedule.QueueChanged(kStart + seconds(1));
-    EXPECT_EQ(schedule.Due(), kStart + seconds(1) + Schedule::kQuiet);
+    Schedule busy;
+    busy.QueueChangedLater(kStart + seconds(20));
+    busy.QueueChangedLater(kStart + seconds(10));
+    EXPECT_EQ(busy.Due(), kStart + seconds(10));
 }
 
 TEST(ScheduleTest, AFailedPassIsRepeatedLaterEachTime) {
@@ -74,6 +74,29 @@ TEST(ChangeRatesTest, AFileThatKeepsChangingWaitsLongerEachTime) {
     EXPECT_EQ(rates.NotBefore("/log", now), now) << "it has been calm";
     rates.Indexed("/log", now);
     EXPECT_EQ(rates.NotBefore("/log", now), now);
+}
+
+TEST(QueueWatchTest, NewLinesAboutBusyFilesWait) {
+    const std::string directory = "/var/queue_test";
+    std::filesystem::create_directories(directory);
+    QueueWatch watch(directory + "/queue");
+    ChangeRates rates;
+    rates.Indexed("/busy", kStart);
+    rates.Indexed("/busy", kStart);
+    Schedule schedule;
+    const auto append = [&](const char* text) {
+        std::ofstream(directory + "/queue", std::ios::app) << text;
+        EXPECT_TRUE(watch.Read().queue);
+        watch.ReadNewLines(schedule, rates, kStart);
+    };
+    append(R"({"event":2,"pa)");
+    EXPECT_FALSE(schedule.Due()) << "half a line";
+    append("th\":\"/busy\"}\n");
+    EXPECT_EQ(schedule.Due(), kStart + ChangeRates::kShortestWait);
+    append("garbage\n");
+    EXPECT_EQ(schedule.Due(), kStart + Schedule::kQuiet);
+    std::filesystem::remove_all(directory);
+    EXPECT_TRUE(watch.Read().gone);
 }
 
 }  // namespace

@@ -123,17 +123,16 @@ bool ShareModel::Converges() {
 }
 
 void ShareModel::PrintDifference() const {
-    const Entries disk = OnDisk();
     std::string text;
-    for (const auto& [path, content] : disk) {
-        if (!entries_.contains(path) || entries_.at(path) != content) {
-            text += "not indexed, or stale: " + path + "\n";
+    const auto list = [&text](const Entries& some, const Entries& others, const char* what) {
+        for (const auto& [path, content] : some) {
+            const auto other = others.find(path);
+            if (other == others.end() || other->second != content) {
+                text += what + path + "\n";
+            }
         }
-    }
-    for (const auto& [path, content] : entries_) {
-        if (!disk.contains(path)) {
-            text += "indexed, but gone: " + path + "\n";
-        }
-    }
+    };
+    list(OnDisk(), entries_, "on the disk: ");
+    list(entries_, OnDisk(), "in the index: ");
     ADD_FAILURE() << text << consumed_;
 }

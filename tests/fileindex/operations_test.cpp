@@ -12,9 +12,9 @@
 namespace quivra::fileindex {
 namespace {
 
-class FolderOperationsTest : public ManagementTest {
+class OperationsTest : public ManagementTest {
   protected:
-    FolderOperationsTest() { Arrange(); }
+    OperationsTest() { Arrange(); }
 
     void Arrange() {
         Reset();
@@ -46,7 +46,7 @@ constexpr const char* kAll = R"({"document":true,"audio":true,"video":true,"phot
 constexpr const char* kPhoto = R"({"document":false,"audio":false,"video":false,"photo":true})";
 constexpr const char* kNone = R"({"document":false,"audio":false,"video":false,"photo":false})";
 
-TEST_F(FolderOperationsTest, AnAddedFolderMakesItsShareReady) {
+TEST_F(OperationsTest, AnAddedFolderMakesItsShareReady) {
     FolderAdd(List({"/b/y", "/a/x", "/b/x"}), false);
     std::vector<std::string> expected = {"save", "KESTOSMBSetSpotlight(1)",
                                          "KLIBServiceRestart(samba)",
@@ -68,17 +68,14 @@ TEST_F(FolderOperationsTest, AnAddedFolderMakesItsShareReady) {
     EXPECT_EQ(Queue("/volume1/b"),
               (std::vector{ConfigEvent("/volume1/b/y", kAll), ConfigEvent("/volume1/b/x", kAll)}));
     ExpectNothingHeld();
-}
 
-TEST_F(FolderOperationsTest, AKnownShareGetsNoIndexAndAnUnchangedFolderNoEvent) {
-    FolderAdd(List({"/a/x"}), false);
+    // A known share gets no index, and an unchanged folder no event.
     StartSteps();
     FolderAdd(List({"/a/y"}), false);
     FolderSet(List({"/a/x"}), false);
     Json::Value without_photo = List({"/a/x"});
     without_photo[0]["photo"] = false;
     FolderSet(without_photo, false);
-    FolderSet(List({"/b/x"}), false);  // creates no index either
     for (const std::string& step : Steps()) {
         EXPECT_FALSE(step.starts_with("search ") || step.starts_with("KESTOSMB")) << step;
     }
@@ -87,7 +84,7 @@ TEST_F(FolderOperationsTest, AKnownShareGetsNoIndexAndAnUnchangedFolderNoEvent) 
                            ConfigEvent("/volume1/a/x", kPhoto)}));
 }
 
-TEST_F(FolderOperationsTest, ARefusedRequestChangesNothing) {
+TEST_F(OperationsTest, ARefusedRequestChangesNothing) {
     FolderAdd(List({"/a/x"}), false);
     const Json::Value before = Folders();
     struct Row {
@@ -103,14 +100,12 @@ TEST_F(FolderOperationsTest, ARefusedRequestChangesNothing) {
         std::filesystem::create_directories("/volume1" + many.back());
     }
     const Row rows[] = {
-        {"no array", "/a/y", 120},
         {"malformed", malformed, 120},
         {"not indexable", List({"/a/y", "/a/none"}), 903},
         {"duplicate", List({"/a/y", "/a/x"}), 901},
         {"twice", List({"/a/y", "/a/y"}), 901},
         {"too many", List(many), 900},
         {"unknown share", List({"/c"}), 800},
-        {"no share path", List({"a/y"}), 120},
     };
     StartSteps();
     for (const Row& row : rows) {
@@ -127,7 +122,7 @@ TEST_F(FolderOperationsTest, ARefusedRequestChangesNothing) {
     EXPECT_EQ(Folders().size(), 2U);
 }
 
-TEST_F(FolderOperationsTest, AReindexIsQueuedAndEndsTheNeedForOne) {
+TEST_F(OperationsTest, AReindexIsQueuedAndEndsTheNeedForOne) {
     FolderAdd(List({"/a/x"}), false);
     std::filesystem::remove(QueuePath("/volume1/a"));
     StatusMgr().SetShareStatus("a", kShareNeedReindex);
@@ -146,7 +141,24 @@ TEST_F(FolderOperationsTest, AReindexIsQueuedAndEndsTheNeedForOne) {
     EXPECT_EQ(Status()["share"]["a"], 1);
 }
 
-TEST_F(FolderOperationsTest, DeletingTheLastFolderDropsTheShareThenTheServices) {
+TEST_F(OperationsTest, ACustomEventIsOneLineUnlessAReindexIsPendingAbove) {
+    std::filesystem::create_directories("/volume1/a/@eaDir/fileindex");
+    const std::string reindex = R"({"event":65536,"path":"/volume1/a/x"})";
+    WriteFile(QueuePath("/volume1/a"), reindex);  // its end is missing
+    AddCustomEvent(0x20000, "/volume1/a/x/sub", "", Parse(kAll));
+    EXPECT_EQ(ReadFile(QueuePath("/volume1/a")), reindex);
+    AddCustomEvent(0x40, "/volume1/a/c\nd\xff", "/volume1/a/o", Json::Value());
+    const auto lines = Queue("/volume1/a");
+    ASSERT_EQ(lines.size(), 2U);
+    EXPECT_EQ(lines[1], Parse(R"({"event":64,"path":"/volume1/a/c\nd)"
+                              "\xff"
+                              R"(","path_old":"/volume1/a/o","data":null})"));
+    fake::FailNext("FILEIDXQueuePathCompose");
+    AddCustomEvent(2, "/volume1/a/f", "", Json::Value());
+    EXPECT_TRUE(StatusMgr().GetShareStatus("a") == kShareNeedReindex) << "the event was lost";
+}
+
+TEST_F(OperationsTest, DeletingTheLastFolderDropsTheShareThenTheServices) {
     FolderAdd(List({"/a", "/a/x", "/b/x"}), false);
     StartSteps();
     FolderDelete(Paths({"/a/x", "/b/x"}));
@@ -176,7 +188,65 @@ TEST_F(FolderOperationsTest, DeletingTheLastFolderDropsTheShareThenTheServices) 
     EXPECT_EQ(Steps().back(), "KLIBServicectlStop(pkg-Quivra-fileindexd, 1)");
 }
 
-TEST_F(FolderOperationsTest, AnInterruptedRequestLeavesTheOldSetOrTheNewOne) {
+TEST_F(OperationsTest, AVolumeIsAPlainPrefixAndIsSavedFirst) {
+    AddShare("c", "/volume10");
+    EXPECT_TRUE(toFile(List({"/b", "/a", "/a/x", "/c"}), kFileIndexFoldersCfgPath));
+    SharePause("unindexed");
+    EXPECT_EQ(ErrorOf([] { VolumePause(""); }).code, 120) << "a prefix of all";
+    EXPECT_TRUE(Steps().empty());
+    VolumePause("/volume1");
+    std::vector<std::string> expected = {"save"};
+    for (const std::string root : {"/volume1/a", "/volume1/b", "/volume10/c"}) {
+        const std::string share = root.substr(root.size() - 1);
+        expected.push_back("daemon worker_delete " + share);
+        expected.push_back("MonitorQueue::Delete(" + QueuePath(root) + ", fileindex, 1)");
+        expected.push_back("search index_pause fileindex_" + share);
+    }
+    EXPECT_EQ(Steps(), expected);
+    StartSteps();
+    VolumeResume("/volume10");
+    EXPECT_EQ(Steps(),
+              (std::vector<std::string>{
+                  "save", "search index_resume fileindex_c", "daemon worker_create c",
+                  "MonitorQueue::Upsert(" + QueuePath("/volume10/c") + ", fileindex, 1)"}));
+    ShareResume("b");
+    std::string paused;
+    for (const Json::Value& folder : Folders()) {
+        paused += folder["paused"].asBool() ? folder["path"].asString() : "";
+    }
+    EXPECT_EQ(paused, "/a/a/x");
+}
+
+TEST_F(OperationsTest, WhatIsClearedLosesDataIndexAndFolders) {
+    Json::Value folders = List({"/gone", "/gone/x", "/a", "/b", "/c"});
+    for (const Json::ArrayIndex paused : {2U, 4U}) {
+        folders[paused]["paused"] = true;
+    }
+    folders[2]["volume_to_be_clean"] = folders[3]["volume_to_be_clean"] = "/volume1";
+    folders[4]["volume_to_be_clean"] = "/volume10";
+    EXPECT_TRUE(toFile(folders, kFileIndexFoldersCfgPath));
+    for (const char* share : {"gone", "a", "b"}) {
+        StatusMgr().SetShareStatus(share, kShareNeedReindex);
+    }
+    VolumeClearPaused("/volume1");
+    EXPECT_EQ(Folders().size(), 4U) << "of its two only the paused one goes";
+    EXPECT_EQ(Status()["share"], Parse(R"({"gone":1,"b":1})"));
+
+    EXPECT_TRUE(toFile(List({"/gone", "/gone/x"}), kFileIndexFoldersCfgPath));
+    StartSteps();
+    ShareClearPaused("gone", "/volume9/gone");
+    const std::string place = "/volume9/gone/@eaDir/fileindex/";
+    EXPECT_EQ(Steps(), (std::vector<std::string>{"KLIBCExec(/bin/rm, -rf, " + place + "queue)",
+                                                 "KLIBCExec(/bin/rm, -rf, " + place + "queue.tmp)",
+                                                 "KLIBCExec(/bin/rm, -rf, " + place + "db)", "save",
+                                                 "search index_delete fileindex_gone", "save",
+                                                 "KLIBServiceStop(kestocontentextractd, 0)",
+                                                 "KLIBServicectlStop(pkg-Quivra-fileindexd, 1)"}));
+    EXPECT_EQ(Folders(), Json::Value(Json::arrayValue));
+    EXPECT_EQ(Status()["share"], Parse(R"({"b":1})"));
+}
+
+TEST_F(OperationsTest, AnInterruptedRequestLeavesTheOldSetOrTheNewOne) {
     const std::pair<const char*, std::function<void()>> operations[] = {
         {"add",
          [] {
@@ -187,6 +257,7 @@ TEST_F(FolderOperationsTest, AnInterruptedRequestLeavesTheOldSetOrTheNewOne) {
              FolderSet(List({"/a/x", "/a/y"}), false);
          }},
         {"delete", [] { FolderDelete(Paths({"/a/x"})); }},
+        {"pause", [] { SharePause("a"); }},
     };
     for (const auto& [name, run] : operations) {
         const auto arrange = [&](int failing_call) {
@@ -215,7 +286,7 @@ TEST_F(FolderOperationsTest, AnInterruptedRequestLeavesTheOldSetOrTheNewOne) {
     }
 }
 
-TEST_F(FolderOperationsTest, TwoProcessesLoseNothing) {
+TEST_F(OperationsTest, TwoProcessesLoseNothing) {
     // Lock attempts are few, and a faked sleep would use them up at once.
     fake::OnSleep([](auto) { poll(nullptr, 0, 50); });
     constexpr int kEach = 10;
