@@ -63,14 +63,5 @@ TEST_F(QueueShowTest, NamesAreRawForProgramsAndEscapedOnATerminal) {
               "/s/\x1b[2J\xff");
 }
 
-TEST_F(QueueShowTest, WhatIsNoQueueIsAFailure) {
-    for (const char* path : {"/tmp/no such queue", "/tmp"}) {
-        const Result result = Piped({"queue", "show", path});
-        EXPECT_EQ(result.status, kFailure) << path;
-        EXPECT_EQ(result.out, "") << path;
-        EXPECT_NE(result.err.find(path), std::string::npos) << result.err;
-    }
-}
-
 }  // namespace
 }  // namespace quivra::ctl
