@@ -29,17 +29,9 @@ TEST(Analyzer, CutsTextIntoTokens) {
         std::string text;
         Tokens expected;
     } cases[] = {
-        {Analyzer::kKeyword, "", {}},
         {Analyzer::kKeyword, "Canon EOS/5D\xff", {"Canon EOS/5D\xff"}},
         {Analyzer::kWhiteSpace, " Ann  Lee\tBo\u00a0Ek\n", {"Ann", "Lee", "Bo", "Ek"}},
-        {Analyzer::kWhiteSpace, "caf\xe9 x", {"caf\xe9", "x"}},
-        {Analyzer::kStandard, "", {}},
         {Analyzer::kStandard, " .,;- \n", {}},
-        {Analyzer::kStandard, "The quick (Brown) fox!", {"the", "quick", "brown", "fox"}},
-        {Analyzer::kStandard,
-         "can't 3.14 1,000 a.b x-y",
-         {"can't", "3.14", "1,000", "a.b", "x", "y"}},
-        {Analyzer::kStandard, "end. 'quoted' a_b 5a", {"end", "quoted", "a_b", "5a"}},
         {Analyzer::kStandard,
          "\u00dcber R\u00c9SUM\u00c9 stra\u00dfe",
          {"uber", "resume", "strasse"}},
@@ -51,7 +43,6 @@ TEST(Analyzer, CutsTextIntoTokens) {
          "\u6771\u4eac\u90fd",
          {"\u6771", "\u6771\u4eac", "\u4eac", "\u4eac\u90fd", "\u90fd"}},
         {Analyzer::kStandard, "A\u6771b", {"a", "\u6771", "b"}},
-        {Analyzer::kStandard, "\u30c6\u30b9", {"\u30c6", "\u30c6\u30b9", "\u30b9"}},
         {Analyzer::kStandard,
          "\u0915\u093f \u0e2a\u0e27\u0e31\u0e2a\u0e14\u0e35",
          {"\u0915\u093f", "\u0e2a\u0e27\u0e31\u0e2a\u0e14\u0e35"}},
@@ -67,13 +58,6 @@ TEST(Analyzer, AsksForThePairsOfACjkRunOnly) {
     EXPECT_EQ(TokensOf(Analyzer::kStandard, "\u6771\u4eac\u90fd", Purpose::kQuery),
               (Tokens{"\u6771\u4eac", "\u4eac\u90fd"}));
     EXPECT_EQ(TokensOf(Analyzer::kStandard, "\u6771", Purpose::kQuery), (Tokens{"\u6771"}));
-}
-
-TEST(Analyzer, StopsWhenTheSinkHasEnough) {
-    int seen = 0;
-    EXPECT_FALSE(Analyze(Analyzer::kStandard, Purpose::kIndex, "a b \u6771\u4eac d",
-                         [&](const Token&) { return ++seen < 3; }));
-    EXPECT_EQ(seen, 3);
 }
 
 /// Plain ASCII is cut without ICU: both must agree on every text.

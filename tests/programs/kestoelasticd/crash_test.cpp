@@ -133,12 +133,5 @@ TEST_F(CrashTest, AFullDiskCostsTheBatchOnly) {
     EXPECT_EQ(client.All(), (Ids{"/kept", "/small"}));
 }
 
-TEST_F(CrashTest, ASecondDaemonDoesNotStart) {
-    Program daemon = StartDaemon();
-    EXPECT_EQ(support::RunProgram("kestoelasticd", {}).status, 1);
-    EXPECT_EQ(support::RunProgram("kestoelasticd", {"--nonsense"}).status, 2);
-    EXPECT_TRUE(daemon.IsRunning());
-}
-
 }  // namespace
 }  // namespace elasticd

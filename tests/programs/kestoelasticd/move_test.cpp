@@ -81,24 +81,15 @@ class MoveTest : public testing::Test {
     const Ids kBoth{"/committed", "/pending"};
 };
 
-TEST_F(MoveTest, ANewIdAlone) {
-    EXPECT_EQ(Configure("fileindex_t", ""), 0);
-    EXPECT_EQ(Configure("fileindex_t", ""), 0) << "repeated after success";
-    EXPECT_EQ(client.Commit(), kNoSuchIndex);
-    EXPECT_EQ(Renamed().Commit(), 0);
-    EXPECT_EQ(Renamed().All(), kBoth);
-    Start();
-    EXPECT_EQ(Renamed().All(), kBoth);
-}
-
-TEST_F(MoveTest, ANewPlaceKeepsTheBatchToo) {
+TEST_F(MoveTest, ANewIdAndANewPlaceKeepTheBatchToo) {
     EXPECT_EQ(Configure("", kNew), 0);
-    EXPECT_EQ(Configure("", kNew), 0);
+    EXPECT_EQ(Configure("", kNew), 0) << "repeated after success";
     EXPECT_EQ(client.All(), kBoth);
     EXPECT_FALSE(fs::exists(kOld));
-    EXPECT_EQ(client.Upsert("/later"), 0);
-    EXPECT_EQ(client.Commit(), 0);
-    EXPECT_EQ(client.All().size(), 3U);
+    EXPECT_EQ(Configure("fileindex_t", ""), 0);
+    EXPECT_EQ(client.Commit(), kNoSuchIndex);
+    Start();
+    EXPECT_EQ(Renamed().All(), kBoth);
 }
 
 TEST_F(MoveTest, AnotherFileSystem) {
@@ -137,15 +128,7 @@ TEST_F(MoveTest, WhatIsInTheWayIsKept) {
     EXPECT_EQ(client.All(), kBoth);
 }
 
-TEST_F(MoveTest, AShareThatWasMovedAsAWholeIsFound) {
-    ASSERT_EQ(client.Commit(), 0);
-    fs::rename(kState + "/new", kState + "/empty");
-    fs::rename(kState + "/old", kState + "/new");
-    EXPECT_EQ(Configure("fileindex_t", kNew), 0);
-    EXPECT_EQ(Renamed().All(), kBoth);
-}
-
-TEST_F(MoveTest, ABatchThatMovedAwayFromUnderItIsReportedLost) {
+TEST_F(MoveTest, AShareThatWasMovedAsAWholeIsFoundWithoutItsBatch) {
     fs::rename(kState + "/new", kState + "/empty");
     fs::rename(kState + "/old", kState + "/new");
     EXPECT_EQ(Configure("fileindex_t", kNew), 0);
@@ -165,43 +148,40 @@ TEST_F(MoveTest, AnIndexThatIsNowhereStaysUnavailableUntilItIsBack) {
     EXPECT_EQ(client.All(), kBoth);
 }
 
-TEST_F(MoveTest, InterruptedBeforeTheFilesMoved) {
-    ASSERT_EQ(client.Commit(), 0);
-    EditEntry(RecordMove);
-    fs::copy(kOld, kNew + ".moving", fs::copy_options::recursive);
-    Start();
-    EXPECT_EQ(client.All(), kBoth);
-    EXPECT_TRUE(fs::is_empty(kState + "/new"));
-}
-
-TEST_F(MoveTest, InterruptedAfterTheFilesMoved) {
-    ASSERT_EQ(client.Commit(), 0);
-    EditEntry(RecordMove);
-    fs::rename(kOld, kNew);
-    Start();
-    EXPECT_EQ(Renamed().All(), kBoth);
-    EXPECT_EQ(client.Commit(), kNoSuchIndex);
-}
-
-TEST_F(MoveTest, InterruptedBetweenCopyAndSwitch) {
-    ASSERT_EQ(client.Commit(), 0);
-    EditEntry(RecordMove);
-    fs::copy(kOld, kNew, fs::copy_options::recursive);
-    Start();
-    EXPECT_EQ(client.All(), kBoth);
-    EXPECT_FALSE(fs::exists(kNew)) << "the copy would go stale";
-}
-
-TEST_F(MoveTest, InterruptedBeforeTheOldFilesWereRemoved) {
-    ASSERT_EQ(client.Commit(), 0);
-    fs::copy(kOld, kNew, fs::copy_options::recursive);
-    EditEntry([](Json::Value& entry) {
-        entry["leftover"] = kOld;
-        entry["path"] = kNew;
-    });
-    Start();
-    EXPECT_EQ(client.All(), kBoth);
-    EXPECT_FALSE(fs::exists(kOld));
+/// A recorded move is finished or undone, by where the files are.
+TEST_F(MoveTest, InterruptedWhileMoving) {
+    const auto copy_to = [](const std::string& place) {
+        fs::copy(kOld, place, fs::copy_options::recursive);
+    };
+    const struct {
+        const char* label;
+        std::function<void()> files;
+        std::function<void(Json::Value&)> edit;
+        bool renamed;
+    } cases[] = {
+        {"in the copy", [&] { copy_to(kNew + ".moving"); }, RecordMove, false},
+        {"between copy and switch", [&] { copy_to(kNew); }, RecordMove, false},
+        {"before the old files were removed", [&] { copy_to(kNew); },
+         [](Json::Value& entry) {
+             entry["leftover"] = kOld;
+             entry["path"] = kNew;
+         },
+         false},
+        {"after the files moved", [] { fs::rename(kOld, kNew); }, RecordMove, true},
+    };
+    for (const auto& test : cases) {
+        TearDown();
+        SetUp();
+        ASSERT_EQ(client.Commit(), 0);
+        EditEntry(test.edit);
+        test.files();
+        Start();
+        EXPECT_EQ((test.renamed ? Renamed() : client).All(), kBoth) << test.label;
+        const auto left = [](const char* side) {
+            return std::distance(fs::directory_iterator(kState + side), {});
+        };
+        EXPECT_EQ(left("/old") + left("/new"), 1) << test.label;
+    }
 }
 
 TEST_F(MoveTest, InterruptedWhileDeleting) {
