@@ -82,28 +82,6 @@ TEST_F(FolderTest, AFailureAfterTheSaveSaysHowToGoOn) {
     EXPECT_EQ(fake::Platform()->monitor_queues.size(), 1U);
 }
 
-TEST_F(FolderTest, ListPagesAndSorts) {
-    Piped({"folder", "add", "/photo", "--name", "b"});
-    Piped({"folder", "add", "/music", "--name", "a"});
-    EXPECT_EQ(PipedJson({"folder", "list", "--json", "--sort", "-name"})["folder"][0]["path"],
-              "/photo");
-    const Result page = Piped({"folder", "list", "--limit", "1", "--offset", "1"});
-    EXPECT_EQ(page.out.find("/music"), std::string::npos);
-    EXPECT_NE(page.err.find("1 of 2"), std::string::npos);
-}
-
-TEST_F(FolderTest, ADeletionThatWasCutOffSaysWhatIsLeft) {
-    Piped({"folder", "add", "/photo"});
-    fake::FailNext("MonitorQueue::Delete");
-    const Result result = Piped({"folder", "delete", "/photo"});
-    EXPECT_EQ(result.status, kFailure);
-    EXPECT_NE(result.err.find("share clear photo /volume1/photo'"), std::string::npos)
-        << result.err;
-    EXPECT_EQ(Folders().size(), 0U);
-    EXPECT_EQ(Piped({"share", "clear", "photo", "/volume1/photo"}).status, kSuccess);
-    EXPECT_EQ(search_.Requests().back()["command"], "index_delete");
-}
-
 TEST_F(FolderTest, PausingReachesTheDaemon) {
     Piped({"folder", "add", "/photo"});
     const std::pair<std::vector<std::string>, const char*> rows[] = {

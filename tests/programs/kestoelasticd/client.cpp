@@ -50,24 +50,12 @@ int Client::Create(const std::string& path, const Json::Value& mappings) const {
     return Code("index_create", data);
 }
 
-int Client::Upsert(const std::string& id, const std::string& fields) const {
+int Client::Document(const std::string& command, const std::string& id,
+                     const std::string& fields) const {
     Json::Value data;
     data["doc_id"] = id;
     data["data"] = ParseJson(fields);
-    return Code("document_upsert_by_id", data);
-}
-
-int Client::Set(const std::string& id, const std::string& fields) const {
-    Json::Value data;
-    data["doc_id"] = id;
-    data["data"] = ParseJson(fields);
-    return Code("document_set_by_id", data);
-}
-
-int Client::Delete(const std::string& id) const {
-    Json::Value data;
-    data["doc_id"] = id;
-    return Code("document_del_by_id", data);
+    return Code(command, data);
 }
 
 Json::Value Client::Query(const std::string& query) const {

@@ -30,9 +30,13 @@ class Client {
     int Code(const std::string& command, const Json::Value& data = Json::objectValue) const;
 
     int Create(const std::string& path, const Json::Value& mappings) const;
-    int Upsert(const std::string& id, const std::string& fields = "{}") const;
-    int Set(const std::string& id, const std::string& fields) const;
-    int Delete(const std::string& id) const;
+    int Upsert(const std::string& id, const std::string& fields = "{}") const {
+        return Document("document_upsert_by_id", id, fields);
+    }
+    int Set(const std::string& id, const std::string& fields) const {
+        return Document("document_set_by_id", id, fields);
+    }
+    int Delete(const std::string& id) const { return Document("document_del_by_id", id, "{}"); }
     int Commit() const { return Code("commit"); }
     Json::Value Query(const std::string& query) const;
     /// The ids of the hits, in order; an error's code as "error 1410".
@@ -43,6 +47,9 @@ class Client {
     std::string index = "fileindex_s";
 
   private:
+    int Document(const std::string& command, const std::string& id,
+                 const std::string& fields) const;
+
     Transport transport_;
 };
 

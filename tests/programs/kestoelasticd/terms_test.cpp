@@ -21,29 +21,6 @@ TEST(Terms, EncodedNumbersCompareAsTheNumbersDo) {
     }
 }
 
-TEST(Terms, NumbersAreTakenAsFarAsTheyFit) {
-    const struct {
-        FieldType type;
-        const char* json;
-        bool fits;
-    } cases[] = {
-        {FieldType::kInt, "\"-5\"", true},
-        {FieldType::kInt, "5.0", true},
-        {FieldType::kInt, "5.5", false},
-        {FieldType::kInt, "\"5x\"", false},
-        {FieldType::kInt, "9223372036854775807", true},
-        {FieldType::kInt, "9223372036854775808", false},
-        {FieldType::kDouble, "\"nan\"", false},
-        {FieldType::kDouble, "\"1e999\"", false},
-        {FieldType::kBool, "2", false},
-        {FieldType::kBool, "\"false\"", true},
-    };
-    for (const auto& test : cases) {
-        EXPECT_EQ(EncodeNumber(test.type, ParseJson(test.json)).has_value(), test.fits)
-            << test.json;
-    }
-}
-
 TEST(Terms, LongTermsAreCutAndStayDifferent) {
     const std::string base(kMaxTermSize, 'x');
     EXPECT_EQ(FitTerm(base), base);

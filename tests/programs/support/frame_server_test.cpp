@@ -26,13 +26,14 @@ using quivra::UniqueFd;
 
 const std::string kPath = "/tmp/frame_server_test.sock";
 
-UniqueFd ConnectRaw() {
+/// A socket after `attach`, which is `bind` or `connect`, to the server's path.
+UniqueFd RawSocket(decltype(connect) attach) {
     UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
     sockaddr_un address{};
     address.sun_family = AF_UNIX;
     std::strcpy(address.sun_path, kPath.c_str());
     const auto* generic = reinterpret_cast<const sockaddr*>(&address);
-    EXPECT_EQ(connect(fd.Get(), generic, sizeof(address)), 0) << strerror(errno);
+    EXPECT_EQ(attach(fd.Get(), generic, sizeof(address)), 0) << strerror(errno);
     return fd;
 }
 
@@ -121,7 +122,7 @@ TEST(FrameServer, RefusesHostileFramesAndGoesOn) {
         {"closed in the frame", Frame("hello").substr(0, 6), true},
     };
     for (const auto& test : cases) {
-        const UniqueFd fd = ConnectRaw();
+        const UniqueFd fd = RawSocket(connect);
         EXPECT_EQ(send(fd.Get(), test.bytes.data(), test.bytes.size(), MSG_NOSIGNAL),
                   static_cast<ssize_t>(test.bytes.size()));
         if (test.close_writing) {
@@ -134,7 +135,7 @@ TEST(FrameServer, RefusesHostileFramesAndGoesOn) {
 
 TEST(FrameServer, ReadsAFrameThatComesByteByByteAndIgnoresWhatFollows) {
     RunningServer running;
-    const UniqueFd fd = ConnectRaw();
+    const UniqueFd fd = RawSocket(connect);
     for (const char byte : Frame("slow") + "x") {
         ASSERT_EQ(send(fd.Get(), &byte, 1, MSG_NOSIGNAL), 1);
     }
@@ -152,9 +153,9 @@ TEST(FrameServer, SilentClientsAndSlowReadersHoldUpNobody) {
     });
     std::vector<UniqueFd> silent;
     for (int i = 0; i < 20; ++i) {
-        silent.push_back(ConnectRaw());
+        silent.push_back(RawSocket(connect));
     }
-    const UniqueFd reader = ConnectRaw();
+    const UniqueFd reader = RawSocket(connect);
     send(reader.Get(), Frame("big").data(), 7, MSG_NOSIGNAL);
     EXPECT_EQ(Ask("quick"), "quick");
     // The slow reader is given up at its deadline: what is left in the buffers ends early.
@@ -163,14 +164,7 @@ TEST(FrameServer, SilentClientsAndSlowReadersHoldUpNobody) {
 }
 
 TEST(FrameServer, TakesOverFromTheDeadOnly) {
-    {
-        const UniqueFd dead(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-        sockaddr_un address{};
-        address.sun_family = AF_UNIX;
-        std::strcpy(address.sun_path, kPath.c_str());
-        ASSERT_EQ(bind(dead.Get(), reinterpret_cast<const sockaddr*>(&address), sizeof(address)),
-                  0);
-    }
+    RawSocket(bind);  // and closed at once
     const auto code_of_second = [] {
         try {
             FrameServer second(Options(), Echo);
@@ -204,7 +198,7 @@ TEST(FrameServer, StopFinishesWhatIsBeingHandled) {
     });
     std::jthread client([] { EXPECT_EQ(Ask("in work"), "in work"); });
     started.wait();
-    const UniqueFd silent = ConnectRaw();
+    const UniqueFd silent = RawSocket(connect);
     running.server.Stop();
     EXPECT_TRUE(IsClosedByServer(silent));
     release.count_down();
