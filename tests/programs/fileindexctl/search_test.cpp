@@ -103,7 +103,6 @@ TEST_F(SearchTest, SharesAreMergedByTheirOrder) {
     Put("c", "[]");
     EXPECT_EQ(Piped({"search", "x", "--sort", "-size"}).out, "b10\na9\nb5\na3\na\n");
     EXPECT_EQ(LastQuery()["sort"], Parse(R"([{"field": "KESTOMDFSSize", "order": "desc"}])"));
-    EXPECT_EQ(LastQuery()["fields"], Parse(R"(["KESTOMDPath", "KESTOMDFSSize"])"));
     EXPECT_EQ(Piped({"search", "x"}).out, "a9\nb10\na3\nb5\na\n");
 }
 

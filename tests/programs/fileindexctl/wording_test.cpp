@@ -49,16 +49,13 @@ TEST_F(WordingTest, WrongCallsHaveStatusTwoAndDoNothing) {
         {},
         {"frobnicate"},
         {"queue"},
-        {"queue", "show"},
         {"search"},
         {"search", "--limit", "many", "word"},
-        {"search", "--sort", "colour", "word"},
         {"event", "add", "/volume1/s/a", "--kind", "explode"},
         {"event", "add", "/volume1/s/a", "--kind", "rename"},
         {"event", "add", "/volume1/s/a", "--kind", "create", "--from", "/volume1/s/b"},
         {"folder", "add"},
         {"pause", "999999"},
-        {"status", "now"},
     };
     fake::ScriptedServer indexer(kDaemonSocket);
     for (const std::vector<std::string>& row : rows) {

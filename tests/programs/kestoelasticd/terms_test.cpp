@@ -3,23 +3,12 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
-#include <limits>
 
 #include "programs/kestoelasticd/record.h"
 #include "tests/programs/kestoelasticd/client.h"
 
 namespace elasticd {
 namespace {
-
-TEST(Terms, EncodedNumbersCompareAsTheNumbersDo) {
-    using Limits = std::numeric_limits<std::int64_t>;
-    const std::int64_t ordered[] = {
-        Limits::min(), -(1LL << 53) - 1, -(1LL << 53),    -256,         -1, 0, 1, 255,
-        256,           1LL << 53,        (1LL << 53) + 1, Limits::max()};
-    for (std::size_t i = 1; i < std::size(ordered); ++i) {
-        EXPECT_LT(EncodeInt(ordered[i - 1]), EncodeInt(ordered[i])) << ordered[i];
-    }
-}
 
 TEST(Terms, LongTermsAreCutAndStayDifferent) {
     const std::string base(kMaxTermSize, 'x');
