@@ -16,6 +16,7 @@
 #include "common/json.h"
 #include "fileindex/event.h"
 #include "programs/fileindexd/paths.h"
+#include "tests/fake/fake_libc.h"
 #include "tests/programs/fileindexd/fake_index.h"
 
 namespace fs = std::filesystem;
@@ -308,7 +309,9 @@ TEST_F(PassTest, AVolumeThatVanishesInTheMiddleCommitsNothing) {
             fs::create_directories(root_);
         }
     };
+    fake::ResetLibc();
     EXPECT_THROW(Run(unmount), Error);
+    EXPECT_FALSE(fake::LogLinesWith("is its volume mounted?").empty());
     EXPECT_EQ(index_.Committed(), before);
 
     const std::string outside = "/var/queue";
