@@ -336,7 +336,7 @@ class RandomPassTest : public PassTest {
         fs::create_directories(root_ + "/@eaDir/fileindex");
         index_ = FakeIndex();
         scope_.excluded = {Full("/c/a")};
-        scope_.without_meta = {Full("/b/c")};
+        scope_.without_meta = {Full("/b")};
         IndexAll();
     }
 
