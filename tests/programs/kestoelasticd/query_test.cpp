@@ -62,6 +62,7 @@ TEST_F(QueryTest, FormsFindWhatTheyShould) {
     } cases[] = {
         {R"({"prefix": {"path": "/v/s/a/"}})", {kReport, kTokyo}},
         {R"({"prefix": {"path": "/v/s/a"}})", {"/v/s/a", kReport, kTokyo, "/v/s/ab", kRaw}},
+        {R"({"prefix": {"path": "/v/s/a/R"}})", {kReport}},
         {R"({"prefix": {"path": ""}})", {"/v/s", "/v/s/a", kReport, kTokyo, "/v/s/ab", kRaw}},
         {R"({"prefix": {"parent": "/v"}})", {"/v/s/a"}},
         {R"({"term": {"parent": "/v/s"}})", {"/v/s/a"}},
