@@ -1,6 +1,5 @@
 #include "programs/fileindexd/worker.h"
 
-#include <linux/ioprio.h>
 #include <poll.h>
 #include <sys/eventfd.h>
 #include <sys/resource.h>
@@ -26,6 +25,10 @@ using quivra::Error;
 namespace {
 
 constexpr const char* kUnit = "worker";
+
+// From <linux/ioprio.h>, which some kernel versions ship in a form that is no C++.
+constexpr int kIoPriorityWhoProcess = 1;
+constexpr int kIoPriorityIdle = 3 << 13;
 
 volatile std::sig_atomic_t stop_requested = 0;
 int stop_event = -1;
@@ -58,7 +61,7 @@ void CatchStopSignals() {
 /// Indexing takes what others leave.
 void LowerPriority() {
     setpriority(PRIO_PROCESS, 0, 15);
-    syscall(SYS_ioprio_set, IOPRIO_WHO_PROCESS, 0, IOPRIO_PRIO_VALUE(IOPRIO_CLASS_IDLE, 0));
+    syscall(SYS_ioprio_set, kIoPriorityWhoProcess, 0, kIoPriorityIdle);
 }
 
 class Worker {
