@@ -39,8 +39,4 @@ void SwitchServices(bool enable);
 bool QueueCustomEvent(int event, const std::string& path, const std::string& path_old,
                       const Json::Value& data);
 
-/// Appends an event line to a queue under its lock, whatever is pending there. Error 506 or 502;
-/// the queue is as it was then.
-void AppendEvent(const std::string& queue_path, const Json::Value& event);
-
 }  // namespace quivra::fileindex

@@ -1,13 +1,17 @@
 #include "fileindex/queue_mgr.h"
 
+#include <fcntl.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <cstdio>
 
 #include "common/error.h"
+#include "common/json.h"
 #include "common/lock_file.h"
 #include "common/log.h"
+#include "common/unique_fd.h"
 #include "common/util.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/queue_reader.h"
@@ -35,6 +39,33 @@ bool HasEvent(const std::string& path, const Predicate& predicate) {
     return false;
 }
 
+[[noreturn]] void FailAppend(const char* condition, const char* what) {
+    const std::string reason = std::string(what) + " queue, reason=" + SystemErrorText(errno);
+    Fail({"queue_mgr", __LINE__}, condition, Error(Error::kSystemCallFailed, reason));
+}
+
+/// Whether the last line lacks its end: a writer died, or the disk was full, in the middle of it.
+bool EndsInMidLine(int fd, off_t size) {
+    char last = '\n';
+    return size > 0 && pread(fd, &last, 1, size - 1) == 1 && last != '\n';
+}
+
+/// Appends the line whole or not at all.
+void AppendLine(const std::string& queue_path, const std::string& line) {
+    const UniqueFd fd(open(queue_path.c_str(), O_RDWR | O_APPEND | O_CREAT | O_CLOEXEC, 0644));
+    struct stat status {};
+    if (!fd.IsValid() || fstat(fd.Get(), &status) != 0) {
+        FailAppend("!queue", "Failed to open");
+    }
+    const std::string text = (EndsInMidLine(fd.Get(), status.st_size) ? "\n" : "") + line + "\n";
+    if (!WriteAll(fd.Get(), text.data(), text.size())) {
+        const int saved_errno = errno;
+        [[maybe_unused]] const int cut = ftruncate(fd.Get(), status.st_size);
+        errno = saved_errno;
+        FailAppend("!(queue << line << std::endl)", "Failed to write");
+    }
+}
+
 }  // namespace
 
 QueueMgr::QueueMgr(const std::string& queue_path)
@@ -56,6 +87,11 @@ void QueueMgr::PrepareTmpQueue() {
         Fail({"queue_mgr", 136}, "0 > rename(queue_path_.c_str(), queue_path_tmp_.c_str())",
              Error(Error::kSystemCallFailed, reason));
     }
+}
+
+void QueueMgr::Append(const Json::Value& event) const {
+    const LockFile lock(queue_path_, true);
+    AppendLine(queue_path_, toString(event));
 }
 
 std::shared_ptr<OPTree> QueueMgr::GetOPTree() const {

@@ -1,5 +1,7 @@
 #pragma once
 
+#include <json/json.h>
+
 #include <functional>
 #include <memory>
 #include <string>
@@ -25,6 +27,11 @@ class QUIVRA_EXPORT QueueMgr {
     /// Moves the queue to the working copy, unless there is no queue or still a working copy.
     /// Waits for the queue's lock. Throws Error 506 (lock) or 502 (rename).
     void PrepareTmpQueue();
+
+    /// Appends an event, as one line in the form that Event reads, under the queue's lock; a queue
+    /// that is missing is made, a last line that lacks its end gets one first. Throws Error 506
+    /// (lock) or 502; the queue is as it was then.
+    void Append(const Json::Value& event) const;
 
     /// A new tree of the queue or of the working copy. Throws Error 502 when it cannot be read.
     std::shared_ptr<OPTree> GetOPTree() const;

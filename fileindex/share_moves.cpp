@@ -10,6 +10,7 @@
 #include "fileindex/folder_mgr.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/index_steps.h"
+#include "fileindex/queue_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "sdk/share.h"
 
@@ -88,11 +89,11 @@ void QueueMove(const Move& move, bool with_reindex) {
     event["path"] = move.root_to;
     event["path_old"] = move.root_from;
     event["data"] = Json::Value();
-    AppendEvent(move.queue_path, event);
+    QueueMgr(move.queue_path).Append(event);
     if (with_reindex) {
         event["event"] = static_cast<int>(EVENT_REINDEX);
         event["path_old"] = "";
-        AppendEvent(move.queue_path, event);
+        QueueMgr(move.queue_path).Append(event);
     }
 }
 

@@ -1,20 +1,12 @@
-#include <fcntl.h>
-#include <sys/stat.h>
-#include <unistd.h>
-
 #include <algorithm>
 #include <array>
-#include <cerrno>
 #include <memory>
 #include <ostream>
 
 #include "common/error.h"
 #include "common/json.h"
-#include "common/lock_file.h"
-#include "common/log.h"
-#include "common/unique_fd.h"
-#include "common/util.h"
 #include "fileindex/event.h"
+#include "fileindex/queue_mgr.h"
 #include "fileindex/util.h"
 #include "programs/fileindexctl/command_line.h"
 #include "programs/fileindexctl/paths.h"
@@ -52,26 +44,6 @@ std::string ShareOf(const std::string& full_path) {
         throw Error(Error::kNoSuchShare, full_path);
     }
     return name;
-}
-
-/// Adds whole lines only: the end of a line that a crash cut off is closed first, and a write that
-/// fails half-way is taken back. The caller holds the queue's lock.
-void AppendLine(const std::string& queue, std::string line) {
-    const UniqueFd fd(open(queue.c_str(), O_RDWR | O_APPEND | O_CREAT | O_CLOEXEC, 0644));
-    struct stat status {};
-    if (!fd.IsValid() || fstat(fd.Get(), &status) != 0) {
-        throw Failure("cannot write to " + queue + ": " + SystemErrorText(errno));
-    }
-    char last = '\n';
-    if (status.st_size > 0 && pread(fd.Get(), &last, 1, status.st_size - 1) == 1 && last != '\n') {
-        line.insert(0, "\n");
-    }
-    line += "\n";
-    if (!WriteAll(fd.Get(), line.data(), line.size())) {
-        const std::string reason = SystemErrorText(errno);
-        (void)!ftruncate(fd.Get(), status.st_size);
-        throw Failure("cannot write to " + queue + ": " + reason);
-    }
 }
 
 /// The line as the file monitor would write it: one bit each, "data" for no kind but settings.
@@ -118,11 +90,8 @@ int Add(const Options& options, Session& session) {
     }
     const std::string queue = sdk::SDKShare(share).GetQueuePath();
     const Json::Value event = MakeEvent(options, path, from);
-    // Held for the append alone: the indexer waits for it before it takes the queue away.
-    {
-        const LockFile lock(queue, true);
-        AppendLine(queue, toString(event));
-    }
+    session.doing = "append the change to " + queue;
+    fileindex::QueueMgr(queue).Append(event);
     return Report(session, share, queue, event, options.kind);
 }
 
