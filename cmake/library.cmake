@@ -4,5 +4,5 @@ set_target_properties(fileindex PROPERTIES VERSION ${PROJECT_VERSION} SOVERSION
 target_include_directories(fileindex INTERFACE $<BUILD_INTERFACE:${PROJECT_SOURCE_DIR}>
                                                $<INSTALL_INTERFACE:include/quivra>)
 target_link_libraries(fileindex PUBLIC PkgConfig::JSONCPP kesto::interface
-                      PRIVATE kestoplatform Threads::Threads)
+                      PRIVATE fileindex_base kestoplatform Threads::Threads)
 add_library(quivra::fileindex ALIAS fileindex)

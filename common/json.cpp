@@ -9,7 +9,7 @@
 #include <memory>
 #include <sstream>
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "common/util.h"
 
 namespace quivra {
@@ -39,7 +39,7 @@ bool SyncDirectory(const std::string& file_path) {
     const std::size_t slash = file_path.rfind('/');
     const std::string directory =
         slash == std::string::npos ? "." : file_path.substr(0, slash == 0 ? 1 : slash);
-    const UniqueFd fd(open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    const base::UniqueFd fd(open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
     return fd.IsValid() && fsync(fd.Get()) == 0;
 }
 
@@ -76,7 +76,7 @@ bool fromFile(Json::Value& value, const std::string& path) {
 
 bool toFile(const Json::Value& value, const std::string& path) {
     std::string aside = path + ".XXXXXX";
-    UniqueFd fd(mkostemp(aside.data(), O_CLOEXEC));
+    base::UniqueFd fd(mkostemp(aside.data(), O_CLOEXEC));
     if (!fd.IsValid()) {
         return false;
     }

@@ -15,7 +15,7 @@
 #include "common/error.h"
 #include "common/json.h"
 #include "common/log.h"
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 
 namespace quivra::fileindex {
 namespace {
@@ -124,7 +124,7 @@ void BufferWrite(int fd, unsigned int size, const unsigned char* buf) {
 
 void SendCommandToDaemon(const std::string& type, const Json::Value& data) {
     signal(SIGPIPE, SIG_IGN);
-    const UniqueFd fd_socket(socket(PF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    const base::UniqueFd fd_socket(socket(PF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
     if (!fd_socket.IsValid()) {
         FailChannel({"communication", __LINE__},
                     "0 > (fd_socket = socket(PF_UNIX, SOCK_STREAM, 0))", "socket");

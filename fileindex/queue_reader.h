@@ -5,7 +5,7 @@
 #include <string>
 
 #include "common/log.h"
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 
 namespace quivra::fileindex {
 
@@ -28,7 +28,7 @@ class QueueReader {
   private:
     bool Fill();
 
-    UniqueFd fd_;
+    base::UniqueFd fd_;
     std::unique_ptr<char[]> buffer_;
     const char* next_ = nullptr;
     const char* end_ = nullptr;

@@ -9,7 +9,7 @@
 #include <cstdio>
 #include <cstdlib>
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 
 namespace kesto {
 namespace {
@@ -29,7 +29,7 @@ bool WriteWhole(int fd, const std::string& content) {
 
 bool SyncDirectoryOf(const std::string& path) {
     const std::string directory = path.substr(0, path.rfind('/') + 1);
-    const quivra::UniqueFd fd(open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    const quivra::base::UniqueFd fd(open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
     return fd.IsValid() && fsync(fd.Get()) == 0;
 }
 
@@ -54,7 +54,7 @@ bool ReadUpTo(int fd, std::size_t limit, std::string& out) {
 
 bool ReplaceFile(const std::string& path, const std::string& content, unsigned int mode) {
     std::string aside = path + ".XXXXXX";
-    const quivra::UniqueFd fd(mkostemp(aside.data(), O_CLOEXEC));
+    const quivra::base::UniqueFd fd(mkostemp(aside.data(), O_CLOEXEC));
     if (!fd.IsValid()) {
         return false;
     }

@@ -8,13 +8,13 @@
 #include <cerrno>
 #include <string>
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "platform/standalone/error_state.h"
 
 namespace kesto {
 namespace {
 
-using quivra::UniqueFd;
+using quivra::base::UniqueFd;
 
 enum class Place { kReady, kUnreachable, kUnsafe };
 

@@ -7,7 +7,7 @@
 #include <sys/syscall.h>
 #include <unistd.h>
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "platform/standalone/error_state.h"
 
 namespace kesto {
@@ -35,7 +35,7 @@ bool IsWithinQuota(int fd, unsigned long long bytes) {
 }  // namespace kesto
 
 int KESTOQuotaIsEnough(int /*kind*/, const char* path, unsigned long long bytes) {
-    const quivra::UniqueFd fd(open(path, O_PATH | O_CLOEXEC));
+    const quivra::base::UniqueFd fd(open(path, O_PATH | O_CLOEXEC));
     struct statvfs status {};
     if (!fd.IsValid() || fstatvfs(fd.Get(), &status) != 0) {
         kesto::SetError(KESTO_ERR_SYSTEM);

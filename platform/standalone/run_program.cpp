@@ -12,14 +12,14 @@
 #include <cerrno>
 #include <csignal>
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "platform/standalone/error_state.h"
 #include "platform/standalone/file_io.h"
 
 namespace kesto {
 namespace {
 
-using quivra::UniqueFd;
+using quivra::base::UniqueFd;
 
 constexpr std::size_t kMaxOutput = 64U << 10;
 

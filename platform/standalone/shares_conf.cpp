@@ -16,7 +16,7 @@
 #include <mutex>
 #include <optional>
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "platform/standalone/error_state.h"
 #include "platform/standalone/file_io.h"
 #include "platform/standalone/paths.h"
@@ -236,7 +236,7 @@ struct Cache {
 
 /// Reads the file anew; null with errno set on failure.
 std::shared_ptr<const ShareList> ReadShares(Cache& cache) {
-    const quivra::UniqueFd fd(open(kSharesPath, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
+    const quivra::base::UniqueFd fd(open(kSharesPath, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
     struct stat status {};
     if (!fd.IsValid() || fstat(fd.Get(), &status) != 0) {
         return nullptr;

@@ -13,14 +13,14 @@
 #include <optional>
 #include <thread>
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "platform/standalone/error_state.h"
 #include "platform/standalone/file_io.h"
 
 namespace kesto {
 namespace {
 
-using quivra::UniqueFd;
+using quivra::base::UniqueFd;
 
 constexpr std::size_t kFirstBlock = 64U << 10;
 constexpr std::string_view kReplacement = "\xef\xbf\xbd";

@@ -38,9 +38,9 @@ int DescriptorBuffer::sync() {
 }
 
 Silence::Silence() {
-    const UniqueFd nowhere(open("/dev/null", O_WRONLY | O_CLOEXEC));
-    UniqueFd output(fcntl(STDOUT_FILENO, F_DUPFD_CLOEXEC, STDERR_FILENO + 1));
-    UniqueFd error(fcntl(STDERR_FILENO, F_DUPFD_CLOEXEC, STDERR_FILENO + 1));
+    const base::UniqueFd nowhere(open("/dev/null", O_WRONLY | O_CLOEXEC));
+    base::UniqueFd output(fcntl(STDOUT_FILENO, F_DUPFD_CLOEXEC, STDERR_FILENO + 1));
+    base::UniqueFd error(fcntl(STDERR_FILENO, F_DUPFD_CLOEXEC, STDERR_FILENO + 1));
     if (nowhere.IsValid() && output.IsValid() && error.IsValid()) {
         dup2(nowhere.Get(), STDOUT_FILENO);
         dup2(nowhere.Get(), STDERR_FILENO);

@@ -3,7 +3,7 @@
 #include <array>
 #include <streambuf>
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 
 namespace quivra::ctl {
 
@@ -39,8 +39,8 @@ class Silence {
     Silence& operator=(const Silence&) = delete;
 
   private:
-    UniqueFd output_;  ///< what the two were; invalid: nothing was changed
-    UniqueFd error_;
+    base::UniqueFd output_;  ///< what the two were; invalid: nothing was changed
+    base::UniqueFd error_;
 };
 
 }  // namespace quivra::ctl

@@ -13,7 +13,7 @@
 
 #include "common/error.h"
 #include "common/json.h"
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "fileindex/communication.h"
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/folder_mgr.h"
@@ -29,7 +29,7 @@ constexpr const char* kStateDirectory = "/var/run/fileindexd/";
 
 /// Whether somebody accepts connections there. Never waits.
 bool Listens(const char* socket_path) {
-    const UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
+    const base::UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
     sockaddr_un address{};
     address.sun_family = AF_UNIX;
     std::strncpy(address.sun_path, socket_path, sizeof(address.sun_path) - 1);
@@ -40,7 +40,7 @@ bool Listens(const char* socket_path) {
 
 /// 0 for a file that is not there.
 std::uint64_t CountLines(const std::string& path) {
-    const UniqueFd fd(open(path.c_str(), O_RDONLY | O_CLOEXEC));
+    const base::UniqueFd fd(open(path.c_str(), O_RDONLY | O_CLOEXEC));
     std::array<char, 65536> buffer{};
     std::uint64_t lines = 0;
     char last = '\n';

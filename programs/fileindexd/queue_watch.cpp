@@ -103,7 +103,7 @@ void QueueWatch::HandleEvent(News& news, int watch, unsigned int mask, const cha
 }
 
 void QueueWatch::ReadNewLines(Schedule& schedule, const ChangeRates& rates, Clock::time_point now) {
-    const quivra::UniqueFd fd(open(queue_path_.c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
+    const quivra::base::UniqueFd fd(open(queue_path_.c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
     struct stat info {};
     if (!fd.IsValid() || fstat(fd.Get(), &info) != 0) {
         return;  // a pass, perhaps of another process, has taken it

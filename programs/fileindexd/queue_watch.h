@@ -5,7 +5,7 @@
 #include <string>
 #include <vector>
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "programs/fileindexd/schedule.h"
 
 namespace fileindexd {
@@ -37,7 +37,7 @@ class QueueWatch {
     void HandleEvent(News& news, int watch, unsigned int mask, const char* name) const;
 
     const std::string queue_path_;
-    quivra::UniqueFd inotify_;
+    quivra::base::UniqueFd inotify_;
     int queue_watch_ = -1;
     int status_watch_ = -1;
     ino_t inode_ = 0;   ///< of the queue file that was read last

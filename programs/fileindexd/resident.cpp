@@ -18,7 +18,7 @@
 
 #include "common/error.h"
 #include "common/log.h"
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "programs/fileindexd/controller.h"
 #include "programs/fileindexd/state_file.h"
 #include "programs/support/frame_server.h"
@@ -76,7 +76,7 @@ class CommandQueue {
     }
 
   private:
-    quivra::UniqueFd event_;
+    quivra::base::UniqueFd event_;
     std::mutex mutex_;
     std::deque<Entry> entries_;
     bool closed_ = false;
@@ -91,14 +91,14 @@ std::string Answer(CommandQueue& queue, const std::string& request) {
 }
 
 /// Blocks the signals that the loop waits for, in this thread and those to come.
-quivra::UniqueFd CatchSignals() {
+quivra::base::UniqueFd CatchSignals() {
     sigset_t signals;
     sigemptyset(&signals);
     for (const int signal : {SIGTERM, SIGINT, SIGCHLD}) {
         sigaddset(&signals, signal);
     }
     sigprocmask(SIG_BLOCK, &signals, nullptr);
-    return quivra::UniqueFd(signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK));
+    return quivra::base::UniqueFd(signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK));
 }
 
 class Resident {
@@ -166,7 +166,7 @@ class Resident {
         }
     }
 
-    quivra::UniqueFd signals_;
+    quivra::base::UniqueFd signals_;
     CommandQueue commands_;
     support::FrameServer server_;
     Supervisor supervisor_;

@@ -41,7 +41,7 @@ bool MeansAbsent(int error) {
 }
 
 /// Opens a path below a directory without leaving its file system or following a link.
-quivra::UniqueFd OpenBelow(int directory, const std::string& path, unsigned long long flags) {
+quivra::base::UniqueFd OpenBelow(int directory, const std::string& path, unsigned long long flags) {
     open_how how{};
     how.flags = flags | O_CLOEXEC | O_NOFOLLOW;
     how.resolve = RESOLVE_BENEATH | RESOLVE_NO_SYMLINKS | RESOLVE_NO_XDEV;
@@ -50,7 +50,7 @@ quivra::UniqueFd OpenBelow(int directory, const std::string& path, unsigned long
         fd = static_cast<int>(syscall(SYS_openat2, directory, path.c_str(), &how, sizeof(how)));
         // EAGAIN: something was renamed during the walk, and the kernel cannot vouch for it.
     } while (fd < 0 && (errno == EINTR || errno == EAGAIN));
-    return quivra::UniqueFd(fd);
+    return quivra::base::UniqueFd(fd);
 }
 
 std::optional<Attributes> Stat(int directory, const char* name, int flags) {
@@ -91,7 +91,7 @@ struct CloseDirectory {
 using Directory = std::unique_ptr<DIR, CloseDirectory>;
 
 /// Null, with errno set, on failure.
-Directory OpenDirectory(quivra::UniqueFd fd) {
+Directory OpenDirectory(quivra::base::UniqueFd fd) {
     if (!fd.IsValid()) {
         return nullptr;
     }
@@ -134,7 +134,7 @@ std::optional<Attributes> ShareTree::Look(const std::string& full_path) const {
     if (!relative) {
         return std::nullopt;
     }
-    const quivra::UniqueFd fd = OpenBelow(fd_.Get(), *relative, O_PATH);
+    const quivra::base::UniqueFd fd = OpenBelow(fd_.Get(), *relative, O_PATH);
     if (!fd.IsValid()) {
         if (MeansAbsent(errno)) {
             return std::nullopt;

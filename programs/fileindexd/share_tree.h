@@ -4,7 +4,7 @@
 #include <optional>
 #include <string>
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "programs/fileindexd/index.h"
 
 namespace fileindexd {
@@ -41,7 +41,7 @@ class ShareTree {
     std::optional<std::string> Relative(const std::string& full_path) const;
 
     std::string root_;
-    quivra::UniqueFd fd_;
+    quivra::base::UniqueFd fd_;
 };
 
 }  // namespace fileindexd

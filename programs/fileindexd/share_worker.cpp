@@ -7,7 +7,7 @@
 #include <ctime>
 
 #include "common/log.h"
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "fileindex/index_mgr.h"
 #include "programs/fileindexd/elastic_index.h"
 #include "programs/fileindexd/repair.h"
@@ -22,9 +22,9 @@ namespace {
 constexpr const char* kUnit = "share_worker";
 
 /// Held during a pass, so that `--once` and a worker do not take the same working copy.
-quivra::UniqueFd LockShare(const std::string& share, const std::function<void()>& between) {
+quivra::base::UniqueFd LockShare(const std::string& share, const std::function<void()>& between) {
     const std::string path = std::string(kRunDirectory) + "/" + share + ".lock";
-    quivra::UniqueFd fd(open(path.c_str(), O_RDWR | O_CREAT | O_NOFOLLOW | O_CLOEXEC, 0600));
+    quivra::base::UniqueFd fd(open(path.c_str(), O_RDWR | O_CREAT | O_NOFOLLOW | O_CLOEXEC, 0600));
     int result = fd.IsValid() ? flock(fd.Get(), LOCK_EX) : -1;
     while (fd.IsValid() && result != 0 && errno == EINTR) {
         if (between) {
@@ -61,7 +61,7 @@ bool IsSpaceShort(const std::string& share) {
 ShareWorker::ShareWorker(std::string share) : share_(std::move(share)), state_(share_) {}
 
 PassResult ShareWorker::RunPass(const std::function<void()>& between) {
-    const quivra::UniqueFd lock = LockShare(share_, between);
+    const quivra::base::UniqueFd lock = LockShare(share_, between);
     try {
         PassResult result = RunLocked(between);
         space_notified_ = false;

@@ -10,7 +10,7 @@
 
 #include "common/json.h"
 #include "common/log.h"
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "common/util.h"
 
 namespace fileindexd {
@@ -44,7 +44,7 @@ std::string PathOf(const std::string& share) {
 bool Replace(const std::string& path, const std::string& text) {
     const std::string aside = path + "." + std::to_string(getpid());
     {
-        const quivra::UniqueFd fd(
+        const quivra::base::UniqueFd fd(
             open(aside.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_NOFOLLOW | O_CLOEXEC, 0644));
         if (!fd.IsValid()) {
             return false;

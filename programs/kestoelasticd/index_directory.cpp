@@ -12,7 +12,7 @@
 #include "common/error.h"
 #include "common/json.h"
 #include "common/log.h"
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "common/util.h"
 #include "programs/kestoelasticd/codes.h"
 
@@ -37,7 +37,7 @@ constexpr std::size_t kMaxPath = 3800;  ///< leaves room for the names of the fi
 }
 
 void SyncPath(const std::string& path) {
-    const quivra::UniqueFd fd(open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW));
+    const quivra::base::UniqueFd fd(open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW));
     if (!fd.IsValid() || fsync(fd.Get()) != 0) {
         FailFile("cannot sync " + path);
     }

@@ -9,7 +9,7 @@
 #include "common/error.h"
 #include "common/json.h"
 #include "common/log.h"
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "programs/kestoelasticd/codes.h"
 #include "programs/kestoelasticd/document_editor.h"
 #include "programs/kestoelasticd/engine_error.h"
@@ -26,7 +26,7 @@ constexpr std::size_t kMaxDocumentText = 64 << 20;
 
 /// The engine syncs its files, not the directory that names them.
 void SyncDirectory(const std::string& path) {
-    const quivra::UniqueFd fd(open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    const quivra::base::UniqueFd fd(open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
     if (!fd.IsValid() || fsync(fd.Get()) != 0) {
         quivra::LogError({"index_writer", __LINE__}, "cannot sync %s", path.c_str());
     }

@@ -86,7 +86,7 @@ std::uint64_t AvailableMemory() {
     return UINT64_MAX;
 }
 
-quivra::UniqueFd PrepareState(const ServiceOptions& options) {
+quivra::base::UniqueFd PrepareState(const ServiceOptions& options) {
     if (sodium_init() < 0) {
         throw Error(Error::kSystemCallFailed, "libsodium cannot be used");
     }

@@ -7,7 +7,7 @@
 #include <cstdint>
 #include <string>
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "programs/kestoelasticd/catalog.h"
 
 namespace elasticd {
@@ -40,7 +40,7 @@ class Service {
     void CheckMemory();
 
     const ServiceOptions options_;
-    quivra::UniqueFd lock_;
+    quivra::base::UniqueFd lock_;
     Catalog catalog_;
     std::atomic<std::chrono::steady_clock::rep> memory_checked_ = 0;
 };

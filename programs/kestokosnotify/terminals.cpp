@@ -8,7 +8,7 @@
 #include <cstring>
 #include <set>
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 
 namespace notify {
 namespace {
@@ -24,7 +24,7 @@ bool WriteToTerminal(const std::string& line, const std::string& text) {
     if (line.empty() || line[0] == '/' || line.find("..") != std::string::npos) {
         return false;
     }
-    const quivra::UniqueFd fd(
+    const quivra::base::UniqueFd fd(
         open(("/dev/" + line).c_str(), O_WRONLY | O_NONBLOCK | O_NOCTTY | O_NOFOLLOW | O_CLOEXEC));
     return fd.IsValid() && isatty(fd.Get()) == 1 &&
            write(fd.Get(), text.data(), text.size()) == static_cast<ssize_t>(text.size());

@@ -26,8 +26,8 @@ constexpr int kMaxReads = 16;
 constexpr std::size_t kMaxKnownPaths = 65536;  // per mount
 constexpr std::size_t kMaxUncheckedRenames = 65536;
 
-quivra::UniqueFd OpenDirectory(const std::string& path) {
-    return quivra::UniqueFd(open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+quivra::base::UniqueFd OpenDirectory(const std::string& path) {
+    return quivra::base::UniqueFd(open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
 }
 
 std::string FileSystemOf(int fd) {
@@ -86,7 +86,7 @@ FanotifyEvent ReadEvent(const char* begin, const fanotify_event_metadata& metada
 }  // namespace
 
 std::unique_ptr<FanotifyBackend> FanotifyBackend::Create(BackendSink& sink) {
-    quivra::UniqueFd group(fanotify_init(
+    quivra::base::UniqueFd group(fanotify_init(
         FAN_CLASS_NOTIF | FAN_CLOEXEC | FAN_NONBLOCK | FAN_REPORT_DFID_NAME_TARGET, O_RDONLY));
     if (!group.IsValid()) {
         return nullptr;
@@ -94,17 +94,17 @@ std::unique_ptr<FanotifyBackend> FanotifyBackend::Create(BackendSink& sink) {
     return std::unique_ptr<FanotifyBackend>(new FanotifyBackend(sink, std::move(group)));
 }
 
-FanotifyBackend::FanotifyBackend(BackendSink& sink, quivra::UniqueFd group)
+FanotifyBackend::FanotifyBackend(BackendSink& sink, quivra::base::UniqueFd group)
     : sink_(sink), group_(std::move(group)) {}
 
 bool FanotifyBackend::AddRoot(const std::string& path) {
-    const quivra::UniqueFd fd = OpenDirectory(path);
+    const quivra::base::UniqueFd fd = OpenDirectory(path);
     const auto root = fd.IsValid() ? HandleOf(fd.Get()) : std::nullopt;
     if (!root) {
         return false;
     }
     // The way that every event's directory will go.
-    const quivra::UniqueFd again = OpenHandle(fd.Get(), root->handle);
+    const quivra::base::UniqueFd again = OpenHandle(fd.Get(), root->handle);
     if (!again.IsValid() || PathOfDescriptor(again.Get()) != path) {
         errno = again.IsValid() ? EXDEV : errno;
         return false;
@@ -133,7 +133,7 @@ void FanotifyBackend::RemoveRoot(const std::string& path) {
             }
         }
         // Fails when the file system is gone, and the mark with it.
-        const quivra::UniqueFd fd = OpenDirectory(path);
+        const quivra::base::UniqueFd fd = OpenDirectory(path);
         if (fd.IsValid() && FileSystemOf(fd.Get()) == file_system) {
             fanotify_mark(group_.Get(), FAN_MARK_REMOVE | FAN_MARK_FILESYSTEM, kMarkMask, fd.Get(),
                           nullptr);
@@ -223,9 +223,9 @@ std::string FanotifyBackend::Lookup(View& view, const std::string& handle) const
         return known;
     }
     // No descriptor is kept open, for that would forbid to unmount.
-    const quivra::UniqueFd mount = OpenDirectory(*view.roots.begin());
-    const quivra::UniqueFd fd =
-        mount.IsValid() ? OpenHandle(mount.Get(), handle) : quivra::UniqueFd();
+    const quivra::base::UniqueFd mount = OpenDirectory(*view.roots.begin());
+    const quivra::base::UniqueFd fd =
+        mount.IsValid() ? OpenHandle(mount.Get(), handle) : quivra::base::UniqueFd();
     const std::string path = fd.IsValid() ? PathOfDescriptor(fd.Get()) : std::string();
     if (path.empty()) {
         return path;
@@ -234,7 +234,7 @@ std::string FanotifyBackend::Lookup(View& view, const std::string& handle) const
     std::string above = path;
     for (std::size_t slash = above.rfind('/'); slash != 0; slash = above.rfind('/')) {
         above.resize(slash);
-        const quivra::UniqueFd ancestor = OpenDirectory(above);
+        const quivra::base::UniqueFd ancestor = OpenDirectory(above);
         const auto known_as = ancestor.IsValid() ? HandleOf(ancestor.Get()) : std::nullopt;
         if (!known_as || view.paths.Find(known_as->handle) == above) {
             break;

@@ -7,7 +7,7 @@
 #include <string>
 #include <vector>
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "programs/kestotifyd/backend.h"
 #include "programs/kestotifyd/fanotify_translation.h"
 #include "programs/kestotifyd/handle_paths.h"
@@ -46,7 +46,7 @@ class FanotifyBackend : public Backend {
         std::vector<Rename> renames_before{};  ///< and in the turn before that
     };
 
-    FanotifyBackend(BackendSink& sink, quivra::UniqueFd group);
+    FanotifyBackend(BackendSink& sink, quivra::base::UniqueFd group);
 
     bool ReadEvents();
     void Handle(const FanotifyEvent& event);
@@ -57,7 +57,7 @@ class FanotifyBackend : public Backend {
     std::string Lookup(View& view, const std::string& handle) const;
 
     BackendSink& sink_;
-    quivra::UniqueFd group_;
+    quivra::base::UniqueFd group_;
     std::map<int, View> views_;  ///< by mount id
     std::vector<std::string> completed_;
 };

@@ -34,14 +34,14 @@ std::optional<DirectoryHandle> HandleOf(int directory) {
     return result;
 }
 
-quivra::UniqueFd OpenHandle(int mount, const std::string& handle) {
+quivra::base::UniqueFd OpenHandle(int mount, const std::string& handle) {
     HandleBuffer buffer{};
     if (handle.size() > sizeof(buffer.bytes)) {
         errno = EINVAL;
-        return quivra::UniqueFd();
+        return quivra::base::UniqueFd();
     }
     std::memcpy(buffer.bytes, handle.data(), handle.size());
-    return quivra::UniqueFd(
+    return quivra::base::UniqueFd(
         open_by_handle_at(mount, &buffer.header, O_PATH | O_DIRECTORY | O_CLOEXEC));
 }
 

@@ -3,7 +3,7 @@
 #include <optional>
 #include <string>
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 
 namespace kestotifyd {
 
@@ -18,7 +18,7 @@ std::optional<DirectoryHandle> HandleOf(int directory);
 
 /// Opens the directory of a handle, in the mount that `mount` lies in. Invalid, with errno set,
 /// when it is gone or the file system cannot find it.
-quivra::UniqueFd OpenHandle(int mount, const std::string& handle);
+quivra::base::UniqueFd OpenHandle(int mount, const std::string& handle);
 
 /// The path of an open directory; empty when it has been removed or is not visible from here.
 std::string PathOfDescriptor(int directory);

@@ -46,7 +46,7 @@ struct DirectoryCloser {
 };
 
 /// The entries that are directories.
-bool ListDirectories(quivra::UniqueFd fd, std::vector<std::string>& names) {
+bool ListDirectories(quivra::base::UniqueFd fd, std::vector<std::string>& names) {
     const std::unique_ptr<DIR, DirectoryCloser> directory(fdopendir(fd.Get()));
     if (!directory) {
         return false;
@@ -241,9 +241,9 @@ void InotifyBackend::Release(const std::vector<int>& watches) {
 
 /// Opens the directory of a node, provided that the node's path still leads to it. Setting a watch
 /// that is there already answers its descriptor: that is the proof.
-quivra::UniqueFd InotifyBackend::OpenVerified(WatchNode& node) {
+quivra::base::UniqueFd InotifyBackend::OpenVerified(WatchNode& node) {
     const int link_flag = node.parent == nullptr ? 0 : O_NOFOLLOW;
-    quivra::UniqueFd fd(open(node.Path().c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC | link_flag));
+    quivra::base::UniqueFd fd(open(node.Path().c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC | link_flag));
     if (!fd.IsValid()) {
         return fd;
     }
@@ -255,7 +255,7 @@ quivra::UniqueFd InotifyBackend::OpenVerified(WatchNode& node) {
         inotify_rm_watch(inotify_.Get(), wd);
     }
     errno = wd < 0 ? errno : ESTALE;
-    return quivra::UniqueFd();
+    return quivra::base::UniqueFd();
 }
 
 InotifyBackend::Child InotifyBackend::EnsureChild(WatchNode& parent, int parent_fd,
@@ -303,7 +303,7 @@ void InotifyBackend::Appear(const NodeRef& parent, const std::string& name, int 
     if (!IsAlive(parent)) {
         return;
     }
-    const quivra::UniqueFd fd = OpenVerified(*parent.node);
+    const quivra::base::UniqueFd fd = OpenVerified(*parent.node);
     if (!fd.IsValid()) {
         ScheduleRetry(parent, name, attempts);
         return;
@@ -368,7 +368,7 @@ void InotifyBackend::ScanDirectory(Scan& scan, const NodeRef& ref) {
     if (!IsAlive(ref)) {
         return;
     }
-    const quivra::UniqueFd fd = OpenVerified(*ref.node);
+    const quivra::base::UniqueFd fd = OpenVerified(*ref.node);
     if (!fd.IsValid()) {
         if (IsRefusal(errno)) {
             Refuse(errno, ref.node->Root().name, ref.node->Path());
@@ -377,7 +377,7 @@ void InotifyBackend::ScanDirectory(Scan& scan, const NodeRef& ref) {
         return;
     }
     std::vector<std::string> names;
-    quivra::UniqueFd listing(openat(fd.Get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    quivra::base::UniqueFd listing(openat(fd.Get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
     if (!listing.IsValid() || !ListDirectories(std::move(listing), names)) {
         return;
     }

@@ -6,7 +6,7 @@
 #include <string>
 #include <vector>
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "programs/kestotifyd/backend.h"
 #include "programs/kestotifyd/inotify_translation.h"
 #include "programs/kestotifyd/move_pairing.h"
@@ -65,7 +65,7 @@ class InotifyBackend : public Backend {
     bool IsAlive(const NodeRef& ref) const;
     int Watch(const std::string& path, bool follow);
     void Release(const std::vector<int>& watches);
-    quivra::UniqueFd OpenVerified(WatchNode& node);
+    quivra::base::UniqueFd OpenVerified(WatchNode& node);
 
     /// How an entry of a directory stands after EnsureChild.
     struct Child {
@@ -92,7 +92,7 @@ class InotifyBackend : public Backend {
     void Refuse(int error_number, const std::string& root, const std::string& path);
 
     BackendSink& sink_;
-    quivra::UniqueFd inotify_;
+    quivra::base::UniqueFd inotify_;
     std::size_t configured_limit_;
     std::size_t limit_ = 0;
     WatchTree tree_;

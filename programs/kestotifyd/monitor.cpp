@@ -49,12 +49,12 @@ std::string MakeDirectory(const std::string& path) {
     return path;
 }
 
-quivra::UniqueFd OpenSignals() {
+quivra::base::UniqueFd OpenSignals() {
     sigset_t signals;
     sigemptyset(&signals);
     sigaddset(&signals, SIGTERM);
     sigaddset(&signals, SIGINT);
-    return quivra::UniqueFd(signalfd(-1, &signals, SFD_NONBLOCK | SFD_CLOEXEC));
+    return quivra::base::UniqueFd(signalfd(-1, &signals, SFD_NONBLOCK | SFD_CLOEXEC));
 }
 
 bool IsEmptyDirectory(const std::string& path) {

@@ -7,7 +7,7 @@
 #include <set>
 #include <string>
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "programs/kestotifyd/backend.h"
 #include "programs/kestotifyd/mount_table.h"
 #include "programs/kestotifyd/options.h"
@@ -62,10 +62,10 @@ class Monitor : private BackendSink {
     void Stop();
 
     const Options options_;
-    quivra::UniqueFd instance_lock_;
-    quivra::UniqueFd epoll_;
-    quivra::UniqueFd signals_;
-    quivra::UniqueFd registration_events_;
+    quivra::base::UniqueFd instance_lock_;
+    quivra::base::UniqueFd epoll_;
+    quivra::base::UniqueFd signals_;
+    quivra::base::UniqueFd registration_events_;
     MountTable mounts_;
     WatchedFolders watched_;
     QueueSet queues_;

@@ -4,7 +4,7 @@
 #include <string>
 #include <utility>
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 
 namespace kestotifyd {
 
@@ -32,7 +32,7 @@ class MountTable {
     std::set<std::string> Below(const std::string& path) const;
 
   private:
-    quivra::UniqueFd fd_;
+    quivra::base::UniqueFd fd_;
     std::set<std::string> points_;
     std::set<std::string> removed_;
 };

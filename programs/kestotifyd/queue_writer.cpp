@@ -49,7 +49,7 @@ QueueWriter::Result QueueWriter::Write() {
     if (pending_.empty()) {
         return Result::kDone;
     }
-    quivra::UniqueFd queue;
+    quivra::base::UniqueFd queue;
     const Result opened = OpenLocked(queue);
     if (opened == Result::kFailed) {
         return Fail("open or lock");
@@ -78,7 +78,7 @@ QueueWriter::Result QueueWriter::Fail(const char* action) {
     return Result::kFailed;
 }
 
-QueueWriter::Result QueueWriter::OpenLocked(quivra::UniqueFd& queue) const {
+QueueWriter::Result QueueWriter::OpenLocked(quivra::base::UniqueFd& queue) const {
     for (int attempt = 0; attempt < kMaxOpenAttempts; ++attempt) {
         queue.Reset(open(path_.c_str(),
                          O_RDWR | O_APPEND | O_CREAT | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, 0600));

@@ -5,7 +5,7 @@
 #include <string>
 #include <vector>
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 
 namespace kestotifyd {
 
@@ -42,7 +42,7 @@ class QueueWriter {
 
   private:
     Result Fail(const char* action);
-    Result OpenLocked(quivra::UniqueFd& queue) const;
+    Result OpenLocked(quivra::base::UniqueFd& queue) const;
     bool EndTornLine(int fd);
     Result Append(int fd);
     void DropWritten(std::size_t size);

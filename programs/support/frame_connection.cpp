@@ -29,7 +29,7 @@ ssize_t Receive(int fd, char* buffer, std::size_t size) {
 
 }  // namespace
 
-FrameConnection::FrameConnection(quivra::UniqueFd fd, Clock::time_point deadline)
+FrameConnection::FrameConnection(quivra::base::UniqueFd fd, Clock::time_point deadline)
     : fd_(std::move(fd)), deadline_(deadline) {}
 
 FrameConnection::Progress FrameConnection::ReadPrefix() {

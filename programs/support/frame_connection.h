@@ -6,7 +6,7 @@
 #include <cstdint>
 #include <string>
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 
 namespace support {
 
@@ -22,7 +22,7 @@ class FrameConnection {
     };
 
     /// `fd` is a non-blocking stream socket.
-    FrameConnection(quivra::UniqueFd fd, Clock::time_point deadline);
+    FrameConnection(quivra::base::UniqueFd fd, Clock::time_point deadline);
     FrameConnection(const FrameConnection&) = delete;
     FrameConnection& operator=(const FrameConnection&) = delete;
 
@@ -45,7 +45,7 @@ class FrameConnection {
   private:
     Progress ReadPrefix();
 
-    quivra::UniqueFd fd_;
+    quivra::base::UniqueFd fd_;
     Clock::time_point deadline_;
     char prefix_[sizeof(std::uint32_t)] = {};
     std::size_t prefix_moved_ = 0;  ///< bytes of the prefix read or written so far

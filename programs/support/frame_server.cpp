@@ -23,7 +23,7 @@ namespace support {
 namespace {
 
 using quivra::Error;
-using quivra::UniqueFd;
+using quivra::base::UniqueFd;
 
 constexpr std::chrono::seconds kStopGrace{2};
 constexpr std::chrono::milliseconds kAcceptPause{100};

@@ -14,7 +14,7 @@
 #include <string>
 #include <unordered_map>
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "programs/support/frame_connection.h"
 
 namespace support {
@@ -90,10 +90,10 @@ class FrameServer {
 
     const FrameServerOptions options_;
     const Handler handler_;
-    quivra::UniqueFd lock_;
-    quivra::UniqueFd listener_;
-    quivra::UniqueFd epoll_;
-    quivra::UniqueFd wake_;
+    quivra::base::UniqueFd lock_;
+    quivra::base::UniqueFd listener_;
+    quivra::base::UniqueFd epoll_;
+    quivra::base::UniqueFd wake_;
     std::atomic<bool> stop_ = false;
 
     // Only the thread of Run uses these.

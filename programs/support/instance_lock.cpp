@@ -10,8 +10,8 @@
 
 namespace support {
 
-quivra::UniqueFd TakeInstanceLock(const std::string& path) {
-    quivra::UniqueFd fd(open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600));
+quivra::base::UniqueFd TakeInstanceLock(const std::string& path) {
+    quivra::base::UniqueFd fd(open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600));
     if (!fd.IsValid() || flock(fd.Get(), LOCK_EX | LOCK_NB) != 0) {
         const std::string reason =
             errno == EWOULDBLOCK ? "another process holds " + path

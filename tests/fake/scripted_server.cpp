@@ -13,11 +13,11 @@
 #include <thread>
 
 #include "common/json.h"
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 
 namespace fake {
 
-using quivra::UniqueFd;
+using quivra::base::UniqueFd;
 
 struct ScriptedServer::State {
     std::string path;

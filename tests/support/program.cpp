@@ -13,7 +13,7 @@
 #include <thread>
 #include <utility>
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 
 namespace support {
 namespace {
@@ -46,7 +46,7 @@ bool Answers(const std::string& socket_path) {
     sockaddr_un address{};
     address.sun_family = AF_UNIX;
     std::strncpy(address.sun_path, socket_path.c_str(), sizeof(address.sun_path) - 1);
-    const quivra::UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    const quivra::base::UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
     return connect(fd.Get(), reinterpret_cast<const sockaddr*>(&address), sizeof(address)) == 0;
 }
 
@@ -55,7 +55,7 @@ bool Answers(const std::string& socket_path) {
 Program::Program(const std::string& name, const std::vector<std::string>& arguments) {
     std::filesystem::create_directories("/var/log");
     const std::string log = "/var/log/" + name + ".log";
-    const quivra::UniqueFd output(
+    const quivra::base::UniqueFd output(
         open(log.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644));
     pid_ = Spawn(name, arguments, output.Get());
 }
@@ -102,8 +102,8 @@ Outcome RunProgram(const std::string& name, const std::vector<std::string>& argu
     if (pipe2(ends, O_CLOEXEC) != 0) {
         throw std::runtime_error("no pipe");
     }
-    const quivra::UniqueFd reader(ends[0]);
-    quivra::UniqueFd writer(ends[1]);
+    const quivra::base::UniqueFd reader(ends[0]);
+    quivra::base::UniqueFd writer(ends[1]);
     const pid_t pid = Spawn(name, arguments, writer.Get());
     writer.Reset();
     Outcome outcome{};

@@ -22,7 +22,7 @@ namespace support {
 namespace {
 
 using namespace std::chrono_literals;
-using quivra::UniqueFd;
+using quivra::base::UniqueFd;
 
 const std::string kPath = "/tmp/frame_server_test.sock";
 

@@ -4,7 +4,7 @@
 
 #include <utility>
 
-namespace quivra {
+namespace quivra::base {
 
 /// Owns a file descriptor and closes it. -1 stands for none.
 class UniqueFd {
@@ -34,4 +34,4 @@ class UniqueFd {
     int fd_ = -1;
 };
 
-}  // namespace quivra
+}  // namespace quivra::base
