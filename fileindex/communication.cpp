@@ -12,10 +12,10 @@
 #include <cstdint>
 #include <cstring>
 
+#include "base/unique_fd.h"
 #include "common/error.h"
 #include "common/json.h"
 #include "common/log.h"
-#include "base/unique_fd.h"
 
 namespace quivra::fileindex {
 namespace {

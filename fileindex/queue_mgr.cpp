@@ -7,11 +7,11 @@
 #include <cerrno>
 #include <cstdio>
 
+#include "base/unique_fd.h"
 #include "common/error.h"
 #include "common/json.h"
 #include "common/lock_file.h"
 #include "common/log.h"
-#include "base/unique_fd.h"
 #include "common/util.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/queue_reader.h"
@@ -52,7 +52,8 @@ bool EndsInMidLine(int fd, off_t size) {
 
 /// Appends the line whole or not at all.
 void AppendLine(const std::string& queue_path, const std::string& line) {
-    const base::UniqueFd fd(open(queue_path.c_str(), O_RDWR | O_APPEND | O_CREAT | O_CLOEXEC, 0644));
+    const base::UniqueFd fd(
+        open(queue_path.c_str(), O_RDWR | O_APPEND | O_CREAT | O_CLOEXEC, 0644));
     struct stat status {};
     if (!fd.IsValid() || fstat(fd.Get(), &status) != 0) {
         FailAppend("!queue", "Failed to open");

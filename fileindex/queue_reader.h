@@ -4,8 +4,8 @@
 #include <memory>
 #include <string>
 
-#include "common/log.h"
 #include "base/unique_fd.h"
+#include "common/log.h"
 
 namespace quivra::fileindex {
 

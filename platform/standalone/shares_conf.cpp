@@ -236,7 +236,8 @@ struct Cache {
 
 /// Reads the file anew; null with errno set on failure.
 std::shared_ptr<const ShareList> ReadShares(Cache& cache) {
-    const quivra::base::UniqueFd fd(open(kSharesPath, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
+    const quivra::base::UniqueFd fd(
+        open(kSharesPath, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
     struct stat status {};
     if (!fd.IsValid() || fstat(fd.Get(), &status) != 0) {
         return nullptr;

@@ -11,9 +11,9 @@
 #include <csignal>
 #include <cstring>
 
+#include "base/unique_fd.h"
 #include "common/error.h"
 #include "common/json.h"
-#include "base/unique_fd.h"
 #include "fileindex/communication.h"
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/folder_mgr.h"

@@ -16,9 +16,9 @@
 #include <thread>
 #include <utility>
 
+#include "base/unique_fd.h"
 #include "common/error.h"
 #include "common/log.h"
-#include "base/unique_fd.h"
 #include "programs/fileindexd/controller.h"
 #include "programs/fileindexd/state_file.h"
 #include "programs/support/frame_server.h"

@@ -6,8 +6,8 @@
 #include <cerrno>
 #include <ctime>
 
-#include "common/log.h"
 #include "base/unique_fd.h"
+#include "common/log.h"
 #include "fileindex/index_mgr.h"
 #include "programs/fileindexd/elastic_index.h"
 #include "programs/fileindexd/repair.h"

@@ -8,9 +8,9 @@
 #include <cstdio>
 #include <ctime>
 
+#include "base/unique_fd.h"
 #include "common/json.h"
 #include "common/log.h"
-#include "base/unique_fd.h"
 #include "common/util.h"
 
 namespace fileindexd {

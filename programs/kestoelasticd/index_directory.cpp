@@ -9,10 +9,10 @@
 #include <filesystem>
 #include <system_error>
 
+#include "base/unique_fd.h"
 #include "common/error.h"
 #include "common/json.h"
 #include "common/log.h"
-#include "base/unique_fd.h"
 #include "common/util.h"
 #include "programs/kestoelasticd/codes.h"
 

@@ -6,10 +6,10 @@
 #include <cerrno>
 #include <utility>
 
+#include "base/unique_fd.h"
 #include "common/error.h"
 #include "common/json.h"
 #include "common/log.h"
-#include "base/unique_fd.h"
 #include "programs/kestoelasticd/codes.h"
 #include "programs/kestoelasticd/document_editor.h"
 #include "programs/kestoelasticd/engine_error.h"

@@ -243,7 +243,8 @@ void InotifyBackend::Release(const std::vector<int>& watches) {
 /// that is there already answers its descriptor: that is the proof.
 quivra::base::UniqueFd InotifyBackend::OpenVerified(WatchNode& node) {
     const int link_flag = node.parent == nullptr ? 0 : O_NOFOLLOW;
-    quivra::base::UniqueFd fd(open(node.Path().c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC | link_flag));
+    quivra::base::UniqueFd fd(
+        open(node.Path().c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC | link_flag));
     if (!fd.IsValid()) {
         return fd;
     }

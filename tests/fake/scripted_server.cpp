@@ -12,8 +12,8 @@
 #include <stdexcept>
 #include <thread>
 
-#include "common/json.h"
 #include "base/unique_fd.h"
+#include "common/json.h"
 
 namespace fake {
 
