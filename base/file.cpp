@@ -30,22 +30,39 @@ class KeepErrno {
 };
 
 /// What openat2 does in one call, for kernels before 5.6 and sandboxes that do not know it.
-UniqueFd WalkToDirectory(int parent, const std::string& path) {
-    const int flags = O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC;
-    UniqueFd fd(openat(parent, path.starts_with('/') ? "/" : ".", flags));
-    for (std::size_t begin = 0; fd.IsValid() && begin < path.size();) {
+UniqueFd WalkTo(int parent, const std::string& path, int flags) {
+    // O_PATH: to pass through a directory takes no right to list it.
+    constexpr int kStep = O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC;
+    UniqueFd fd(openat(parent, path.starts_with('/') ? "/" : ".", kStep));
+    for (std::size_t begin = 0; fd.IsValid() && begin <= path.size();) {
         const std::size_t end = std::min(path.find('/', begin), path.size());
         const std::string component = path.substr(begin, end - begin);
         if (component == "..") {
             errno = EXDEV;
             return UniqueFd();
         }
-        if (!component.empty()) {
-            fd = UniqueFd(openat(fd.Get(), component.c_str(), flags));
+        // The last component may be empty: behind a final "/", or of "/" itself.
+        if (!component.empty() || end == path.size()) {
+            fd = UniqueFd(openat(fd.Get(), component.empty() ? "." : component.c_str(),
+                                 end == path.size() ? flags | O_NOFOLLOW : kStep));
         }
         begin = end + 1;
     }
     return fd;
+}
+
+/// Opens what is at the path when no component of it is a link.
+UniqueFd OpenWithoutLinks(int parent, const std::string& path, int flags) {
+    open_how how{};
+    how.flags = static_cast<unsigned int>(flags);
+    how.resolve = RESOLVE_NO_SYMLINKS | RESOLVE_NO_MAGICLINKS;
+    if (!path.starts_with('/')) {
+        how.resolve |= RESOLVE_BENEATH;
+    }
+    UniqueFd fd(static_cast<int>(syscall(SYS_openat2, parent, path.c_str(), &how, sizeof(how))));
+    // EPERM is what seccomp filters return for calls that they do not know.
+    return fd.IsValid() || (errno != ENOSYS && errno != EPERM) ? std::move(fd)
+                                                               : WalkTo(parent, path, flags);
 }
 
 /// Opens and locks the file that a replacement is written to. It is kept under one name, so that a
@@ -105,15 +122,25 @@ bool ReadUpTo(int fd, std::size_t limit, std::string& out) {
 }
 
 UniqueFd OpenDirectory(int parent, const std::string& path) {
-    open_how how{};
-    how.flags = O_RDONLY | O_DIRECTORY | O_CLOEXEC;
-    how.resolve = RESOLVE_NO_SYMLINKS | RESOLVE_NO_MAGICLINKS;
-    if (!path.starts_with('/')) {
-        how.resolve |= RESOLVE_BENEATH;
+    return OpenWithoutLinks(parent, path, O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+}
+
+UniqueFd FindObject(int parent, const std::string& path) {
+    return OpenWithoutLinks(parent, path, O_PATH | O_NOFOLLOW | O_CLOEXEC);
+}
+
+UniqueFd OpenFound(int object, int flags) {
+    struct stat status {};
+    if (fstat(object, &status) != 0) {
+        return UniqueFd();
     }
-    UniqueFd fd(static_cast<int>(syscall(SYS_openat2, parent, path.c_str(), &how, sizeof(how))));
-    return fd.IsValid() || (errno != ENOSYS && errno != EPERM) ? std::move(fd)
-                                                               : WalkToDirectory(parent, path);
+    if (!S_ISREG(status.st_mode) && !S_ISDIR(status.st_mode)) {
+        errno = EINVAL;
+        return UniqueFd();
+    }
+    // The kernel opens the object itself here; no path is looked up.
+    return UniqueFd(open(("/proc/self/fd/" + std::to_string(object)).c_str(),
+                         flags | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
 }
 
 UniqueFd OpenRegular(int directory, const std::string& name, int flags, mode_t mode) {

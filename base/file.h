@@ -26,6 +26,17 @@ bool ReadUpTo(int fd, std::size_t limit, std::string& out);
 /// `parent`, and cannot lead out of it.
 UniqueFd OpenDirectory(int parent, const std::string& path);
 
+/// Names the object at the path for good, following no link in any component. The descriptor
+/// (O_PATH) stands for that object, whatever happens to its name meanwhile; a link as the last
+/// component is found itself. Nothing is waited for, no device woken, no mount triggered. For
+/// fstat, statx and OpenFound. A relative path starts at `parent`, and cannot lead out of it.
+UniqueFd FindObject(int parent, const std::string& path);
+
+/// Opens the regular file or directory that FindObject named, whatever has its name now: `flags`
+/// as of open(2). Never waits: EWOULDBLOCK where somebody else holds a lease on the file, EINVAL
+/// for what is neither file nor directory. Needs /proc.
+UniqueFd OpenFound(int object, int flags);
+
 /// Opens a regular file. `flags` as of open(2); what is not a regular file is refused at once,
 /// without waiting for a FIFO's other end or waking a device: ELOOP for a link, EINVAL for the
 /// rest.

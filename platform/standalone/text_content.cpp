@@ -1,26 +1,18 @@
 #include "platform/standalone/text_content.h"
 
-#include <fcntl.h>
 #include <iconv.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <array>
 #include <cerrno>
-#include <chrono>
 #include <cstdint>
 #include <optional>
-#include <thread>
 
-#include "base/unique_fd.h"
-#include "platform/standalone/error_state.h"
-#include "platform/standalone/file_io.h"
+#include "base/file.h"
 
 namespace kesto {
 namespace {
-
-using quivra::base::UniqueFd;
 
 constexpr std::size_t kFirstBlock = 64U << 10;
 constexpr std::string_view kReplacement = "\xef\xbf\xbd";
@@ -130,27 +122,6 @@ void Shorten(std::string& text) {
     }
 }
 
-/// Opens for reading without leaving a trace in the access time, which only the owner may ask for.
-/// A file that a file server has leased to a client answers EWOULDBLOCK while it is called back.
-UniqueFd OpenQuietly(const std::string& path) {
-    constexpr int kFlags = O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
-    constexpr int kTries = 20;
-    UniqueFd fd;
-    for (int tried = 0; tried < kTries && !fd.IsValid(); ++tried) {
-        fd.Reset(open(path.c_str(), kFlags | O_NOATIME));
-        if (!fd.IsValid() && errno == EPERM) {
-            fd.Reset(open(path.c_str(), kFlags));
-        }
-        if (!fd.IsValid() && errno != EWOULDBLOCK && errno != EINTR) {
-            break;
-        }
-        if (!fd.IsValid()) {
-            std::this_thread::sleep_for(std::chrono::milliseconds(100));
-        }
-    }
-    return fd;
-}
-
 }  // namespace
 
 bool IsTextBeginning(std::string_view block) {
@@ -187,18 +158,20 @@ std::string DecodeText(std::string_view raw) {
     return text;
 }
 
-bool ReadText(const std::string& path, std::string& text) {
-    const KeepErrno keep_errno;
-    const UniqueFd fd = OpenQuietly(path);
-    struct stat status {};
+TextResult ReadText(int fd, std::string& text) {
     std::string raw;
-    if (!fd.IsValid() || fstat(fd.Get(), &status) != 0 || !S_ISREG(status.st_mode) ||
-        !ReadUpTo(fd.Get(), kFirstBlock, raw) || !IsTextBeginning(raw) ||
-        !ReadUpTo(fd.Get(), kMaxTextSize - raw.size(), raw)) {
-        return false;
+    if (lseek(fd, 0, SEEK_SET) != 0 || !quivra::base::ReadUpTo(fd, kFirstBlock, raw)) {
+        return TextResult::kReadFailed;
+    }
+    // A film costs one block of reading, not its first megabytes.
+    if (!IsTextBeginning(raw)) {
+        return TextResult::kNoText;
+    }
+    if (!quivra::base::ReadUpTo(fd, kMaxTextSize - raw.size(), raw)) {
+        return TextResult::kReadFailed;
     }
     text = DecodeText(raw);
-    return true;
+    return TextResult::kText;
 }
 
 }  // namespace kesto

@@ -19,8 +19,13 @@ bool IsTextBeginning(std::string_view block);
 /// dropped.
 std::string DecodeText(std::string_view raw);
 
-/// The text of a regular plain-text file. False when the object is anything else, when it is not
-/// text, or when it cannot be read. Never blocks on a FIFO or device and follows no link.
-bool ReadText(const std::string& path, std::string& text);
+enum class TextResult {
+    kText,
+    kNoText,      ///< the file holds something else than plain text
+    kReadFailed,  ///< errno tells why
+};
+
+/// Takes the text of a plain-text file that is open for reading, from its beginning.
+TextResult ReadText(int fd, std::string& text);
 
 }  // namespace kesto

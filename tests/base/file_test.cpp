@@ -1,12 +1,16 @@
 #include "base/file.h"
 
+#include <dlfcn.h>
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
+#include <unistd.h>
 
 #include <cerrno>
 #include <csignal>
+#include <cstdarg>
 #include <filesystem>
 #include <fstream>
 #include <functional>
@@ -19,6 +23,8 @@ namespace {
 
 namespace fs = std::filesystem;
 using namespace quivra::base;
+
+bool has_openat2 = true;
 
 class FileTest : public testing::Test {
   protected:
@@ -61,6 +67,33 @@ TEST_F(FileTest, WhatIsNoRegularFileIsRefusedWithoutWaiting) {
     EXPECT_FALSE(OpenDirectory(AT_FDCWD, "/tmp/file_test_link/directory").IsValid());
     fs::remove("/tmp/file_test_link");
     EXPECT_FALSE(OpenDirectory(directory_.Get(), "../file_test").IsValid());
+}
+
+TEST_F(FileTest, WhatWasFoundIsOpenedWhateverHasItsName) {
+    fs::create_directories(dir_ + "/a/b");
+    Write(dir_ + "/a/b/file", "found");
+    fs::create_symlink("b", dir_ + "/a/link");
+    ASSERT_EQ(mkfifo((dir_ + "/a/fifo").c_str(), 0600), 0);
+    for (const bool has_it : {true, false}) {
+        has_openat2 = has_it;
+        const auto find = [&](const char* path) { return FindObject(directory_.Get(), path); };
+        const UniqueFd file = find("a/b/file");
+        const UniqueFd fifo = find("a/fifo");
+        const UniqueFd link = find("a/link");
+        EXPECT_TRUE(fifo.IsValid() && link.IsValid() && find("a/b").IsValid());
+        EXPECT_FALSE(OpenFound(fifo.Get(), O_RDONLY).IsValid());
+        EXPECT_FALSE(OpenFound(link.Get(), O_RDONLY).IsValid());
+        for (const char* path : {"a/link/file", "../file_test/a", "a/b/file/x", "a/none"}) {
+            EXPECT_FALSE(find(path).IsValid()) << path << has_it;
+        }
+        fs::rename(dir_ + "/a/b", dir_ + "/moved");
+        std::string text;
+        EXPECT_TRUE(ReadUpTo(OpenFound(file.Get(), O_RDONLY).Get(), 100, text));
+        EXPECT_EQ(text, "found");
+        fs::rename(dir_ + "/moved", dir_ + "/a/b");
+        EXPECT_TRUE(FindObject(AT_FDCWD, "/").IsValid());
+    }
+    has_openat2 = true;
 }
 
 TEST_F(FileTest, ALockIsTakenOnTheFileThatHasTheName) {
@@ -162,3 +195,20 @@ TEST_F(FileTest, APrivateDirectoryIsOursAtEachStep) {
 }
 
 }  // namespace
+
+// Kernels before 5.6 do not have every call.
+extern "C" long syscall(long number, ...) noexcept {
+    if (number == SYS_openat2 && !has_openat2) {
+        errno = ENOSYS;
+        return -1;
+    }
+    va_list list;
+    va_start(list, number);
+    long arguments[4];
+    for (long& argument : arguments) {
+        argument = va_arg(list, long);
+    }
+    va_end(list);
+    static const auto real = reinterpret_cast<long (*)(long, ...)>(dlsym(RTLD_NEXT, "syscall"));
+    return real(number, arguments[0], arguments[1], arguments[2], arguments[3]);
+}
