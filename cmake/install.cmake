@@ -14,8 +14,8 @@ set(public_headers
     common/util.h
     fileindex/event.h fileindex/op.h fileindex/optree.h fileindex/queue_mgr.h
     fileindex/communication.h fileindex/folder.h fileindex/folder_mgr.h fileindex/status_mgr.h
-    fileindex/util.h fileindex/file_types.h fileindex/index_mgr.h
-    fileindex/elastic/elastic_control.h
+    fileindex/util.h fileindex/file_types.h fileindex/path_rules.h fileindex/index_mgr.h
+    fileindex/elastic/elastic_control.h fileindex/elastic/protocol.h
     sdk/share.h sdk/credentials.h)
 foreach(header ${public_headers})
     get_filename_component(folder ${header} DIRECTORY)

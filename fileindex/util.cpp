@@ -2,8 +2,6 @@
 
 #include <algorithm>
 #include <array>
-#include <climits>
-#include <cstdlib>
 #include <iterator>
 
 #include <kesto/filesystem.h>
@@ -59,24 +57,6 @@ bool IsShareRecyclePath(const std::string& full_path) {
     return KESTOShareIsShareRecycle(full_path.c_str()) == 1;
 }
 
-bool IsInSnapshot(const std::string& full_path) {
-    int flag = 0;
-    return Contains(full_path, "#snapshot") &&
-           KLIBFhsPathInSnapshot(full_path.c_str(), &flag) == 0 && flag == 1;
-}
-
-bool IsFileSystemIndexable(const std::string& full_path) {
-    const int type = KESTOGetFSType(full_path.c_str(), 0);
-    return type >= 0 && KESTOFSIsRemoteFS(type) == 0 && KESTOFSIsImageFS(type) == 0 &&
-           type != KESTO_FS_VIRTUAL;
-}
-
-/// Whether the path has no symbolic link, "." or ".." in it, nor a "/" at its end.
-bool IsCanonical(const std::string& full_path) {
-    std::array<char, PATH_MAX> resolved{};
-    return realpath(full_path.c_str(), resolved.data()) != nullptr && full_path == resolved.data();
-}
-
 }  // namespace
 
 void GetShareNameByPath(std::string& share_name, const std::string& share_path) {
@@ -125,24 +105,6 @@ bool IsFullPathInRecycleBin(const std::string& full_path) {
         return true;
     }
     return IsHomeRecyclePath(share_name, full_path);
-}
-
-bool CanFullPathBeIndexed(const std::string& full_path) {
-    if (IsInSnapshot(full_path) || !IsFileSystemIndexable(full_path)) {
-        return false;
-    }
-    std::string share_name;
-    std::string share_path;
-    GetShareNamePathByFullPath(share_name, share_path, full_path);
-    const sdk::SDKShare share(share_name);
-    if (!share.CanBeIndexed() || IsFullPathInRecycleBin(full_path)) {
-        return false;
-    }
-    // An encrypted share is itself mounted while it is unlocked.
-    if (KESTOFSDirIsMntPoint(full_path.c_str()) == 1 && !share.IsEncryption()) {
-        return false;
-    }
-    return IsCanonical(full_path);
 }
 
 bool CanPathBeIndexed(const std::string& share_path) {

@@ -27,9 +27,10 @@ QUIVRA_EXPORT void GetShareNamePathByFullPath(std::string& share_name, std::stri
 /// recycle flag cannot be read.
 QUIVRA_EXPORT bool IsFullPathInRecycleBin(const std::string& full_path);
 
-/// Whether the path may be indexed: it is no snapshot, not on a remote, image or virtual file
-/// system, in a share that may be indexed, in no recycle bin, no stray mount point, and reached
-/// without symbolic links, "." or "..". Throws as IsFullPathInRecycleBin.
+/// Whether the path may be indexed: it is not in a snapshot, not on a remote, image or virtual file
+/// system, in a share that may be indexed, not in a recycle bin, not a stray mount point, and
+/// reached without symbolic links, "." or "..". The rules are those of fileindex/path_rules.h.
+/// Throws as IsFullPathInRecycleBin.
 QUIVRA_EXPORT bool CanFullPathBeIndexed(const std::string& full_path);
 
 /// The same for a share path. Throws as GetFullPath, too.

@@ -7,6 +7,7 @@
 #include "common/log.h"
 #include "common/util.h"
 #include "fileindex/elastic/elastic_control.h"
+#include "fileindex/elastic/protocol.h"
 #include "fileindex/elastic/request.h"
 #include "fileindex/status_mgr.h"
 #include "sdk/share.h"
@@ -14,24 +15,16 @@
 namespace quivra::fileindex::elastic {
 namespace {
 
-constexpr const char* kPath = "KESTOMDPath";
-constexpr const char* kParent = "KESTOMDParent";
-constexpr const char* kFSName = "KESTOMDFSName";
-constexpr const char* kSearchFileName = "KESTOMDSearchFileName";
-constexpr const char* kDisplayName = "KESTOMDDisplayName";
-constexpr const char* kKind = "KESTOMDKind";
-constexpr const char* kExtension = "KESTOMDExtension";
-
-Json::Value DocumentRequest(const char* command, const std::string& share) {
+Json::Value DocumentRequest(const char* name, const std::string& share) {
     Json::Value request;
-    request["command"] = command;
+    request["command"] = name;
     request["data"]["id"] = GetFileIndexID(share);
     return request;
 }
 
 Json::Value BelowQuery(const std::string& directory) {
     Json::Value query;
-    query["qsl"]["prefix"][kPath] = directory + "/";
+    query["qsl"]["prefix"][field::kPath] = directory + "/";
     return query;
 }
 
@@ -43,13 +36,13 @@ Json::Value ExtractDocument(const std::string& full_path, bool need_meta) {
         Fail({"elastic_control", __LINE__}, "!ParseFile(full_path, cfg, file_data)",
              Error(Error::kParseFailed, "Parse failed, path=" + full_path));
     }
-    file_data[kSearchFileName] = Json::Value(std::as_const(file_data)[kFSName]);
+    file_data[field::kSearchFileName] = Json::Value(std::as_const(file_data)[field::kFSName]);
     return file_data;
 }
 
-void SendDocument(const char* command, const std::string& share, const std::string& full_path,
+void SendDocument(const char* name, const std::string& share, const std::string& full_path,
                   bool need_meta) {
-    Json::Value request = DocumentRequest(command, share);
+    Json::Value request = DocumentRequest(name, share);
     request["data"]["doc_id"] = full_path;
     request["data"]["data"] = ExtractDocument(full_path, need_meta);
     SendRequestNoResult(request);
@@ -60,13 +53,13 @@ Json::Value LocationFields(const std::string& path) {
     const std::string name = Basename(path);
     const std::string extension = GetFileExtension(path, true);
     Json::Value fields;
-    fields[kPath] = path;
-    fields[kParent] = Dirname(path);
-    fields[kFSName] = name;
-    fields[kSearchFileName] = name;
-    fields[kDisplayName] = name;
-    fields[kKind] = extension;
-    fields[kExtension] = extension;
+    fields[field::kPath] = path;
+    fields[field::kParent] = Dirname(path);
+    fields[field::kFSName] = name;
+    fields[field::kSearchFileName] = name;
+    fields[field::kDisplayName] = name;
+    fields[field::kKind] = extension;
+    fields[field::kExtension] = extension;
     return fields;
 }
 
@@ -75,50 +68,50 @@ void SetDescendantMove(Json::Value& request, const Json::Value& hit, const std::
                        const std::string& old_path) {
     std::string name;
     std::string parent;
-    GetJsonValue<std::string>(name, hit, kFSName, true);
-    GetJsonValue<std::string>(parent, hit, kParent, true);
+    GetJsonValue<std::string>(name, hit, field::kFSName, true);
+    GetJsonValue<std::string>(parent, hit, field::kParent, true);
     parent.replace(0, old_path.size(), new_path);
     Json::Value fields;
-    fields[kParent] = parent;
-    fields[kPath] = parent + "/" + name;
-    fields[kSearchFileName] = name;
-    request["command"] = "document_set_by_id";
-    request["data"]["doc_id"] = hit[kPath];
+    fields[field::kParent] = parent;
+    fields[field::kPath] = parent + "/" + name;
+    fields[field::kSearchFileName] = name;
+    request["command"] = command::kDocumentSetById;
+    request["data"]["doc_id"] = hit[field::kPath];
     request["data"]["data"] = std::move(fields);
 }
 
 }  // namespace
 
 void IndexDel(const std::string& share, const std::string& full_path) {
-    Json::Value request = DocumentRequest("document_del_by_id", share);
+    Json::Value request = DocumentRequest(command::kDocumentDelById, share);
     request["data"]["doc_id"] = full_path;
     SendRequestNoResult(request);
 }
 
 void IndexDelDir(const std::string& share, const std::string& dir_path) {
-    Json::Value request = DocumentRequest("document_del_by_query", share);
+    Json::Value request = DocumentRequest(command::kDocumentDelByQuery, share);
     request["data"]["query"] = BelowQuery(dir_path);
     SendRequestNoResult(request);
 }
 
 void IndexUpsert(const std::string& share, const std::string& full_path, bool need_meta) {
-    SendDocument("document_upsert_by_id", share, full_path, need_meta);
+    SendDocument(command::kDocumentUpsertById, share, full_path, need_meta);
 }
 
 void IndexAttr(const std::string& share, const std::string& full_path) {
-    SendDocument("document_set_by_id", share, full_path, false);
+    SendDocument(command::kDocumentSetById, share, full_path, false);
 }
 
 void IndexRename(const std::string& share, const std::string& new_path,
                  const std::string& old_path) {
     // One request object serves all: the later ones still carry the members of those before, which
     // the daemon ignores where a command does not use them.
-    Json::Value request = DocumentRequest("document_set_by_id", share);
+    Json::Value request = DocumentRequest(command::kDocumentSetById, share);
     request["data"]["doc_id"] = old_path;
     request["data"]["data"] = LocationFields(new_path);
     SendRequestNoResult(request);
 
-    request["command"] = "document_get_by_query";
+    request["command"] = command::kDocumentGetByQuery;
     request["data"]["query"] = BelowQuery(old_path);
     Json::Value reply;
     SendRequestWithRetry(reply, request);
@@ -139,7 +132,7 @@ void IndexRename(const std::string& share, const std::string& new_path,
 
 void IndexCommit(const std::string& share) {
     try {
-        SendRequestNoResult(DocumentRequest("commit", share));
+        SendRequestNoResult(DocumentRequest(command::kCommit, share));
         return;
     } catch (const Error&) {
         const sdk::SDKShare sdk_share(share);
@@ -153,7 +146,7 @@ void IndexCommit(const std::string& share) {
 }
 
 void IndexQuery(Json::Value& reply, const std::string& share, const Json::Value& query) {
-    Json::Value request = DocumentRequest("document_get_by_query", share);
+    Json::Value request = DocumentRequest(command::kDocumentGetByQuery, share);
     request["data"]["query"] = query;
     SendRequest(reply, request);
 }

@@ -10,19 +10,19 @@
 #include "common/error.h"
 #include "common/json.h"
 #include "common/log.h"
+#include "fileindex/elastic/protocol.h"
 #include "fileindex/index_mgr.h"
 
 namespace quivra::fileindex::elastic {
 namespace {
 
-constexpr const char* kSocketPath = "/var/run/kestoelasticd.sock";
 constexpr unsigned int kAttemptsBeforeNotice = 10;
 constexpr unsigned int kRetryBaseSeconds = 900;
 constexpr unsigned int kRetryStepSeconds = 60;
 constexpr int kRetrySteps = 5;
 
 bool IsBusy(int code) {
-    return code == Error::kDaemonOutOfMemory || code == Error::kDaemonBusy;
+    return code == kOutOfMemory || code == kBusy;
 }
 
 bool ParseReply(Json::Value& response, const std::string& text) {
@@ -34,7 +34,7 @@ bool ParseReply(Json::Value& response, const std::string& text) {
 }
 
 void Exchange(Json::Value& response, const Json::Value& request) {
-    kestodaemon::DomainSockConnection conn(kSocketPath);
+    kestodaemon::DomainSockConnection conn(kSearchDaemonSocketPath);
     if (!conn.Connect()) {
         Fail({"elastic_control", __LINE__}, "!conn.Connect()",
              Error(Error::kChannelFailed, "Connect failed"));

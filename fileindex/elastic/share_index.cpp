@@ -1,13 +1,14 @@
 #include "fileindex/elastic/elastic_control.h"
+#include "fileindex/elastic/protocol.h"
 #include "fileindex/elastic/request.h"
 #include "sdk/share.h"
 
 namespace quivra::fileindex::elastic {
 namespace {
 
-void SendIndexCommand(const char* command, const std::string& share) {
+void SendIndexCommand(const char* name, const std::string& share) {
     Json::Value request;
-    request["command"] = command;
+    request["command"] = name;
     request["data"]["id"] = GetFileIndexID(share);
     SendRequestNoResult(request);
 }
@@ -15,7 +16,7 @@ void SendIndexCommand(const char* command, const std::string& share) {
 /// Changes the settings that `changes` holds and keeps the others.
 void SetIndexConfig(const std::string& share, const Json::Value& changes) {
     Json::Value request;
-    request["command"] = "index_config_set";
+    request["command"] = command::kIndexConfigSet;
     request["data"]["id"] = GetFileIndexID(share);
     request["data"]["data"] = changes;
     SendRequestNoResult(request);
@@ -30,7 +31,7 @@ std::string GetFileIndexID(const std::string& share) {
 void ShareIndexCreate(const std::string& share) {
     const sdk::SDKShare sdk_share(share);
     Json::Value request;
-    request["command"] = "index_create";
+    request["command"] = command::kIndexCreate;
     Json::Value& data = request["data"];
     data["id"] = GetFileIndexID(share);
     data["path"] = sdk_share.GetDBPath();
@@ -40,15 +41,15 @@ void ShareIndexCreate(const std::string& share) {
 }
 
 void ShareIndexDelete(const std::string& share) {
-    SendIndexCommand("index_delete", share);
+    SendIndexCommand(command::kIndexDelete, share);
 }
 
 void ShareIndexPause(const std::string& share) {
-    SendIndexCommand("index_pause", share);
+    SendIndexCommand(command::kIndexPause, share);
 }
 
 void ShareIndexResume(const std::string& share) {
-    SendIndexCommand("index_resume", share);
+    SendIndexCommand(command::kIndexResume, share);
 }
 
 void ShareIndexRename(const std::string& share_from, const std::string& share_to,

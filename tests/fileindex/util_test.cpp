@@ -4,6 +4,7 @@
 
 #include <functional>
 
+#include "fileindex/path_rules.h"
 #include "tests/fileindex/library_fixture.h"
 
 namespace quivra::fileindex {
@@ -65,6 +66,31 @@ TEST_F(PathTest, EachRuleAloneDecidesWhatMayBeIndexed) {
     }
     EXPECT_EQ(ErrorOf([] { CanFullPathBeIndexed("/elsewhere"); }).code, 502);
     EXPECT_EQ(ErrorOf([] { CanPathBeIndexed("/unknown"); }).code, 800);
+}
+
+TEST_F(PathTest, AnExaminedPathNamesTheRulesUpToTheFirstThatFails) {
+    AddShare("photo");
+    std::filesystem::create_directories("/volume1/photo/dir/#recycle");
+    std::filesystem::create_directory_symlink("dir", "/volume1/photo/link");
+    const struct {
+        const char* path;
+        std::size_t rules;
+        const char* last;
+        bool passed;
+    } rows[] = {
+        {"/volume1/photo/dir", 8, "system names", true},
+        {"/volume1/photo", 8, "system names", true},
+        {"/volume1/photo/dir/#recycle", 8, "system names", false},
+        {"/volume1/photo/gone", 1, "exists", false},
+        {"/volume1", 4, "share", false},  // no share: a finding, where the question throws
+        {"/volume1/photo/link", 7, "reached without links", false},
+    };
+    for (const auto& row : rows) {
+        const std::vector<PathFinding> findings = ExaminePath(row.path);
+        ASSERT_EQ(findings.size(), row.rules) << row.path;
+        EXPECT_EQ(findings.back().rule, row.last) << row.path;
+        EXPECT_EQ(findings.back().passed, row.passed) << row.path << findings.back().detail;
+    }
 }
 
 TEST_F(PathTest, HomesHaveRecycleBinsOfTheirOwn) {
