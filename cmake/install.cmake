@@ -1,5 +1,5 @@
 # What "cmake --install" lays down, in three components: the library, what is needed to build
-# against it, and the programs.
+# against it, and the programs. Everything goes below the prefix; nothing is configuration.
 include(CMakePackageConfigHelpers)
 
 set(FILEINDEX_CMAKE_DIR ${CMAKE_INSTALL_LIBDIR}/cmake/quivra-fileindex)
@@ -34,6 +34,25 @@ write_basic_package_version_file(${PROJECT_BINARY_DIR}/quivra-fileindex-config-v
 install(FILES ${PROJECT_BINARY_DIR}/quivra-fileindex-config.cmake
               ${PROJECT_BINARY_DIR}/quivra-fileindex-config-version.cmake
         DESTINATION ${FILEINDEX_CMAKE_DIR} COMPONENT development)
+
+# The prefix is told from where the file lies, so that an installed tree can be moved. The way up
+# depends on the library directory: lib, lib64, lib/x86_64-linux-gnu.
+file(RELATIVE_PATH FILEINDEX_PC_UP /p/${CMAKE_INSTALL_LIBDIR}/pkgconfig /p)
+string(REGEX REPLACE "/$" "" FILEINDEX_PC_UP "${FILEINDEX_PC_UP}")
 configure_file(cmake/quivra-fileindex.pc.in ${PROJECT_BINARY_DIR}/quivra-fileindex.pc @ONLY)
 install(FILES ${PROJECT_BINARY_DIR}/quivra-fileindex.pc
         DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig COMPONENT development)
+
+install(TARGETS fileindexd kestoelasticd kestotifyd
+        RUNTIME DESTINATION ${CMAKE_INSTALL_SBINDIR} COMPONENT programs)
+install(TARGETS fileindexctl RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR} COMPONENT programs)
+# The library runs it by its full path, /usr/kesto/bin/kestokosnotify.
+install(TARGETS kestokosnotify RUNTIME DESTINATION kesto/bin COMPONENT programs)
+# Outside of the loader's own directories, what is installed finds its libraries by its own place.
+file(RELATIVE_PATH up_from_programs /p/${CMAKE_INSTALL_SBINDIR} /p/${CMAKE_INSTALL_LIBDIR})
+set_target_properties(fileindexd kestoelasticd kestotifyd fileindexctl PROPERTIES
+                      INSTALL_RPATH "$ORIGIN/${up_from_programs}")
+set_target_properties(kestokosnotify PROPERTIES
+                      INSTALL_RPATH "$ORIGIN/../../${CMAKE_INSTALL_LIBDIR}")
+set_target_properties(fileindex PROPERTIES INSTALL_RPATH "$ORIGIN")
+add_subdirectory(packaging)
