@@ -119,6 +119,13 @@ void Controller::Execute(const Command& command, Reply reply, Clock::time_point 
     }
 }
 
+void Controller::Reload(Clock::time_point now) {
+    const std::int64_t resume_time = StatusMgr().GetPauseInfo();
+    indexed_ = ReadShares();
+    resume_time_ = resume_time;
+    Reconcile(now);
+}
+
 void Controller::AnswerWaiting() {
     for (auto it = waiting_.begin(); it != waiting_.end();) {
         if (supervisor_.IsRunning(it->share)) {

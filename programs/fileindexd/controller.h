@@ -29,6 +29,9 @@ class Controller {
     /// Update to come.
     void Execute(const Command& command, Reply reply, Clock::time_point now);
 
+    /// Reads the pause state and the folder set again; throws what these do.
+    void Reload(Clock::time_point now);
+
     /// To be called when Due says so, and when a child process has ended.
     void Update(Clock::time_point now);
     std::optional<Clock::time_point> Due(Clock::time_point now) const;

@@ -1,5 +1,6 @@
 #include <CLI/CLI.hpp>
 
+#include "programs/daemon/program.h"
 #include "programs/fileindexd/run.h"
 
 namespace {
@@ -21,12 +22,11 @@ int main(int argc, char** argv) {
         app.add_option("--once", options.once, "Process what these shares' queues hold, then exit");
     once->type_name("SHARE");
     app.add_option("--worker", options.worker)->group("");  // how the daemon starts its workers
-    app.add_flag("--verbose", options.verbose, "Log every change event");
+    quivra::daemon::AddOptions(app, options.common);
     app.footer(kExamples);
-    try {
-        app.parse(argc, argv);
-    } catch (const CLI::ParseError& error) {
-        return app.exit(error) == 0 ? 0 : 2;
+    if (const auto status = quivra::daemon::Parse(app, argc, argv)) {
+        return *status;
     }
-    return fileindexd::Run(options);
+    return quivra::daemon::RunProgram("fileindexd", options.common,
+                                      [&] { return fileindexd::Run(options); });
 }

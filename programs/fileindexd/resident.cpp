@@ -2,7 +2,6 @@
 
 #include <poll.h>
 #include <sys/eventfd.h>
-#include <sys/signalfd.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -19,9 +18,12 @@
 #include "base/unique_fd.h"
 #include "common/error.h"
 #include "common/log.h"
+#include "programs/daemon/frame_server.h"
+#include "programs/daemon/program.h"
+#include "programs/daemon/service_manager.h"
+#include "programs/daemon/signals.h"
 #include "programs/fileindexd/controller.h"
 #include "programs/fileindexd/state_file.h"
-#include "programs/support/frame_server.h"
 
 namespace fileindexd {
 
@@ -90,21 +92,10 @@ std::string Answer(CommandQueue& queue, const std::string& request) {
     }
 }
 
-/// Blocks the signals that the loop waits for, in this thread and those to come.
-quivra::base::UniqueFd CatchSignals() {
-    sigset_t signals;
-    sigemptyset(&signals);
-    for (const int signal : {SIGTERM, SIGINT, SIGCHLD}) {
-        sigaddset(&signals, signal);
-    }
-    sigprocmask(SIG_BLOCK, &signals, nullptr);
-    return quivra::base::UniqueFd(signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK));
-}
-
 class Resident {
   public:
     explicit Resident(const std::vector<std::string>& worker_command)
-        : signals_(CatchSignals()),
+        : signals_({SIGCHLD}),
           server_({.path = kDaemonSocketPath, .max_request = kMaxRequest},
                   [this](const std::string& request) { return Answer(commands_, request); }),
           supervisor_([worker_command](const std::string& share) {
@@ -116,7 +107,9 @@ class Resident {
 
     void Run() {
         std::thread serving([this] { server_.Run(); });
+        service_manager_.Ready();
         while (!stopping_ || !controller_.IsStopped()) {
+            service_manager_.Turn(Clock::now());
             Wait();
             ReadSignals();
             for (CommandQueue::Entry& entry : commands_.Take()) {
@@ -134,23 +127,31 @@ class Resident {
 
   private:
     void Wait() const {
-        int timeout = -1;
         const Clock::time_point now = Clock::now();
-        if (const auto due = controller_.Due(now)) {
-            const auto left = std::chrono::ceil<std::chrono::milliseconds>(*due - now).count();
-            timeout = static_cast<int>(std::clamp<std::int64_t>(left, 0, 3600000));
-        }
-        pollfd descriptors[] = {{signals_.Get(), POLLIN, 0}, {commands_.Fd(), POLLIN, 0}};
-        poll(descriptors, 2, timeout);
+        const Clock::time_point due = controller_.Due(now).value_or(Clock::time_point::max());
+        pollfd descriptors[] = {{signals_.Fd(), POLLIN, 0}, {commands_.Fd(), POLLIN, 0}};
+        poll(descriptors, 2, service_manager_.PollTimeout(due, now));
     }
 
     void ReadSignals() {
-        signalfd_siginfo info;
-        while (read(signals_.Get(), &info, sizeof(info)) == sizeof(info)) {
-            if (info.ssi_signo != SIGCHLD && !stopping_) {
-                stopping_ = true;
-                controller_.ShutDown(Clock::now());
-            }
+        const quivra::daemon::Signals::News news = signals_.Read();
+        if (news.stop && !stopping_) {
+            stopping_ = true;
+            service_manager_.Stopping();
+            // The workers notice the end of this process.
+            quivra::daemon::EndAtLatest(quivra::daemon::kStopGrace);
+            controller_.ShutDown(Clock::now());
+        } else if (news.reload) {
+            Reload();
+        }
+    }
+
+    void Reload() {
+        try {
+            controller_.Reload(Clock::now());
+        } catch (const std::exception& error) {
+            quivra::LogError({kUnit, __LINE__}, "The settings cannot be read again: %s",
+                             error.what());
         }
     }
 
@@ -166,9 +167,10 @@ class Resident {
         }
     }
 
-    quivra::base::UniqueFd signals_;
+    const quivra::daemon::Signals signals_;
+    quivra::daemon::ServiceManager service_manager_;
     CommandQueue commands_;
-    support::FrameServer server_;
+    quivra::daemon::FrameServer server_;
     Supervisor supervisor_;
     Controller controller_;
     bool stopping_ = false;

@@ -1,11 +1,8 @@
 #include "programs/fileindexd/run.h"
 
-#include <exception>
 #include <filesystem>
-#include <iostream>
 #include <system_error>
 
-#include "common/log.h"
 #include "programs/fileindexd/once.h"
 #include "programs/fileindexd/resident.h"
 #include "programs/fileindexd/worker.h"
@@ -14,14 +11,13 @@ namespace fileindexd {
 
 namespace {
 
-constexpr int kLogLevelInfo = 6;
-
-/// How a worker is started: by the program that runs.
-std::vector<std::string> WorkerCommand(bool verbose) {
+/// How a worker is started: by the program that runs, which an upgrade may have replaced at its
+/// path.
+std::vector<std::string> WorkerCommand(bool is_verbose) {
     std::error_code error;
     const std::filesystem::path program = std::filesystem::read_symlink("/proc/self/exe", error);
     std::vector<std::string> command = {error ? "/proc/self/exe" : program.string()};
-    if (verbose) {
+    if (is_verbose) {
         command.push_back("--verbose");
     }
     command.push_back("--worker");
@@ -31,21 +27,14 @@ std::vector<std::string> WorkerCommand(bool verbose) {
 }  // namespace
 
 int Run(const Options& options) {
-    quivra::fileindex::log_level =
-        options.verbose ? quivra::fileindex::kLogLevelDebug : kLogLevelInfo;
-    try {
-        if (!options.worker.empty()) {
-            return RunWorker(options.worker);
-        }
-        if (!options.once.empty()) {
-            return RunOnce(options.once);
-        }
-        RunResident(WorkerCommand(options.verbose));
-        return 0;
-    } catch (const std::exception& error) {
-        std::cerr << "fileindexd: " << error.what() << std::endl;
-        return 1;
+    if (!options.worker.empty()) {
+        return RunWorker(options.worker);
     }
+    if (!options.once.empty()) {
+        return RunOnce(options.once);
+    }
+    RunResident(WorkerCommand(options.common.is_verbose));
+    return 0;
 }
 
 }  // namespace fileindexd

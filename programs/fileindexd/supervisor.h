@@ -22,7 +22,7 @@ class Supervisor {
     /// The command line (program first) of a share's worker.
     using CommandOf = std::function<std::vector<std::string>(const std::string& share)>;
 
-    static constexpr std::chrono::seconds kStopTimeout{5};
+    static constexpr std::chrono::milliseconds kStopTimeout{2000};
     static constexpr std::chrono::seconds kFirstRestart{1};
     static constexpr std::chrono::seconds kLastRestart{300};
     /// A worker that lived that long starts from kFirstRestart again.

@@ -13,6 +13,7 @@
 #include <cstdint>
 
 #include "common/log.h"
+#include "programs/daemon/program.h"
 #include "programs/fileindexd/queue_watch.h"
 #include "programs/fileindexd/repair.h"
 #include "programs/fileindexd/share_worker.h"
@@ -36,6 +37,7 @@ int stop_event = -1;
 extern "C" void RequestStop(int) {
     const int error = errno;
     stop_requested = 1;
+    quivra::daemon::EndAtLatest(quivra::daemon::kStopGrace);
     const std::uint64_t one = 1;
     if (write(stop_event, &one, sizeof(one)) < 0) {
         // It is readable already.
@@ -43,8 +45,9 @@ extern "C" void RequestStop(int) {
     errno = error;
 }
 
-/// SIGTERM and SIGINT are noticed between two operations, end a wait, and cut the search client's
-/// long sleeps short.
+/// SIGTERM and SIGINT are noticed between two operations and end a wait. Where neither comes soon,
+/// in a read from a disk that does not answer or in the search client's sleep of a quarter of an
+/// hour, the process ends in the middle: a pass may be carried out twice.
 void CatchStopSignals() {
     stop_event = eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK);
     struct sigaction action {};
@@ -56,6 +59,8 @@ void CatchStopSignals() {
         sigaction(signal, &action, nullptr);
     }
     sigprocmask(SIG_UNBLOCK, &signals, nullptr);
+    // The daemon reads the settings again, and tells whom they concern.
+    std::signal(SIGHUP, SIG_IGN);
 }
 
 /// Indexing takes what others leave.

@@ -8,12 +8,11 @@ namespace elasticd {
 
 struct DaemonOptions {
     std::string socket = "/var/run/kestoelasticd.sock";
-    bool verbose = false;  ///< log to standard error, too
     ServiceOptions service;
 };
 
-/// Serves until SIGTERM or SIGINT; what is not committed then is dropped. The process's exit
-/// status.
+/// Serves until SIGTERM or SIGINT; what is not committed then is dropped. Returns the process's
+/// exit status; throws what opening the state directory and the socket does.
 int RunDaemon(const DaemonOptions& options);
 
 }  // namespace elasticd

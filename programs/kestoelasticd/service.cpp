@@ -15,7 +15,7 @@
 #include "programs/kestoelasticd/codes.h"
 #include "programs/kestoelasticd/engine_error.h"
 #include "programs/kestoelasticd/record.h"
-#include "programs/support/instance_lock.h"
+#include "programs/daemon/instance_lock.h"
 
 namespace elasticd {
 namespace {
@@ -98,7 +98,7 @@ quivra::base::UniqueFd PrepareState(const ServiceOptions& options) {
         throw Error(Error::kSystemCallFailed,
                     "cannot make " + options.state_directory + ": " + error.message());
     }
-    return support::TakeInstanceLock(options.state_directory + "/lock");
+    return quivra::daemon::TakeInstanceLock(options.state_directory + "/lock");
 }
 
 }  // namespace

@@ -1,10 +1,8 @@
 #include "programs/kestotifyd/monitor.h"
 
 #include <fcntl.h>
-#include <signal.h>
 #include <sys/epoll.h>
 #include <sys/inotify.h>
-#include <sys/signalfd.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -19,10 +17,11 @@
 #include "common/error.h"
 #include "common/log.h"
 
+#include "programs/daemon/instance_lock.h"
+#include "programs/daemon/program.h"
 #include "programs/kestotifyd/fanotify_backend.h"
 #include "programs/kestotifyd/inotify_backend.h"
 #include "programs/kestotifyd/registration.h"
-#include "programs/support/instance_lock.h"
 
 #include <kesto/filesystem.h>
 
@@ -31,7 +30,7 @@ namespace {
 
 /// A folder's disappearance or return that no event tells of is noticed this late at most.
 constexpr std::chrono::seconds kCheckInterval{3};
-constexpr std::chrono::seconds kStopTime{2};
+constexpr std::chrono::milliseconds kStopTime = quivra::daemon::kStopGrace;
 
 [[noreturn]] void FailSystemCall(int line, const char* call) {
     const std::string reason =
@@ -47,14 +46,6 @@ std::string MakeDirectory(const std::string& path) {
     }
     errno = 0;
     return path;
-}
-
-quivra::base::UniqueFd OpenSignals() {
-    sigset_t signals;
-    sigemptyset(&signals);
-    sigaddset(&signals, SIGTERM);
-    sigaddset(&signals, SIGINT);
-    return quivra::base::UniqueFd(signalfd(-1, &signals, SFD_NONBLOCK | SFD_CLOEXEC));
 }
 
 bool IsEmptyDirectory(const std::string& path) {
@@ -73,15 +64,15 @@ void Drain(int fd) {
 
 Monitor::Monitor(const Options& options)
     : options_(options),
-      instance_lock_(support::TakeInstanceLock(MakeDirectory(options.state) + "/lock")),
+      instance_lock_(quivra::daemon::TakeInstanceLock(
+          MakeDirectory(options.common.state_directory) + "/lock")),
       epoll_(epoll_create1(EPOLL_CLOEXEC)),
-      signals_(OpenSignals()),
       registration_events_(inotify_init1(IN_NONBLOCK | IN_CLOEXEC)),
-      watched_(options.state + "/watched.json"),
+      watched_(options.common.state_directory + "/watched.json"),
       queues_(watched_,
               [](const std::string& name) { return KESTOEAIsHiddenDir(name.c_str()) == 1; }) {
     MakeDirectory(options_.registrations);
-    if (!epoll_.IsValid() || !signals_.IsValid()) {
+    if (!epoll_.IsValid()) {
         FailSystemCall(__LINE__, "epoll_create1");
     }
     if (!registration_events_.IsValid() ||
@@ -89,7 +80,7 @@ Monitor::Monitor(const Options& options)
                           IN_CLOSE_WRITE | IN_MOVED_TO | IN_MOVED_FROM | IN_DELETE) < 0) {
         FailSystemCall(__LINE__, "inotify_add_watch");
     }
-    WatchDescriptor(signals_.Get(), EPOLLIN);
+    WatchDescriptor(signals_.Fd(), EPOLLIN);
     WatchDescriptor(registration_events_.Get(), EPOLLIN);
     if (mounts_.Fd() >= 0) {
         WatchDescriptor(mounts_.Fd(), EPOLLPRI);
@@ -109,16 +100,22 @@ void Monitor::WatchDescriptor(int fd, std::uint32_t events) {
 
 void Monitor::Run() {
     LoadRegistrations(true);
+    service_manager_.Ready();
     while (true) {
+        service_manager_.Turn(Clock::now());
         std::array<epoll_event, 8> events;
         const int count =
             epoll_wait(epoll_.Get(), events.data(), events.size(), WaitMilliseconds(Clock::now()));
         bool has_registrations = false;
         for (int i = 0; i < count; ++i) {
             const int fd = events.at(static_cast<std::size_t>(i)).data.fd;
-            if (fd == signals_.Get()) {
-                Stop();
-                return;
+            if (fd == signals_.Fd()) {
+                const quivra::daemon::Signals::News news = signals_.Read();
+                if (news.stop) {
+                    Stop();
+                    return;
+                }
+                has_registrations |= news.reload;
             }
             if (fd == mounts_.Fd()) {
                 HandleMountChange();
@@ -145,14 +142,11 @@ int Monitor::WaitMilliseconds(Time now) const {
           fanotify_ ? fanotify_->NextDue() : std::nullopt}) {
         due = std::min(due, other.value_or(due));
     }
-    if (due <= now) {
-        return 0;
-    }
-    const auto wait = std::chrono::ceil<std::chrono::milliseconds>(due - now);
-    return static_cast<int>(wait.count());
+    return service_manager_.PollTimeout(due, now);
 }
 
 void Monitor::Stop() {
+    service_manager_.Stopping();
     WorkBackends(true);
     queues_.FlushAll(Clock::now() + kStopTime);
 }
@@ -275,7 +269,7 @@ void Monitor::StartRoot(const std::string& path, Root& root) {
         return;
     }
     root = {backend, false, status.st_dev, status.st_ino, mounts_.Covering(path), false};
-    if (options_.is_verbose) {
+    if (options_.common.is_verbose) {
         quivra::LogTrace({"monitor", __LINE__}, "Watching %s with %s", path.c_str(),
                          backend == fanotify_.get() ? "fanotify" : "inotify");
     }

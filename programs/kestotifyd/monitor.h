@@ -8,6 +8,8 @@
 #include <string>
 
 #include "base/unique_fd.h"
+#include "programs/daemon/service_manager.h"
+#include "programs/daemon/signals.h"
 #include "programs/kestotifyd/backend.h"
 #include "programs/kestotifyd/mount_table.h"
 #include "programs/kestotifyd/options.h"
@@ -18,7 +20,7 @@ namespace kestotifyd {
 
 /// The file monitor: follows the registrations, keeps each registered folder watched by the best
 /// back end that its file system offers, and hands what happens to the queues. One thread, one
-/// epoll loop; the stop signals must be blocked by the caller.
+/// epoll loop.
 class Monitor : private BackendSink {
   public:
     /// Takes the lock that only one monitor holds. Throws Error 506 when another one runs, 502 when
@@ -64,7 +66,8 @@ class Monitor : private BackendSink {
     const Options options_;
     quivra::base::UniqueFd instance_lock_;
     quivra::base::UniqueFd epoll_;
-    quivra::base::UniqueFd signals_;
+    quivra::daemon::Signals signals_;
+    quivra::daemon::ServiceManager service_manager_;
     quivra::base::UniqueFd registration_events_;
     MountTable mounts_;
     WatchedFolders watched_;

@@ -16,7 +16,8 @@ Examples:
   kestotifyd --backend inotify       never mark whole file systems
   kestotifyd --verbose               say on standard error what is going on
 
-Signals: SIGTERM and SIGINT write what is pending and stop.)";
+Signals: SIGTERM and SIGINT write what is pending and stop; SIGHUP reads the registrations
+again.)";
 
 }  // namespace
 
@@ -34,16 +35,12 @@ std::optional<Options> ParseOptions(int argc, const char* const* argv, int& stat
         ->default_str("auto");
     app.add_option("--registrations", options.registrations, "Directory of the registrations")
         ->capture_default_str();
-    app.add_option("--state", options.state, "Directory for what is remembered across runs")
-        ->capture_default_str();
     app.add_option("--max-watches", options.max_watches,
                    "Most directories to watch with inotify (default: 80 % of the system's limit)");
-    app.add_flag("-v,--verbose", options.is_verbose, "Log in detail, also to standard error");
+    quivra::daemon::AddOptions(app, options.common);
     app.footer(kFooter);
-    try {
-        app.parse(argc, argv);
-    } catch (const CLI::ParseError& error) {
-        status = app.exit(error) == 0 ? 0 : 2;
+    if (const auto ended = quivra::daemon::Parse(app, argc, argv)) {
+        status = *ended;
         return std::nullopt;
     }
     return options;

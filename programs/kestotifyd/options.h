@@ -4,15 +4,16 @@
 #include <optional>
 #include <string>
 
+#include "programs/daemon/program.h"
+
 namespace kestotifyd {
 
 enum class BackendChoice { kAuto, kFanotify, kInotify };
 
 struct Options {
     BackendChoice backend = BackendChoice::kAuto;
-    bool is_verbose = false;  ///< debug lines in the system log, and all lines on standard error
+    quivra::daemon::CommonOptions common{.state_directory = "/var/lib/kesto/monitor-state"};
     std::string registrations = "/var/lib/kesto/monitor";
-    std::string state = "/var/lib/kesto/monitor-state";
     std::size_t max_watches = 0;  ///< of the inotify back end; 0: 80 % of the system's limit
 };
 

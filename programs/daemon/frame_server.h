@@ -15,15 +15,17 @@
 #include <unordered_map>
 
 #include "base/unique_fd.h"
-#include "programs/support/frame_connection.h"
+#include "programs/daemon/frame_connection.h"
+#include "programs/daemon/service_manager.h"
+#include "programs/daemon/signals.h"
 
-namespace support {
+namespace quivra::daemon {
 
 struct FrameServerOptions {
     std::string path;                                 ///< of the Unix socket; its directory exists
     mode_t mode = 0600;                               ///< of the socket file
-    std::size_t max_request = std::size_t{1} << 30;   ///< bytes; longer frames are refused
-    std::size_t max_reply = std::size_t{1} << 30;     ///< bytes; a longer reply is not sent
+    std::size_t max_request = base::kMaxFrameSize;    ///< bytes; longer frames are refused
+    std::size_t max_reply = base::kMaxFrameSize;      ///< bytes; a longer reply is not sent
     std::size_t max_buffered = std::size_t{3} << 29;  ///< bytes of all requests being received
     std::size_t max_connections = 256;  ///< further clients wait in the kernel's backlog
     unsigned int workers = 4;           ///< requests handled at the same time
@@ -31,8 +33,8 @@ struct FrameServerOptions {
     std::chrono::milliseconds write_timeout{30000};  ///< from the reply to its last byte
 };
 
-/// A server of one request frame and one reply frame per connection (4-byte unsigned length in the
-/// host's byte order, then the text) on a Unix stream socket. One thread does all the waiting for
+/// A server of one request frame and one reply frame (base/frame.h) per connection on a Unix stream
+/// socket. One thread does all the waiting for
 /// clients, so that a slow or silent one holds up nobody; a fixed pool of workers runs the handler.
 /// Only clients of the same user, or of root, are served.
 class FrameServer {
@@ -52,8 +54,13 @@ class FrameServer {
     FrameServer& operator=(const FrameServer&) = delete;
 
     /// Serves until Stop. Requests that are being handled then are finished, and their replies sent
-    /// as far as their clients take them within two seconds; all others are dropped.
+    /// as far as their clients take them within kStopGrace; all others are dropped.
     void Run();
+
+    /// The same as a daemon's main loop: tells the service manager that it serves and that it
+    /// turns, and stops at a stop signal. The process ends with status 0 when requests that are
+    /// being handled take longer than kStopGrace then. SIGHUP is ignored.
+    void RunMain(const Signals& signals, ServiceManager& manager);
 
     /// Makes Run return; before Run, it makes that return at once. Safe from any thread and from a
     /// signal handler.
@@ -71,6 +78,7 @@ class FrameServer {
     void Listen();
     void Watch(int operation, int fd, unsigned int events) const;
     void WaitAndDispatch();
+    void ReadSignals();
     int PollTimeout() const;
     void BeginStop();
     void Wake() noexcept;
@@ -90,15 +98,17 @@ class FrameServer {
 
     const FrameServerOptions options_;
     const Handler handler_;
-    quivra::base::UniqueFd lock_;
-    quivra::base::UniqueFd listener_;
-    quivra::base::UniqueFd epoll_;
-    quivra::base::UniqueFd wake_;
+    base::UniqueFd lock_;
+    base::UniqueFd listener_;
+    base::UniqueFd epoll_;
+    base::UniqueFd wake_;
     std::atomic<bool> stop_ = false;
 
     // Only the thread of Run uses these.
     std::unordered_map<int, ConnectionPtr> watched_;  ///< waiting for their clients, by descriptor
     std::size_t buffered_ = 0;                        ///< bytes of the requests in watched_
+    const Signals* signals_ = nullptr;                ///< of RunMain
+    ServiceManager* manager_ = nullptr;               ///< of RunMain
     bool accepting_ = false;
     bool stopping_ = false;
     Clock::time_point accept_again_{};
@@ -112,4 +122,4 @@ class FrameServer {
     std::deque<ConnectionPtr> unsent_;  ///< replies that their clients did not take at once
 };
 
-}  // namespace support
+}  // namespace quivra::daemon

@@ -3,15 +3,15 @@
 #include <algorithm>
 #include <chrono>
 #include <cstddef>
-#include <cstdint>
 #include <string>
 
+#include "base/frame.h"
 #include "base/unique_fd.h"
 
-namespace support {
+namespace quivra::daemon {
 
-/// One client of a FrameServer: reads one frame, then writes one, without ever blocking. A frame is
-/// a 4-byte unsigned length in the host's byte order and that many bytes of text.
+/// One client of a FrameServer: reads one frame (base/frame.h), then writes one, without ever
+/// blocking.
 class FrameConnection {
   public:
     using Clock = std::chrono::steady_clock;
@@ -22,7 +22,7 @@ class FrameConnection {
     };
 
     /// `fd` is a non-blocking stream socket.
-    FrameConnection(quivra::base::UniqueFd fd, Clock::time_point deadline);
+    FrameConnection(base::UniqueFd fd, Clock::time_point deadline);
     FrameConnection(const FrameConnection&) = delete;
     FrameConnection& operator=(const FrameConnection&) = delete;
 
@@ -45,14 +45,14 @@ class FrameConnection {
   private:
     Progress ReadPrefix();
 
-    quivra::base::UniqueFd fd_;
+    base::UniqueFd fd_;
     Clock::time_point deadline_;
-    char prefix_[sizeof(std::uint32_t)] = {};
+    base::FramePrefix prefix_{};
     std::size_t prefix_moved_ = 0;  ///< bytes of the prefix read or written so far
-    std::uint32_t size_ = 0;
+    std::size_t size_ = 0;
     std::string text_;
     std::size_t text_moved_ = 0;  ///< bytes of the text written so far
     bool has_reply_ = false;
 };
 
-}  // namespace support
+}  // namespace quivra::daemon

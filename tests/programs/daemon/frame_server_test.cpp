@@ -1,4 +1,4 @@
-#include "programs/support/frame_server.h"
+#include "programs/daemon/frame_server.h"
 
 #include <gtest/gtest.h>
 #include <kesto/daemon_socket.h>
@@ -18,11 +18,11 @@
 
 #include "common/error.h"
 
-namespace support {
+namespace quivra::daemon {
 namespace {
 
 using namespace std::chrono_literals;
-using quivra::base::UniqueFd;
+using base::UniqueFd;
 
 const std::string kPath = "/tmp/frame_server_test.sock";
 
@@ -170,13 +170,13 @@ TEST(FrameServer, TakesOverFromTheDeadOnly) {
         try {
             FrameServer second(Options(), Echo);
             return 0;
-        } catch (const quivra::Error& error) {
+        } catch (const Error& error) {
             return static_cast<int>(error.code);
         }
     };
     {
         RunningServer running;
-        EXPECT_EQ(code_of_second(), quivra::Error::kLockFailed);
+        EXPECT_EQ(code_of_second(), Error::kLockFailed);
         struct stat status {};
         ASSERT_EQ(lstat(kPath.c_str(), &status), 0);
         EXPECT_EQ(status.st_mode, S_IFSOCK | 0600U);
@@ -184,7 +184,7 @@ TEST(FrameServer, TakesOverFromTheDeadOnly) {
     }
     EXPECT_NE(access(kPath.c_str(), F_OK), 0) << "the socket file was left behind";
     std::ofstream(kPath) << "precious";
-    EXPECT_EQ(code_of_second(), quivra::Error::kSystemCallFailed);
+    EXPECT_EQ(code_of_second(), Error::kSystemCallFailed);
     EXPECT_EQ(access(kPath.c_str(), F_OK), 0);
     unlink(kPath.c_str());
 }
@@ -223,4 +223,4 @@ TEST(FrameServer, ServesItsOwnUserAndRootOnly) {
 }
 
 }  // namespace
-}  // namespace support
+}  // namespace quivra::daemon

@@ -1,14 +1,13 @@
-#include "programs/support/frame_connection.h"
+#include "programs/daemon/frame_connection.h"
 
 #include <sys/socket.h>
 #include <sys/uio.h>
 
 #include <algorithm>
 #include <cerrno>
-#include <cstring>
 #include <utility>
 
-namespace support {
+namespace quivra::daemon {
 namespace {
 
 constexpr std::size_t kReadChunk = 256 * 1024;
@@ -29,19 +28,19 @@ ssize_t Receive(int fd, char* buffer, std::size_t size) {
 
 }  // namespace
 
-FrameConnection::FrameConnection(quivra::base::UniqueFd fd, Clock::time_point deadline)
+FrameConnection::FrameConnection(base::UniqueFd fd, Clock::time_point deadline)
     : fd_(std::move(fd)), deadline_(deadline) {}
 
 FrameConnection::Progress FrameConnection::ReadPrefix() {
-    while (prefix_moved_ < sizeof(prefix_)) {
+    while (prefix_moved_ < prefix_.size()) {
         const ssize_t received =
-            Receive(Fd(), prefix_ + prefix_moved_, sizeof(prefix_) - prefix_moved_);
+            Receive(Fd(), prefix_.data() + prefix_moved_, prefix_.size() - prefix_moved_);
         if (received <= 0) {
             return received == 0 ? Progress::kFailed : AfterError();
         }
         prefix_moved_ += static_cast<std::size_t>(received);
     }
-    std::memcpy(&size_, prefix_, sizeof(size_));
+    size_ = base::FrameSize(prefix_);
     return Progress::kDone;
 }
 
@@ -67,8 +66,8 @@ FrameConnection::Progress FrameConnection::Read(std::size_t max_size) {
 
 void FrameConnection::SetReply(std::string reply, Clock::time_point deadline) {
     text_ = std::move(reply);
-    size_ = static_cast<std::uint32_t>(text_.size());
-    std::memcpy(prefix_, &size_, sizeof(size_));
+    size_ = text_.size();
+    prefix_ = base::MakeFramePrefix(size_);
     prefix_moved_ = 0;
     text_moved_ = 0;
     has_reply_ = true;
@@ -76,8 +75,8 @@ void FrameConnection::SetReply(std::string reply, Clock::time_point deadline) {
 }
 
 FrameConnection::Progress FrameConnection::Write() {
-    while (prefix_moved_ < sizeof(prefix_) || text_moved_ < text_.size()) {
-        iovec parts[2] = {{prefix_ + prefix_moved_, sizeof(prefix_) - prefix_moved_},
+    while (prefix_moved_ < prefix_.size() || text_moved_ < text_.size()) {
+        iovec parts[2] = {{prefix_.data() + prefix_moved_, prefix_.size() - prefix_moved_},
                           {text_.data() + text_moved_, text_.size() - text_moved_}};
         msghdr message{};
         message.msg_iov = parts;
@@ -96,4 +95,4 @@ FrameConnection::Progress FrameConnection::Write() {
     return Progress::kDone;
 }
 
-}  // namespace support
+}  // namespace quivra::daemon

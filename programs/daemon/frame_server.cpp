@@ -1,4 +1,4 @@
-#include "programs/support/frame_server.h"
+#include "programs/daemon/frame_server.h"
 
 #include <sys/epoll.h>
 #include <sys/eventfd.h>
@@ -17,20 +17,19 @@
 
 #include "common/error.h"
 #include "common/log.h"
-#include "programs/support/instance_lock.h"
+#include "programs/daemon/instance_lock.h"
+#include "programs/daemon/program.h"
 
-namespace support {
+namespace quivra::daemon {
 namespace {
 
-using quivra::Error;
-using quivra::base::UniqueFd;
+using base::UniqueFd;
 
-constexpr std::chrono::seconds kStopGrace{2};
 constexpr std::chrono::milliseconds kAcceptPause{100};
 
 [[noreturn]] void FailCall(int line, const char* condition, const std::string& what) {
-    const Error error(Error::kSystemCallFailed, what + ": " + quivra::SystemErrorText(errno));
-    quivra::Fail({"frame_server", line}, condition, error);
+    const Error error(Error::kSystemCallFailed, what + ": " + SystemErrorText(errno));
+    Fail({"frame_server", line}, condition, error);
 }
 
 UniqueFd MakeSocket() {
@@ -61,13 +60,13 @@ void RemoveStaleSocket(const sockaddr_un& address) {
     }
     if (!S_ISSOCK(status.st_mode)) {
         errno = EEXIST;
-        FailCall(__LINE__, "!S_ISSOCK(status.st_mode)", path + " is no socket");
+        FailCall(__LINE__, "!S_ISSOCK(status.st_mode)", path + " is not a socket");
     }
     const UniqueFd probe = MakeSocket();
     const auto* generic = reinterpret_cast<const sockaddr*>(&address);
     if (connect(probe.Get(), generic, sizeof(address)) == 0 || errno == EAGAIN) {
-        quivra::Fail({"frame_server", __LINE__}, "connect(probe, address) == 0",
-                     Error(Error::kLockFailed, "another server listens on " + path));
+        Fail({"frame_server", __LINE__}, "connect(probe, address) == 0",
+             Error(Error::kLockFailed, "another server listens on " + path));
     }
     if (unlink(path.c_str()) != 0 && errno != ENOENT) {
         FailCall(__LINE__, "unlink(path) != 0", "cannot remove " + path);
@@ -144,7 +143,27 @@ void FrameServer::Run() {
     }
 }
 
+void FrameServer::RunMain(const Signals& signals, ServiceManager& manager) {
+    signals_ = &signals;
+    manager_ = &manager;
+    Watch(EPOLL_CTL_ADD, signals.Fd(), EPOLLIN);
+    manager.Ready();
+    Run();
+    Watch(EPOLL_CTL_DEL, signals.Fd(), 0);
+}
+
+void FrameServer::ReadSignals() {
+    if (signals_->Read().stop && !stop_) {
+        manager_->Stopping();
+        EndAtLatest(kStopGrace);
+        stop_ = true;
+    }
+}
+
 void FrameServer::WaitAndDispatch() {
+    if (manager_ != nullptr) {
+        manager_->Turn(Clock::now());
+    }
     if (!stopping_ && !accepting_ && connections_ < options_.max_connections &&
         Clock::now() >= accept_again_) {
         want_wake_ = false;
@@ -157,6 +176,8 @@ void FrameServer::WaitAndDispatch() {
         if (fd == wake_.Get()) {
             std::uint64_t count = 0;
             [[maybe_unused]] const ssize_t got = read(fd, &count, sizeof(count));
+        } else if (signals_ != nullptr && fd == signals_->Fd()) {
+            ReadSignals();
         } else if (fd == listener_.Get()) {
             Accept();
         } else {
@@ -171,7 +192,7 @@ void FrameServer::WaitAndDispatch() {
 }
 
 int FrameServer::PollTimeout() const {
-    auto next = Clock::time_point::max();
+    auto next = manager_ == nullptr ? Clock::time_point::max() : manager_->NextTurn();
     for (const auto& [fd, connection] : watched_) {
         next = std::min(next, connection->Deadline());
     }
@@ -228,7 +249,7 @@ bool FrameServer::AcceptOne() {
             return true;
         }
         if (errno != EAGAIN && errno != EWOULDBLOCK) {
-            quivra::LogError({"frame_server", __LINE__}, "accept on %s", options_.path.c_str());
+            LogError({"frame_server", __LINE__}, "accept on %s", options_.path.c_str());
             SetAccepting(false);  // out of descriptors: the pending client would wake us for ever
             accept_again_ = Clock::now() + kAcceptPause;
         }
@@ -279,7 +300,7 @@ void FrameServer::MoveOn(ConnectionPtr connection) {
             work_ready_.notify_one();
         }
     } catch (const std::exception& error) {
-        quivra::LogError({"frame_server", __LINE__}, "connection dropped: %s", error.what());
+        LogError({"frame_server", __LINE__}, "connection dropped: %s", error.what());
     }
 }
 
@@ -322,7 +343,7 @@ void FrameServer::Work(const std::stop_token& stop) {
         try {
             Handle(std::move(connection));
         } catch (const std::exception& error) {
-            quivra::LogError({"frame_server", __LINE__}, "no reply: %s", error.what());
+            LogError({"frame_server", __LINE__}, "no reply: %s", error.what());
         }
     }
 }
@@ -354,4 +375,4 @@ void FrameServer::EndConnection::operator()(FrameConnection* connection) const {
     }
 }
 
-}  // namespace support
+}  // namespace quivra::daemon
