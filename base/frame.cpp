@@ -2,6 +2,7 @@
 
 #include <poll.h>
 #include <sys/socket.h>
+#include <sys/time.h>
 #include <sys/uio.h>
 #include <sys/un.h>
 #include <unistd.h>
@@ -68,6 +69,21 @@ bool ReceiveBytes(int socket, char* data, std::size_t size, Deadline deadline) {
     return true;
 }
 
+/// The wait for a place in a Unix server's backlog is bounded by the socket's time for sending.
+bool LimitSending(int socket, Deadline deadline) {
+    if (deadline == kNoDeadline) {
+        return true;
+    }
+    const auto left =
+        std::chrono::ceil<std::chrono::microseconds>(deadline - std::chrono::steady_clock::now());
+    if (left.count() <= 0) {
+        errno = ETIMEDOUT;
+        return false;
+    }
+    const timeval time{left.count() / 1'000'000, left.count() % 1'000'000};
+    return setsockopt(socket, SOL_SOCKET, SO_SNDTIMEO, &time, sizeof(time)) == 0;
+}
+
 }  // namespace
 
 FramePrefix MakeFramePrefix(std::size_t size) {
@@ -129,7 +145,7 @@ bool ReceiveFrame(int socket, std::string& message, std::size_t limit, Deadline 
     return true;
 }
 
-UniqueFd ConnectUnix(const std::string& path) {
+UniqueFd ConnectUnix(const std::string& path, Deadline deadline) {
     sockaddr_un address{};
     address.sun_family = AF_UNIX;
     if (path.size() >= sizeof(address.sun_path)) {
@@ -139,9 +155,10 @@ UniqueFd ConnectUnix(const std::string& path) {
     std::memcpy(address.sun_path, path.data(), path.size());
     UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
     while (fd.IsValid() &&
-           connect(fd.Get(), reinterpret_cast<const sockaddr*>(&address), sizeof(address)) != 0) {
+           (!LimitSending(fd.Get(), deadline) ||
+            connect(fd.Get(), reinterpret_cast<const sockaddr*>(&address), sizeof(address)) != 0)) {
         if (errno != EINTR) {  // a signal may come while the server's backlog is full
-            const int saved_errno = errno;
+            const int saved_errno = errno == EAGAIN ? ETIMEDOUT : errno;
             fd.Reset();
             errno = saved_errno;
         }

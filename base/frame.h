@@ -37,7 +37,8 @@ bool ReceiveFrame(int socket, std::string& message, std::size_t limit = kMaxFram
                   Deadline deadline = kNoDeadline);
 
 /// Connects a new socket to a Unix stream server, waiting while its backlog is full. The result is
-/// not valid when that fails; errno tells why.
-UniqueFd ConnectUnix(const std::string& path);
+/// not valid when that fails; errno tells why: ENOENT or ECONNREFUSED when nobody listens,
+/// ETIMEDOUT at the deadline.
+UniqueFd ConnectUnix(const std::string& path, Deadline deadline = kNoDeadline);
 
 }  // namespace quivra::base

@@ -1,5 +1,7 @@
 #include "programs/fileindexctl/application.h"
 
+#include <unistd.h>
+
 #include <exception>
 #include <ostream>
 
@@ -14,7 +16,7 @@ namespace {
 /// The one place where a failure is worded for the terminal. What an error is about may be hostile,
 /// so that the sentence is escaped even where the output is not.
 int Complain(Session& session, const std::string& sentence, int status) {
-    session.err << "fileindexctl: " << EscapeControl(sentence) << "\n";
+    session.err << "fileindexctl: " << Shown(sentence) << "\n";
     return status;
 }
 
@@ -46,9 +48,16 @@ int RunAction(const Action& action, Session& session) {
 int Run(const std::vector<std::string>& arguments, Session& session) {
     CommandLine line;
     try {
-        const Action action = line.Parse(arguments);
+        const Chosen chosen = line.Parse(arguments);
         session.json = line.WantsJson();
-        return RunAction(action, session);
+        // Before a lock is touched: whoever may not write must not leave a lock file behind, nor
+        // wait for one.
+        if (chosen.rights == Rights::kRoot && geteuid() != 0) {
+            return Complain(session,
+                            "cannot run '" + chosen.name + "': permission denied, run it as root",
+                            kFailure);
+        }
+        return RunAction(chosen.action, session);
     } catch (const CLI::Error& error) {
         return AnswerParser(line, session, error);
     } catch (const WrongCall& wrong_call) {

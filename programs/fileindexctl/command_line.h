@@ -9,8 +9,18 @@
 
 namespace quivra::ctl {
 
-/// Carries a command out; the answer is the exit status.
+/// Carries a command out and returns the exit status.
 using Action = std::function<int(Session&)>;
+
+/// Whether a command reads or changes what belongs to root alone.
+enum class Rights { kAnybody, kRoot };
+
+/// What a command line asks for.
+struct Chosen {
+    std::string name;  ///< "folder add"
+    Action action;
+    Rights rights = Rights::kRoot;
+};
 
 /// The tree of commands. Parsing only chooses an action; running it is the caller's.
 class CommandLine {
@@ -26,13 +36,13 @@ class CommandLine {
                          const std::string& examples);
 
     /// What the command does when it is the one that the command line names.
-    void OnCommand(CLI::App& command, Action action);
+    void OnCommand(CLI::App& command, Action action, Rights rights = Rights::kRoot);
 
     CLI::App& Root() { return root_; }
 
-    /// Chooses the action that the arguments (without the program's name) ask for. Throws
-    /// CLI::Error: a request for help, or a wrong call.
-    Action Parse(const std::vector<std::string>& arguments);
+    /// Finds out what the arguments (without the program's name) ask for. Throws CLI::Error for a
+    /// request for help and for a wrong call, WrongCall for a command that there is not.
+    Chosen Parse(const std::vector<std::string>& arguments);
 
     bool WantsJson() const { return json_; }
 
@@ -42,11 +52,11 @@ class CommandLine {
   private:
     CLI::App root_;
     bool json_ = false;
-    Action chosen_;
+    Chosen chosen_;
 };
 
 /// Takes the words out of the arguments of a search, where "-draft" is a word and not an option,
-/// and answers the rest for the parser. Other command lines are answered as they are.
+/// and returns the rest for the parser. Other command lines are returned as they are.
 std::vector<std::string> TakeSearchWords(CommandLine& line,
                                          const std::vector<std::string>& arguments);
 

@@ -3,8 +3,6 @@
 #include <algorithm>
 #include <array>
 
-#include "common/util.h"
-
 namespace quivra::ctl {
 namespace {
 
@@ -40,9 +38,9 @@ constexpr std::array kErrorTexts = {
     ErrorText{Error::kLoadFailed, "a configuration file is damaged",
               "repair it, or move it away to start without it", Reason::kTell},
     ErrorText{Error::kSaveFailed, "a configuration file could not be written",
-              "run the command as root and check the space on the system volume", Reason::kTell},
+              "check the space on the system volume", Reason::kTell},
     ErrorText{Error::kLockFailed, "another program holds the lock for too long",
-              "try again later, as root", Reason::kTell},
+              "try again when that one has ended", Reason::kLeaveOut},
     ErrorText{Error::kNoSuchShare, "no share has that name or holds that path",
               "see 'fileindexctl share list' for the shares of /etc/kesto/shares.conf",
               Reason::kLeaveOut},
@@ -56,18 +54,17 @@ constexpr std::array kErrorTexts = {
               "'fileindexctl why' tells the reason", Reason::kLeaveOut},
     ErrorText{Error::kMalformedEvent, "the change queue holds a damaged line",
               "it is skipped when the queue is processed; try again then", Reason::kTell},
-    ErrorText{Error::kChannelFailed, "the search daemon does not answer",
-              "run this as root, and start the daemon with 'service kestoelasticd start'",
-              Reason::kTell},
+    ErrorText{Error::kChannelFailed, "kestoelasticd is not running or does not reply",
+              "start it with 'service kestoelasticd start'", Reason::kLeaveOut},
     ErrorText{Error::kParseFailed, "the file could not be read",
               "check that it exists and the disk is sound", Reason::kTell},
-    ErrorText{Error::kQueryWithoutData, "the search daemon answered without data",
-              "restart it with 'service kestoelasticd restart'", Reason::kTell},
+    ErrorText{Error::kQueryWithoutData, "kestoelasticd replied without data",
+              "restart it with 'service kestoelasticd restart'", Reason::kLeaveOut},
     ErrorText{Error::kSpaceNotEnough, "there is no space left for the index",
               "free space on the share's volume", Reason::kTell},
-    ErrorText{Error::kDaemonOutOfMemory, "the search daemon is short of memory",
+    ErrorText{Error::kDaemonOutOfMemory, "kestoelasticd is short of memory",
               "try again in a few minutes", Reason::kTell},
-    ErrorText{Error::kDaemonBusy, "the search daemon is moving or compacting the index",
+    ErrorText{Error::kDaemonBusy, "kestoelasticd is moving or compacting the index",
               "try again in a few minutes", Reason::kTell},
     ErrorText{Error::kPathLookupFailed, "the path is not canonical",
               "give it absolute, without '.', '..', doubled or trailing '/'", Reason::kTell},
@@ -77,25 +74,46 @@ constexpr std::array kErrorTexts = {
               "'fileindexctl share clear' forgets one that is gone", Reason::kTell},
     ErrorText{kIndexPaused, "its index is paused", "'fileindexctl share resume' goes on with it",
               Reason::kLeaveOut},
-    ErrorText{kBadQuery, "the search daemon cannot follow the query",
+    ErrorText{kBadQuery, "kestoelasticd cannot follow the query",
               "see 'fileindexctl search --help'", Reason::kTell},
     ErrorText{kNoSpace, "the volume of the index is full", "free space there", Reason::kTell},
     ErrorText{kIndexUnavailable, "the files of its index are missing or unreadable",
               "check that its volume is mounted", Reason::kTell},
-    ErrorText{kReplyTooLarge, "there are too many hits for one answer", "use --limit",
+    ErrorText{kReplyTooLarge, "there are too many hits for one reply", "use --limit",
               Reason::kLeaveOut},
 };
 
-constexpr ErrorText kIndexerAway = {
-    Error::kSystemCallFailed, "the indexing daemon does not answer",
-    "run this as root, and start the daemon with 'service pkg-Quivra-fileindexd start'",
-    Reason::kTell};
+/// Code 502 stands for every system and platform call: what failed is told by the reason alone.
+struct CallText {
+    const char* reason_begins;
+    ErrorText text;
+};
 
-/// The channel to the indexing daemon shares its code with system calls; its reasons are its own.
-bool IsIndexerAway(const Error& error) {
-    return error.code == Error::kSystemCallFailed &&
-           (StringStartWith(error.reason, "write failed, ") ||
-            StringStartWith(error.reason, "read failed, "));
+constexpr const char* kIndexerAway = "fileindexd is not running or does not reply";
+constexpr const char* kStartIndexer = "start it with 'service pkg-Quivra-fileindexd start'";
+
+constexpr std::array kCallTexts = {
+    CallText{"write failed, ",
+             {Error::kSystemCallFailed, kIndexerAway, kStartIndexer, Reason::kLeaveOut}},
+    CallText{"read failed, ",
+             {Error::kSystemCallFailed, kIndexerAway, kStartIndexer, Reason::kLeaveOut}},
+    CallText{"MonitorQueue::",
+             {Error::kSystemCallFailed, "the registration with the file monitor cannot be saved",
+              "check that /var/lib/kesto/monitor can be written and has space", Reason::kLeaveOut}},
+    CallText{"FILEIDX",
+             {Error::kSystemCallFailed, "the place of its queue and index cannot be used",
+              "'fileindexctl status' tells what stands there", Reason::kLeaveOut}},
+    CallText{"open failed, ",
+             {Error::kLockFailed, "the lock file cannot be opened", "see the system log",
+              Reason::kTell}},
+};
+
+const ErrorText* FindCall(const Error& error) {
+    const auto* const it =
+        std::find_if(kCallTexts.begin(), kCallTexts.end(), [&error](const CallText& call) {
+            return error.code == call.text.code && error.reason.starts_with(call.reason_begins);
+        });
+    return it == kCallTexts.end() ? nullptr : &it->text;
 }
 
 const ErrorText* Find(int code) {
@@ -105,22 +123,38 @@ const ErrorText* Find(int code) {
     return it == kErrorTexts.end() ? nullptr : it;
 }
 
+const ErrorText* Find(const Error& error) {
+    const ErrorText* call = FindCall(error);
+    return call == nullptr ? Find(static_cast<int>(error.code)) : call;
+}
+
+std::string Cause(const ErrorText* text, const Error& error) {
+    if (text == nullptr) {
+        return error.reason.empty() ? "kestoelasticd refused it" : error.reason;
+    }
+    const bool tells = text->reason == Reason::kTell && !error.reason.empty();
+    return text->cause + (tells ? " (" + error.reason + ")" : std::string());
+}
+
+std::string Code(const Error& error) {
+    return " [" + std::to_string(static_cast<int>(error.code)) + "]";
+}
+
 }  // namespace
 
+std::string DescribeCause(const Error& error) {
+    return Cause(Find(error), error) + Code(error);
+}
+
 std::string DescribeError(const std::string& doing, const Error& error) {
-    const ErrorText* text = IsIndexerAway(error) ? &kIndexerAway : Find(error.code);
-    std::string sentence = "cannot " + doing + ": ";
-    if (text == nullptr) {
-        sentence += error.reason.empty() ? "the search daemon refused it" : error.reason;
-        sentence += "; see the search daemon's log";
-    } else {
-        sentence += text->cause;
-        if (text->reason == Reason::kTell && !error.reason.empty()) {
-            sentence += " (" + error.reason + ")";
-        }
-        sentence += std::string("; ") + text->remedy;
-    }
-    return sentence + " [" + std::to_string(static_cast<int>(error.code)) + "]";
+    const ErrorText* text = Find(error);
+    return "cannot " + doing + ": " + Cause(text, error) + "; " +
+           (text == nullptr ? "see the system log" : text->remedy) + Code(error);
+}
+
+bool IsIndexerAway(const Error& error) {
+    const ErrorText* call = FindCall(error);
+    return call != nullptr && call->cause == kIndexerAway;
 }
 
 bool HasErrorText(int code) {

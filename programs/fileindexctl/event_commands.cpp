@@ -10,6 +10,7 @@
 #include "fileindex/util.h"
 #include "programs/fileindexctl/command_line.h"
 #include "programs/fileindexctl/paths.h"
+#include "programs/fileindexctl/text.h"
 #include "sdk/share.h"
 
 namespace quivra::ctl {
@@ -69,8 +70,8 @@ int Report(Session& session, const std::string& share, const std::string& queue,
         result["event"] = event;
         session.out << toString(result) << "\n";
     } else {
-        session.out << "Queued for share " << session.Shown(share) << ": " << kind << " "
-                    << session.Shown(event["path"].asString()) << "\n";
+        session.out << "Queued for share " << Shown(share) << ": " << kind << " "
+                    << Shown(event["path"].asString()) << "\n";
     }
     return kSuccess;
 }

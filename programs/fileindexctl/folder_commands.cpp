@@ -1,4 +1,5 @@
 #include <array>
+#include <exception>
 #include <limits>
 #include <memory>
 #include <optional>
@@ -10,12 +11,16 @@
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/index_mgr.h"
+#include "fileindex/status_mgr.h"
 #include "fileindex/util.h"
 #include "programs/fileindexctl/command_line.h"
 #include "programs/fileindexctl/folder_status.h"
 #include "programs/fileindexctl/output.h"
 #include "programs/fileindexctl/paths.h"
+#include "programs/fileindexctl/shares.h"
 #include "programs/fileindexctl/table.h"
+#include "programs/fileindexctl/text.h"
+#include "programs/fileindexctl/waiting.h"
 
 namespace quivra::ctl {
 namespace {
@@ -69,8 +74,8 @@ int Report(Session& session, const Json::Value& folder, const std::string& sente
     if (session.json) {
         session.out << toString(folder) << "\n";
     } else {
-        session.out << sentence << session.Shown(folder["path"].asString()) << " ("
-                    << Contents(folder) << ").\n";
+        session.out << sentence << Shown(folder["path"].asString()) << " (" << Contents(folder)
+                    << ").\n";
     }
     return kSuccess;
 }
@@ -86,16 +91,19 @@ void SecureSavedFolder(const std::string& path, Session& session) {
 
 int Add(const Options& options, Session& session) {
     session.doing = "add " + options.path;
-    const std::string path = FindPlace(options.path).share_path;
+    const Place place = FindPlace(options.path);
+    const std::string& path = place.share_path;
     session.doing = "add " + path;
+    RequirePlaceOfIndex(place.share);
     Json::Value folder =
         fileindex::Folder(path, Basename(path), true, true, true, true, false).GetData();
     Apply(folder, options);
     const bool existed = fileindex::FolderMgr().HasFolder(path);
     try {
         const Silence silence;
-        fileindex::FolderAdd(ListOf(folder), false);
-    } catch (const Error&) {
+        WaitFor(session, Needs::kIndexerAndSearch,
+                [list = ListOf(folder)] { fileindex::FolderAdd(list, false); });
+    } catch (const std::exception&) {
         if (!existed && fileindex::FolderMgr().HasFolder(path)) {
             SecureSavedFolder(path, session);
         }
@@ -111,11 +119,15 @@ int Set(const Options& options, Session& session) {
     Json::Value folder;
     fileindex::FolderGet(folder, path);
     Apply(folder, options);
-    // There already, unless adding the folder was cut off; creating it again changes nothing.
-    fileindex::elastic::ShareIndexCreate(fileindex::Folder(folder).GetShare());
+    const std::string share = fileindex::Folder(folder).GetShare();
+    RequirePlaceOfIndex(share);
     {
         const Silence silence;
-        fileindex::FolderSet(ListOf(folder), false);
+        WaitFor(session, Needs::kIndexerAndSearch, [share, list = ListOf(folder)] {
+            // There already, unless adding the folder was cut off; making it again changes nothing.
+            fileindex::elastic::ShareIndexCreate(share);
+            fileindex::FolderSet(list, false);
+        });
     }
     return Report(session, folder, "Changed ");
 }
@@ -196,8 +208,9 @@ int Delete(const Options& options, Session& session) {
     fileindex::FolderGet(folder, path);
     try {
         const Silence silence;
-        fileindex::FolderDelete(ListOf(path));
-    } catch (const Error&) {
+        WaitFor(session, Needs::kIndexerAndSearch,
+                [list = ListOf(path)] { fileindex::FolderDelete(list); });
+    } catch (const std::exception&) {
         if (!fileindex::FolderMgr().HasFolder(path)) {
             session.doing = DoingAfterDelete(path);
         }
@@ -213,13 +226,19 @@ int Reindex(const Options& options, Session& session) {
         throw Failure("cannot reindex " + place.share_path + ": no folder of share " + place.share +
                       " is indexed; choose one with 'fileindexctl folder add'");
     }
+    RequirePlaceOfIndex(place.share);
     fileindex::FolderReindex(ListOf(place.share_path));
+    // The library logs what kept it from the queue and flags the share instead.
+    if ((fileindex::StatusMgr().GetShareStatus(place.share) & fileindex::kShareNeedReindex) != 0) {
+        throw Failure("cannot queue the reindex of " + place.share_path + ": the queue of share " +
+                      place.share + " cannot be written; the system log tells why");
+    }
     if (session.json) {
         Json::Value result(Json::objectValue);
         result["path"] = place.share_path;
         session.out << toString(result) << "\n";
     } else {
-        session.out << "Queued the reindex of " << session.Shown(place.share_path) << ".\n";
+        session.out << "Queued the reindex of " << Shown(place.share_path) << ".\n";
     }
     return kSuccess;
 }

@@ -1,6 +1,7 @@
 #include "programs/fileindexctl/folder_status.h"
 
 #include "common/error.h"
+#include "programs/fileindexctl/error_text.h"
 
 namespace quivra::ctl {
 
@@ -10,7 +11,7 @@ Json::Value FolderStatus(const fileindex::Folder& folder) {
         folder.GetStatus(status);
     } catch (const Error& error) {
         status["text"] = "error";
-        status["desc"] = error.what();
+        status["desc"] = DescribeCause(error);
     }
     return status;
 }

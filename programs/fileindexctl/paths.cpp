@@ -64,6 +64,11 @@ Place FindPlace(const std::string& path) {
     place.share_path = absolute;
     fileindex::GetShareNameByPath(place.share, absolute);
     fileindex::GetFullPath(place.full_path, absolute);
+    Place inner;
+    if (FindFullPath(inner, place.full_path) && inner.share != place.share) {
+        throw Failure(absolute + " lies in share " + inner.share + ", which lies within share " +
+                      place.share + "; use " + inner.share_path);
+    }
     return place;
 }
 

@@ -18,7 +18,8 @@ struct Place {
     std::string full_path;
 };
 
-/// Throws Error 800, with the path as its reason, when no share holds it.
+/// Throws Error 800, with the path as its reason, when no share holds it, and Failure for a share
+/// path into a share that lies within the named one: what is there belongs to the inner share.
 Place FindPlace(const std::string& path);
 
 /// The share path of a folder of the set: the path itself when the set holds it, even if its share

@@ -1,4 +1,5 @@
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <cerrno>
 #include <memory>
@@ -9,20 +10,35 @@
 #include "common/log.h"
 #include "fileindex/optree.h"
 #include "programs/fileindexctl/command_line.h"
+#include "programs/fileindexctl/text.h"
 
 namespace quivra::ctl {
 namespace {
 
 using fileindex::OP;
 
-/// A directory can be opened, and would count as an empty queue.
-void RefuseDirectory(const std::string& path) {
+/// What can be opened and is not a file would count as an empty queue, or never end.
+void RequireFile(const std::string& path) {
     struct stat status {};
     if (stat(path.c_str(), &status) != 0) {
         throw Failure("cannot read the queue " + path + ": " + SystemErrorText(errno));
     }
-    if (S_ISDIR(status.st_mode)) {
-        throw Failure("cannot read the queue " + path + ": it is a directory");
+    if (!S_ISREG(status.st_mode)) {
+        throw Failure("cannot read the queue " + path + ": it is " +
+                      (S_ISDIR(status.st_mode) ? "a directory" : "not a file"));
+    }
+    if (access(path.c_str(), R_OK) != 0) {
+        throw Failure("cannot read the queue " + path + ": " + SystemErrorText(errno) +
+                      (errno == EACCES ? ", run it as root" : ""));
+    }
+}
+
+/// A queue may hold damaged lines, which are passed over; a file without a single event is
+/// something else.
+void RequireEvents(int consumed, const std::string& path) {
+    struct stat status {};
+    if (consumed == 0 && stat(path.c_str(), &status) == 0 && status.st_size > 0) {
+        throw Failure(path + " is not a change queue: no line of it holds an event");
     }
 }
 
@@ -36,33 +52,34 @@ Json::Value ToJson(const OP& op) {
 }
 
 /// Written op by op: a queue may hold millions. A queue that cannot be read fails before the first.
-int ShowAsJson(fileindex::OPTree& queue, Session& session) {
+void ShowAsJson(fileindex::OPTree& queue, const std::string& path, Session& session) {
     const char* separator = "{\"ops\": [";
     const int consumed = queue.ProcessOP([&](std::shared_ptr<OP> op) {
         session.out << separator << toString(ToJson(*op));
         separator = ", ";
     });
+    RequireEvents(consumed, path);
     session.out << (separator[0] == '{' ? separator : "") << "], \"consumed\": " << consumed
                 << "}\n";
-    return kSuccess;
 }
 
 /// What the library itself prints of an operation, so that log and front end read alike.
-int ShowAsText(fileindex::OPTree& queue, Session& session) {
+void ShowAsText(fileindex::OPTree& queue, const std::string& path, Session& session) {
     const int consumed = queue.ProcessOP([&session](std::shared_ptr<OP> op) {
         std::ostringstream printed;
         printed << op;
-        session.out << session.Shown(printed.str()) << "\n";
+        session.out << Shown(printed.str()) << "\n";
     });
+    RequireEvents(consumed, path);
     session.out << "consumed: " << consumed << "\n";
-    return kSuccess;
 }
 
 int Show(const std::string& path, Session& session) {
     session.doing = "read the queue " + path;
-    RefuseDirectory(path);
+    RequireFile(path);
     fileindex::OPTree queue(path);
-    return session.json ? ShowAsJson(queue, session) : ShowAsText(queue, session);
+    (session.json ? ShowAsJson : ShowAsText)(queue, path, session);
+    return kSuccess;
 }
 
 }  // namespace
@@ -82,7 +99,8 @@ void AddQueueCommands(CommandLine& line) {
         "  fileindexctl queue show --json queue.tmp | jq '.ops[].path'");
     auto path = std::make_shared<std::string>();
     show.add_option("FILE", *path, "The queue file, or its working copy (.tmp)")->required();
-    line.OnCommand(show, [path](Session& session) { return Show(*path, session); });
+    line.OnCommand(
+        show, [path](Session& session) { return Show(*path, session); }, Rights::kAnybody);
 }
 
 }  // namespace quivra::ctl

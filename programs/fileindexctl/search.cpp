@@ -91,6 +91,23 @@ Rest SearchShare(const std::string& share, const Json::Value& query, SearchResul
 
 }  // namespace
 
+std::uint64_t CountDocuments(const std::string& share, const std::string& full_path) {
+    Json::Value own(Json::objectValue);
+    own["term"]["KESTOMDPath"] = full_path;
+    Json::Value below(Json::objectValue);
+    below["prefix"]["KESTOMDPath"] = full_path + "/";
+    Json::Value query(Json::objectValue);
+    query["qsl"]["any"].append(own);
+    query["qsl"]["any"].append(below);
+    query["limit"] = 0;
+    Json::Value reply;
+    fileindex::elastic::IndexQuery(reply, share, query);
+    if (!reply["total"].isUInt64()) {
+        throw Error(Error::kQueryWithoutData, toString(reply));
+    }
+    return reply["total"].asUInt64();
+}
+
 SearchResults SearchShares(const std::vector<std::string>& shares, const Json::Value& query,
                            const Page& page, const SortOrder& order, Session& session) {
     const Page page_of_each = PageOfEach(page, shares.size());

@@ -2,6 +2,7 @@
 
 #include <json/json.h>
 
+#include <cstdint>
 #include <limits>
 #include <string>
 #include <vector>
@@ -28,6 +29,10 @@ struct SearchResults {
     Json::UInt64 total = 0;
     std::vector<std::string> failures;  ///< a sentence for each share that was not searched
 };
+
+/// How many documents the share's index holds at and below the full path. Throws Error as
+/// IndexQuery.
+std::uint64_t CountDocuments(const std::string& share, const std::string& full_path);
 
 /// Asks the index of each share and merges the answers into one list: by the sort field, hits
 /// without it last; else the best of each share come first, then the second best, because relevance

@@ -81,7 +81,7 @@ std::string ShownHighlight(const std::string& text, const Session& session) {
     std::string line;
     std::string part;
     const auto flush = [&](const char* style) {
-        line += session.Shown(part);
+        line += Shown(part);
         part.clear();
         line += session.out_is_terminal ? style : "";
     };
@@ -101,10 +101,10 @@ std::string ShownHighlight(const std::string& text, const Session& session) {
 void PrintHit(const Json::Value& hit, const Options& options, Session& session) {
     const std::string path = hit["KESTOMDPath"].asString();
     if (options.paths) {
-        session.out << (options.null ? path : session.Shown(path)) << (options.null ? '\0' : '\n');
+        session.out << (options.null ? path : Shown(path)) << (options.null ? '\0' : '\n');
         return;
     }
-    session.out << session.Shown(path) << "\n";
+    session.out << Shown(path) << "\n";
     for (const char* field : kHighlightFields) {
         const Json::Value& text = hit["highlight"][field];
         if (text.isString() && !text.asString().empty()) {
@@ -128,7 +128,7 @@ void PrintJson(const SearchResults& results, const Options& options, Session& se
 /// To the error stream: what a script reads from the output is hits alone.
 void TellAbout(const SearchResults& results, const Options& options, Session& session) {
     for (const std::string& failure : results.failures) {
-        session.err << "fileindexctl: " << EscapeControl(failure) << "\n";
+        session.err << "fileindexctl: " << Shown(failure) << "\n";
     }
     if (results.total == 0) {
         session.err << "Nothing found.\n";

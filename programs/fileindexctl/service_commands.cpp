@@ -9,7 +9,9 @@
 #include "fileindex/index_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "programs/fileindexctl/command_line.h"
+#include "programs/fileindexctl/error_text.h"
 #include "programs/fileindexctl/output.h"
+#include "programs/fileindexctl/waiting.h"
 
 namespace quivra::ctl {
 namespace {
@@ -43,19 +45,27 @@ void PrintPause(Session& session, std::int64_t resume_time) {
 }
 
 /// What is recorded holds even if the daemon could not be told.
+std::string Untold(const std::string& doing) {
+    return "tell fileindexd to " + doing +
+           " (it is recorded, and holds from the daemon's next start on)";
+}
+
+/// The daemon is told after the change has been saved, so only a failure to tell it leaves the
+/// change recorded.
 template <typename Change>
 int ChangePause(Session& session, Change change) {
-    fileindex::StatusMgr status;
+    const std::string doing = session.doing;
+    session.doing = Untold(doing);
     try {
-        change(status);
-    } catch (const Error&) {
-        if (fileindex::StatusMgr().GetPauseInfo() == status.GetPauseInfo()) {
-            session.doing = "tell the indexing daemon to " + session.doing +
-                            " (it is recorded, and holds from the daemon's next start on)";
-        }
+        WaitFor(session, Needs::kIndexer, [change] {
+            fileindex::StatusMgr status;
+            change(status);
+        });
+    } catch (const Error& error) {
+        session.doing = IsIndexerAway(error) ? Untold(doing) : doing;
         throw;
     }
-    PrintPause(session, status.GetPauseInfo());
+    PrintPause(session, fileindex::StatusMgr().GetPauseInfo());
     return kSuccess;
 }
 

@@ -3,7 +3,6 @@
 #include <iosfwd>
 #include <stdexcept>
 #include <string>
-#include <string_view>
 
 namespace quivra::ctl {
 
@@ -16,16 +15,14 @@ inline constexpr int kWrongCall = 2;  ///< the command line itself is wrong: not
 struct Session {
     std::ostream& out;
     std::ostream& err;
-    bool out_is_terminal = false;  ///< colours, bars and escaped names instead of raw bytes
+    bool out_is_terminal = false;  ///< colours and bars
     unsigned int columns = 80;     ///< width and height of the terminal
     unsigned int rows = 24;
     bool json = false;  ///< one JSON document instead of text
     /// What is being attempted, "add /photo": the object of a failure's sentence.
     std::string doing{};
-
-    /// A name, path or text for `out`: raw for a program that reads it, escaped on a terminal, so
-    /// that nothing a file is called or contains can control the terminal.
-    std::string Shown(std::string_view bytes) const;
+    /// A thread still hangs in the library: the process must end without waiting for it.
+    bool given_up = false;
 };
 
 /// A failure of the front end itself; the text is the whole sentence. Exit status 1.

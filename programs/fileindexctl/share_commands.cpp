@@ -1,17 +1,21 @@
 #include <cctype>
 #include <functional>
 #include <memory>
+#include <optional>
 #include <ostream>
 
 #include "common/error.h"
 #include "common/json.h"
+#include "common/lock_file.h"
 #include "fileindex/folder_mgr.h"
-#include "fileindex/index_mgr.h"
 #include "programs/fileindexctl/command_line.h"
+#include "programs/fileindexctl/error_text.h"
 #include "programs/fileindexctl/output.h"
-#include "programs/fileindexctl/paths.h"
+#include "programs/fileindexctl/share_operations.h"
 #include "programs/fileindexctl/shares.h"
 #include "programs/fileindexctl/table.h"
+#include "programs/fileindexctl/text.h"
+#include "programs/fileindexctl/waiting.h"
 #include "sdk/share.h"
 
 namespace quivra::ctl {
@@ -29,7 +33,14 @@ struct Operation {
     const char* doing;  ///< "pause share"; the first argument follows
     const char* done;   ///< "Paused share"; the first argument follows
     std::function<void(const std::string&, const std::string&)> call;
+    /// The library changes the set of folders here without the lock that guards it.
+    bool under_lock = false;
 };
+
+std::function<void(const std::string&, const std::string&)> OnFirst(
+    void (*call)(const std::string&)) {
+    return [call](const std::string& first, const std::string&) { call(first); };
+}
 
 struct Arguments {
     std::string first;
@@ -47,7 +58,13 @@ int RunOperation(const Operation& operation, const Arguments& arguments, Session
     session.doing = std::string(operation.doing) + " " + arguments.first;
     {
         const Silence silence;
-        operation.call(arguments.first, arguments.second);
+        WaitFor(session, Needs::kIndexerAndSearch, [operation, arguments] {
+            std::optional<LockFile> lock;
+            if (operation.under_lock) {
+                lock.emplace(fileindex::kFileIndexFoldersLockPath, true);
+            }
+            operation.call(arguments.first, arguments.second);
+        });
     }
     if (session.json) {
         Json::Value result(Json::objectValue);
@@ -58,7 +75,7 @@ int RunOperation(const Operation& operation, const Arguments& arguments, Session
         }
         session.out << toString(result) << "\n";
     } else {
-        session.out << operation.done << " " << session.Shown(arguments.first) << ".\n";
+        session.out << operation.done << " " << Shown(arguments.first) << ".\n";
     }
     return kSuccess;
 }
@@ -74,44 +91,6 @@ void AddOperation(CommandLine& line, CLI::App& group, const Operation& operation
     line.OnCommand(app, [operation, arguments](Session& session) {
         return RunOperation(operation, *arguments, session);
     });
-}
-
-/// A share without folders is passed over by the library; who names it should learn that.
-void NeedsFolders(const std::string& share) {
-    if (!fileindex::FolderMgr().IsShareIndexed(share)) {
-        throw Failure("share " + share +
-                      " has no indexed folder; see 'fileindexctl folder list' for those that have");
-    }
-}
-
-/// A rename that was interrupted may have moved the folders already.
-void NeedsFoldersOfEither(const std::string& from, const std::string& to) {
-    if (!fileindex::FolderMgr().IsShareIndexed(to)) {
-        NeedsFolders(from);
-    }
-}
-
-/// The same for a volume, by the rule that the library selects its folders by.
-void NeedsFoldersBelow(const std::string& mount_point) {
-    const fileindex::FolderMgr folders;
-    for (const auto& folder : folders.GetFolders()) {
-        if (folder->GetFullPath().starts_with(mount_point)) {
-            return;
-        }
-    }
-    throw Failure("volume " + mount_point +
-                  " has no indexed folder; see 'fileindexctl status' for those that have");
-}
-
-/// Without one the library would report success and do nothing.
-void NeedsFoldersToClean(const std::string& mount_point) {
-    const fileindex::FolderMgr folders;
-    for (const auto& folder : folders.GetFolders()) {
-        if (folder->GetPaused() && folder->GetVolumeToBeClean() == mount_point) {
-            return;
-        }
-    }
-    throw Failure("volume " + mount_point + " has no paused folder that waits to be cleared");
 }
 
 /// A share whose flags cannot be read is listed with the reason, not left out.
@@ -134,7 +113,7 @@ Json::Value DescribeShare(const std::string& name, const fileindex::FolderMgr& f
         result["can_be_indexed"] = share.CanBeIndexed();
     } catch (const Error& error) {
         result["can_be_indexed"] = false;
-        result["error"] = error.what();
+        result["error"] = DescribeCause(error);
     }
     return result;
 }
@@ -169,44 +148,24 @@ const std::vector<Operation>& ShareOperations() {
     static const std::vector<Operation> operations = {
         {"pause", "Stop indexing a share; its index stays and is searched on",
          "fileindexctl share pause photo", "SHARE", "Name of the share", nullptr, nullptr,
-         "pause share", "Paused share",
-         [](const std::string& share, const std::string&) {
-             NeedsFolders(share);
-             fileindex::SharePause(share);
-         }},
+         "pause share", "Paused share", OnFirst(PauseShare), true},
         {"resume", "Index a paused share again", "fileindexctl share resume photo", "SHARE",
          "Name of the share", nullptr, nullptr, "resume share", "Resumed share",
-         [](const std::string& share, const std::string&) {
-             NeedsFolders(share);
-             fileindex::ShareResume(share);
-         }},
+         OnFirst(ResumeShare), true},
         {"clear", "Forget a share that is gone: its folders, its queue and its index",
          "fileindexctl share clear photo /volume1/photo", "SHARE", "Name of the share", "PATH",
-         "Full path of the root that it had", "clear share", "Cleared share",
-         [](const std::string& share, const std::string& path) {
-             fileindex::ShareClearPaused(share, CanonicalPath(path));
-         }},
+         "Full path of the root that it had", "clear share", "Cleared share", ClearShare, true},
         {"rename", "Carry index and folders over to a share's new name, once it has it",
          "fileindexctl share rename photo pictures", "FROM", "The old name", "TO", "The new name",
-         "rename share", "Carried over share",
-         [](const std::string& from, const std::string& to) {
-             NeedsFoldersOfEither(from, to);
-             fileindex::ShareRename(from, to);
-         }},
+         "rename share", "Carried over share", RenameShare},
         {"migrate", "Carry the index of a share over to its new place, once it is there",
          "fileindexctl share migrate photo /volume1/photo", "SHARE", "Name of the share",
          "OLD_PATH", "Full path of the root that it had", "migrate share", "Migrated share",
-         [](const std::string& share, const std::string& path) {
-             NeedsFolders(share);
-             fileindex::ShareMigrate(share, CanonicalPath(path));
-         }},
+         MigrateShare},
         {"check-recycle", "Settle the recycle bins after one was switched on or off",
          "fileindexctl share check-recycle photo", "SHARE", "Name of the share", nullptr, nullptr,
          "check the recycle bin of share", "Queued the check of the recycle bin of share",
-         [](const std::string& share, const std::string&) {
-             NeedsFolders(share);
-             fileindex::ShareCheckRecycle(share);
-         }},
+         OnFirst(CheckRecycleBin)},
     };
     return operations;
 }
@@ -215,25 +174,13 @@ const std::vector<Operation>& VolumeOperations() {
     static const std::vector<Operation> operations = {
         {"pause", "Stop indexing the shares of a volume, before it is unmounted or checked",
          "fileindexctl volume pause /volume1", "MOUNT_POINT", "Where the volume is mounted",
-         nullptr, nullptr, "pause volume", "Paused volume",
-         [](const std::string& mount_point, const std::string&) {
-             NeedsFoldersBelow(mount_point);
-             fileindex::VolumePause(mount_point);
-         }},
+         nullptr, nullptr, "pause volume", "Paused volume", OnFirst(PauseVolume), true},
         {"resume", "Index the shares of a volume again", "fileindexctl volume resume /volume1",
          "MOUNT_POINT", "Where the volume is mounted", nullptr, nullptr, "resume volume",
-         "Resumed volume",
-         [](const std::string& mount_point, const std::string&) {
-             NeedsFoldersBelow(mount_point);
-             fileindex::VolumeResume(mount_point);
-         }},
+         "Resumed volume", OnFirst(ResumeVolume), true},
         {"clear", "Forget the paused folders of a volume that is gone",
          "fileindexctl volume clear /volume1", "MOUNT_POINT", "Where the volume was mounted",
-         nullptr, nullptr, "clear volume", "Cleared volume",
-         [](const std::string& mount_point, const std::string&) {
-             NeedsFoldersToClean(mount_point);
-             fileindex::VolumeClearPaused(mount_point);
-         }},
+         nullptr, nullptr, "clear volume", "Cleared volume", OnFirst(ClearVolume), true},
     };
     return operations;
 }

@@ -18,7 +18,9 @@
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/status_mgr.h"
+#include "programs/fileindexctl/error_text.h"
 #include "programs/fileindexctl/folder_status.h"
+#include "programs/fileindexctl/search.h"
 #include "sdk/share.h"
 
 namespace quivra::ctl {
@@ -81,23 +83,6 @@ WorkerStatus ReadWorkerStatus(const std::string& share) {
     return worker;
 }
 
-/// Counted by path, not by "everything": both forms are answered from one term of the index.
-std::int64_t CountDocuments(const std::string& share, const std::string& root) {
-    Json::Value own(Json::objectValue);
-    own["term"]["KESTOMDPath"] = root;
-    Json::Value below(Json::objectValue);
-    below["prefix"]["KESTOMDPath"] = root + "/";
-    Json::Value query(Json::objectValue);
-    query["qsl"]["any"].append(own);
-    query["qsl"]["any"].append(below);
-    query["limit"] = 0;
-    Json::Value reply;
-    fileindex::elastic::IndexQuery(reply, share, query);
-    long long total = -1;
-    GetJsonValue(total, reply, "total", true);
-    return total;
-}
-
 /// Every part is tried on its own account: a daemon or a share that is away hides no other line.
 ShareLine TakeShareLine(const std::string& name, bool elastic_answers) {
     ShareLine status;
@@ -110,10 +95,10 @@ ShareLine TakeShareLine(const std::string& name, bool elastic_answers) {
         status.queue_lines = CountLines(queue);
         status.working_lines = CountLines(queue + ".tmp");
         if (elastic_answers) {
-            status.documents = CountDocuments(name, status.path);
+            status.documents = static_cast<std::int64_t>(CountDocuments(name, status.path));
         }
     } catch (const Error& error) {
-        status.error = error.what();
+        status.error = DescribeCause(error);
     }
     return status;
 }

@@ -6,12 +6,20 @@
 
 #include <kesto/share.h>
 
+#include "base/private_directory.h"
 #include "common/error.h"
 #include "common/util.h"
 #include "fileindex/folder_mgr.h"
+#include "programs/fileindexctl/session.h"
 #include "sdk/share.h"
 
 namespace quivra::ctl {
+namespace {
+
+/// Where the queue and the index of a share lie, below its root.
+constexpr const char* kPlaceOfIndex = "/@eaDir/fileindex";
+
+}  // namespace
 
 std::vector<std::string> AllShares() {
     KLIBCSzList* list = KLIBCSzListAlloc(1024);
@@ -26,6 +34,25 @@ std::vector<std::string> AllShares() {
     }
     std::sort(names.begin(), names.end());
     return names;
+}
+
+std::string RootOf(const std::string& share) {
+    KESTOShare* found = nullptr;
+    KESTOShareGet(share.c_str(), &found);
+    const std::unique_ptr<KESTOShare, decltype(&KESTOShareFree)> owner(found, KESTOShareFree);
+    return found == nullptr ? std::string() : found->szPath;
+}
+
+std::string ProblemOfPlace(const std::string& share) {
+    const std::string root = RootOf(share);
+    return root.empty() ? "" : base::PrivateDirectory::Open(root + kPlaceOfIndex).Problem();
+}
+
+void RequirePlaceOfIndex(const std::string& share) {
+    const std::string problem = ProblemOfPlace(share);
+    if (!problem.empty()) {
+        throw Failure(problem);
+    }
 }
 
 std::vector<std::string> SearchableShares() {

@@ -9,6 +9,16 @@ namespace quivra::ctl {
 /// them.
 std::vector<std::string> AllShares();
 
+/// The full path of the share's root; empty when the platform does not know the share.
+std::string RootOf(const std::string& share);
+
+/// What somebody has put where the share's queue and index belong, and what to do, as one sentence
+/// without its full stop. Empty when the place is right, or free, or cannot be looked at.
+std::string ProblemOfPlace(const std::string& share);
+
+/// Throws Failure with that sentence.
+void RequirePlaceOfIndex(const std::string& share);
+
 /// The shares that a search covers: those of the indexed folders, sorted; where no folder was ever
 /// chosen, all shares that have an index.
 std::vector<std::string> SearchableShares();

@@ -41,24 +41,24 @@ std::string Progress(const WorkerStatus& worker, const Session& session) {
 
 void PrintShare(const ShareLine& share, Session& session) {
     const std::uint64_t pending = share.queue_lines + share.working_lines;
-    session.out << "  " << session.Shown(share.name) << ": "
+    session.out << "  " << Shown(share.name) << ": "
                 << (share.documents < 0 ? "documents unknown"
                                         : Number(static_cast<std::uint64_t>(share.documents),
                                                  "document", "documents"))
                 << ", " << Number(pending, "change", "changes") << " waiting";
     if (share.worker.running) {
-        session.out << ", " << session.Shown(share.worker.state);
+        session.out << ", " << Shown(share.worker.state);
     } else {
         session.out << ", no worker";
     }
     session.out << "\n";
     if (share.worker.running && share.worker.state == "processing") {
         session.out << "    " << Progress(share.worker, session) << "  "
-                    << session.Shown(share.worker.current) << "\n";
+                    << Shown(share.worker.current) << "\n";
     }
     for (const std::string& error : {share.worker.last_error, share.error}) {
         if (!error.empty()) {
-            session.out << "    last error: " << session.Shown(error) << "\n";
+            session.out << "    last error: " << Shown(error) << "\n";
         }
     }
 }

@@ -12,12 +12,12 @@ void PrintTable(Session& session, const std::vector<std::vector<std::string>>& r
     for (const std::vector<std::string>& row : rows) {
         widths.resize(std::max(widths.size(), row.size()), 0);
         for (std::size_t i = 0; i < row.size(); ++i) {
-            widths[i] = std::max(widths[i], DisplayWidth(session.Shown(row[i])));
+            widths[i] = std::max(widths[i], DisplayWidth(Shown(row[i])));
         }
     }
     for (const std::vector<std::string>& row : rows) {
         for (std::size_t i = 0; i < row.size(); ++i) {
-            const std::string cell = session.Shown(row[i]);
+            const std::string cell = Shown(row[i]);
             session.out << cell;
             if (i + 1 < row.size()) {
                 session.out << std::string(widths[i] - DisplayWidth(cell) + 2, ' ');

@@ -4,8 +4,6 @@
 #include <array>
 #include <cstdio>
 
-#include "programs/fileindexctl/session.h"
-
 namespace quivra::ctl {
 namespace {
 
@@ -73,7 +71,7 @@ std::string EscapeByte(unsigned char byte) {
 
 }  // namespace
 
-std::string EscapeControl(std::string_view bytes) {
+std::string Shown(std::string_view bytes) {
     std::string text;
     text.reserve(bytes.size());
     while (!bytes.empty()) {
@@ -101,10 +99,6 @@ std::string ProgressBar(double share, unsigned int width) {
     const double filled = std::clamp(share, 0.0, 1.0) * cells;
     const auto full = static_cast<unsigned int>(filled);
     return "[" + std::string(full, '#') + std::string(cells - full, '-') + "]";
-}
-
-std::string Session::Shown(std::string_view bytes) const {
-    return out_is_terminal ? EscapeControl(bytes) : std::string(bytes);
 }
 
 }  // namespace quivra::ctl

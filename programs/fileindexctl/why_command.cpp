@@ -12,9 +12,11 @@
 #include "fileindex/status_mgr.h"
 #include "fileindex/util.h"
 #include "programs/fileindexctl/command_line.h"
+#include "programs/fileindexctl/error_text.h"
 #include "programs/fileindexctl/path_rules.h"
 #include "programs/fileindexctl/paths.h"
 #include "programs/fileindexctl/table.h"
+#include "programs/fileindexctl/text.h"
 #include "sdk/share.h"
 
 namespace quivra::ctl {
@@ -36,7 +38,7 @@ Answer Ask(Question question) {
     try {
         return {question(), ""};
     } catch (const Error& error) {
-        return {std::nullopt, error.what()};
+        return {std::nullopt, DescribeCause(error)};
     }
 }
 
@@ -171,7 +173,7 @@ Json::Value ToJson(const Report& report) {
 }
 
 void PrintReport(const Report& report, Session& session) {
-    session.out << session.Shown(report.place.full_path) << "\n";
+    session.out << Shown(report.place.full_path) << "\n";
     std::vector<std::vector<std::string>> rows;
     for (const Finding& finding : report.findings) {
         rows.push_back({finding.passed ? "  ok" : "  NO", finding.rule, finding.detail});
@@ -184,7 +186,7 @@ void PrintReport(const Report& report, Session& session) {
     rows.push_back({"", "waits in the queue", report.pending.Text()});
     rows.push_back({"", "in the index", report.in_index.Text()});
     PrintTable(session, rows);
-    session.out << session.Shown(Verdict(report)) << "\n";
+    session.out << Shown(Verdict(report)) << "\n";
 }
 
 int Why(const std::string& path, Session& session) {

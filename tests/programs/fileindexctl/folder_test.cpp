@@ -1,5 +1,8 @@
 #include <unistd.h>
 
+#include "common/lock_file.h"
+#include "fileindex/folder_mgr.h"
+#include "fileindex/status_mgr.h"
 #include "tests/programs/fileindexctl/ctl_fixture.h"
 
 namespace quivra::ctl {
@@ -57,7 +60,12 @@ TEST_F(FolderTest, FailuresNameObjectCauseAndRemedy) {
         {{"share", "pause", "music"}, "share music", "folder list"},
         {{"volume", "pause", "/volume9"}, "volume /volume9", "status"},
         {{"volume", "clear", "/volume1"}, "volume /volume1", "cleared"},
+        {{"share", "rename", "photo", "music"}, "photo", "old name"},
+        {{"share", "migrate", "photo", "/volume1/photo"}, "photo", "still lies there"},
+        {{"share", "migrate", "photo", "/nowhere"}, "photo", "ends in /photo"},
+        {{"folder", "add", "/photo/inner/x"}, "share inner", "use /inner/x"},
     };
+    fake::AddShare("inner", "/volume1/photo/inner");
     const Json::Value before = Folders();
     for (const Row& row : rows) {
         const Result result = Piped(row.arguments);
@@ -101,6 +109,73 @@ TEST_F(FolderTest, PausingReachesTheDaemon) {
     EXPECT_EQ(result.status, kFailure);
     EXPECT_NE(result.err.find("it is recorded"), std::string::npos) << result.err;
     EXPECT_EQ(ReadFile("/var/packages/Quivra/etc/fileindex.status"), R"({"resume_time":0})");
+    const LockFile lock(fileindex::kFileIndexStatusLockPath, true);
+    const Result locked = Piped({"resume"});
+    EXPECT_EQ(locked.status, kFailure);
+    EXPECT_EQ(locked.err.find("recorded"), std::string::npos) << locked.err;
+}
+
+/// Runs the command while somebody else holds the folder lock.
+TEST_F(FolderTest, ChangesOfTheSetRunUnderItsLock) {
+    Piped({"folder", "add", "/photo"});
+    const std::string before = ReadFile("/var/packages/Quivra/etc/fileindex.folders");
+    const LockFile lock(fileindex::kFileIndexFoldersLockPath, true);
+    const std::vector<std::string> rows[] = {
+        {"folder", "add", "/music"},     {"share", "pause", "photo"},
+        {"share", "resume", "photo"},    {"share", "clear", "photo", "/volume1/photo"},
+        {"volume", "pause", "/volume1"}, {"volume", "resume", "/volume1"},
+        {"volume", "clear", "/volume1"},
+    };
+    for (const std::vector<std::string>& row : rows) {
+        const Result result = Piped(row);
+        EXPECT_EQ(result.status, kFailure) << testing::PrintToString(row);
+        EXPECT_NE(result.err.find("[506]"), std::string::npos) << result.err;
+    }
+    EXPECT_EQ(ReadFile("/var/packages/Quivra/etc/fileindex.folders"), before);
+}
+
+TEST_F(FolderTest, ClearingBringsAShareToRestFirst) {
+    Piped({"folder", "add", "/photo"});
+    Piped({"folder", "add", "/music"});
+    for (const char* path : {"/volume1/music", "/volume9/photo", "/volume1/photo/x"}) {
+        const Result wrong = Piped({"share", "clear", "photo", path});
+        EXPECT_EQ(wrong.status, kFailure) << path;
+        EXPECT_EQ(wrong.out, "") << path;
+    }
+    EXPECT_EQ(Piped({"share", "clear", "nobody", "/volume1/nobody"}).status, kFailure);
+    EXPECT_EQ(Folders().size(), 2U);
+
+    EXPECT_EQ(Piped({"share", "clear", "photo", "/volume1/photo"}).out, "Cleared share photo.\n");
+    EXPECT_EQ(indexer_.Requests().back()["type"], "worker_delete");
+    EXPECT_EQ(fake::Platform()->monitor_queues.size(), 1U);
+    // One that the platform has forgotten already.
+    fake::Platform()->shares.erase("music");
+    EXPECT_EQ(Piped({"share", "clear", "music", "/volume1/music"}).out, "Cleared share music.\n");
+    EXPECT_EQ(indexer_.Requests().back()["data"]["share_name"], "music");
+    EXPECT_TRUE(fake::Platform()->monitor_queues.empty());
+    EXPECT_EQ(Folders().size(), 0U);
+}
+
+TEST_F(FolderTest, WhatStandsInThePlaceOfTheIndexIsNamed) {
+    Piped({"folder", "add", "/photo"});
+    std::filesystem::remove_all("/volume1/photo/@eaDir");
+    WriteFile("/volume1/photo/@eaDir", "planted");
+    for (const char* command : {"reindex", "set"}) {
+        const Result result = Piped({"folder", command, "/photo"});
+        EXPECT_EQ(result.status, kFailure);
+        EXPECT_EQ(result.out, "");
+        EXPECT_NE(result.err.find("/volume1/photo/@eaDir is not a directory; remove it"),
+                  std::string::npos)
+            << result.err;
+    }
+}
+
+TEST_F(FolderTest, AReindexThatCouldNotBeQueuedIsNotClaimed) {
+    Piped({"folder", "add", "/photo"});
+    const LockFile lock(QueueOf("photo"), true);
+    const Result result = Piped({"folder", "reindex", "/photo/2019"});
+    EXPECT_EQ(result.status, kFailure);
+    EXPECT_EQ(result.out, "");
 }
 
 TEST_F(FolderTest, WhatServicesPrintDoesNotMixWithTheOutput) {

@@ -1,12 +1,18 @@
 // The real program: what only shows between processes.
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <sys/file.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <atomic>
+#include <chrono>
 #include <filesystem>
 #include <fstream>
+#include <memory>
+#include <thread>
 
+#include "tests/fake/scripted_server.h"
 #include "tests/support/program.h"
 
 namespace {
@@ -41,6 +47,84 @@ TEST(ProgramTest, AReaderMayGoAwayButAFullDiskIsAFailure) {
     EXPECT_EQ(std::filesystem::file_size("/tmp/errors"), 0U);
     EXPECT_EQ(WEXITSTATUS(std::system((call + " >/dev/full 2>/tmp/errors").c_str())), 1);
     EXPECT_GT(std::filesystem::file_size("/tmp/errors"), 0U);
+}
+
+/// Runs the command beside a daemon that takes the request and then ends: within how many seconds
+/// it noticed, and what it said.
+class WaitingTest : public testing::Test {
+  protected:
+    WaitingTest() {
+        std::filesystem::remove_all("/var/packages/Quivra");
+        std::filesystem::create_directories("/var/packages/Quivra/etc");
+        std::filesystem::create_directories("/etc/kesto");
+        std::filesystem::create_directories("/volume1/s");
+        std::filesystem::create_directories("/var/lib/kesto");
+        WriteFile("/etc/kesto/shares.conf", "[s]\npath = /volume1/s\n");
+    }
+
+    static support::Outcome RunInTime(const std::vector<std::string>& arguments) {
+        const auto begin = std::chrono::steady_clock::now();
+        support::Outcome outcome = support::RunProgram("fileindexctl", arguments);
+        EXPECT_LT(std::chrono::steady_clock::now() - begin, std::chrono::seconds(4));
+        return outcome;
+    }
+
+    static bool IsFree(const char* lock) {
+        const int fd = open(lock, O_RDWR | O_CLOEXEC);
+        const bool is_free = fd >= 0 && flock(fd, LOCK_EX | LOCK_NB) == 0;
+        close(fd);
+        return is_free;
+    }
+};
+
+TEST_F(WaitingTest, ADaemonThatGoesIsNoticedAndNoLockIsLeft) {
+    fake::ScriptedServer search("/var/run/kestoelasticd.sock");
+    fake::ScriptedServer indexer("/var/run/fileindexd.sock");
+    const std::pair<std::vector<std::string>, const char*> rows[] = {
+        {{"pause"}, "/tmp/quivra_cfg_fi_status.lock"},
+        {{"folder", "add", "/s"}, "/tmp/quivra_cfg_folder.lock"},
+    };
+    for (const auto& [arguments, lock] : rows) {
+        indexer.Then({"", true, false});  // it reads the request and closes the connection
+        const support::Outcome outcome = RunInTime(arguments);
+        EXPECT_EQ(outcome.status, 1);
+        EXPECT_NE(outcome.output.find("fileindexd has gone"), std::string::npos) << outcome.output;
+        EXPECT_TRUE(IsFree(lock));
+    }
+}
+
+TEST_F(WaitingTest, ABusySearchDaemonThatGoesEndsTheLongSleep) {
+    auto search = std::make_unique<fake::ScriptedServer>("/var/run/kestoelasticd.sock");
+    std::atomic<bool> asked = false;
+    search->SetHandler([&asked](const Json::Value&) {
+        asked = true;
+        return fake::Frame(R"({"success":false,"error":{"code":1401,"msg":"busy"}})");
+    });
+    fake::ScriptedServer indexer("/var/run/fileindexd.sock");
+    support::Program command("fileindexctl", {"folder", "add", "/s"});
+    ASSERT_TRUE(support::Eventually([&asked] { return asked.load(); }));
+    std::this_thread::sleep_for(std::chrono::milliseconds(500));  // it has looked at the socket
+    search.reset();
+    EXPECT_TRUE(
+        support::Eventually([&command] { return !command.IsRunning(); }, std::chrono::seconds(3)));
+    EXPECT_EQ(command.Wait(), 1);
+    EXPECT_TRUE(IsFree("/tmp/quivra_cfg_folder.lock"));
+}
+
+TEST(ProgramTest, WhoIsNotRootLearnsThatAndLeavesNothing) {
+    const std::string as_nobody = "setpriv --reuid 65534 --clear-groups ";
+    if (std::system((as_nobody + "true 2>/dev/null").c_str()) != 0) {
+        GTEST_SKIP() << "this namespace has one user only";
+    }
+    for (const char* command : {"pause", "status", "search x", "folder list", "share list"}) {
+        const std::string call =
+            as_nobody + FILEINDEX_BIN_DIR "/fileindexctl " + command + " >/tmp/out 2>&1";
+        EXPECT_EQ(WEXITSTATUS(std::system(call.c_str())), 1);
+        std::ifstream out("/tmp/out");
+        std::string line;
+        std::getline(out, line);
+        EXPECT_NE(line.find("permission denied, run it as root"), std::string::npos) << line;
+    }
 }
 
 }  // namespace

@@ -56,12 +56,13 @@ TEST_F(SearchTest, PathsAndTheLineWhereTheWordIs) {
     const Result piped = Piped({"search", "whale"});
     EXPECT_EQ(piped.status, kSuccess);
     EXPECT_EQ(piped.out,
-              "/volume1/a/x\n    two lines of whale\n/volume1/a/\x1b[2J\n    \x1b]0;x\a w\n");
+              "/volume1/a/x\n    two lines of whale\n"
+              "/volume1/a/\\x1b[2J\n    \\x1b]0;x\\x07 w\n");
     EXPECT_EQ(piped.err, "");
     EXPECT_EQ(OnTerminal({"search", "whale"}).out,
               "/volume1/a/x\n    two lines of \x1b[1mwhale\x1b[0m\x1b[0m\n"
               "/volume1/a/\\x1b[2J\n    \\x1b]0;x\\x07 \x1b[1mw\x1b[0m\x1b[0m\n");
-    EXPECT_EQ(Piped({"search", "--paths", "whale"}).out, "/volume1/a/x\n/volume1/a/\x1b[2J\n");
+    EXPECT_EQ(Piped({"search", "--paths", "whale"}).out, "/volume1/a/x\n/volume1/a/\\x1b[2J\n");
     EXPECT_FALSE(LastQuery().isMember("highlight"));
     EXPECT_EQ(OnTerminal({"search", "--null", "whale"}).out,
               std::string("/volume1/a/x\0/volume1/a/\x1b[2J\0", 29));

@@ -5,7 +5,7 @@
 namespace quivra::ctl {
 namespace {
 
-TEST(EscapeControlTest, NothingControlsTheTerminalOrDeceivesItsReader) {
+TEST(ShownTest, NothingControlsTheTerminalOrDeceivesItsReader) {
     struct Row {
         std::string bytes;
         std::string text;
@@ -24,7 +24,7 @@ TEST(EscapeControlTest, NothingControlsTheTerminalOrDeceivesItsReader) {
         {"\xf0\x9f\x98", "\\xf0\\x9f\\x98"},          // cut off
     };
     for (const Row& row : rows) {
-        EXPECT_EQ(EscapeControl(row.bytes), row.text);
+        EXPECT_EQ(Shown(row.bytes), row.text);
     }
 }
 

@@ -57,6 +57,16 @@ TEST_F(WordingTest, WrongCallsHaveStatusTwoAndDoNothing) {
         {"folder", "add"},
         {"pause", "999999"},
     };
+    const std::pair<std::vector<std::string>, const char*> slips[] = {
+        {{"serch", "x"}, "did you mean 'search'?"},
+        {{"--json", "folder", "lsit"}, "did you mean 'list'?"},
+        {{"folder", "frobnicate"}, "see 'fileindexctl folder --help'"},
+    };
+    for (const auto& [arguments, advice] : slips) {
+        const Result result = Piped(arguments);
+        EXPECT_EQ(result.status, kWrongCall);
+        EXPECT_NE(result.err.find(advice), std::string::npos) << result.err;
+    }
     fake::ScriptedServer indexer(kDaemonSocket);
     for (const std::vector<std::string>& row : rows) {
         const Result result = Piped(row);
