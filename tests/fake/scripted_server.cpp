@@ -5,13 +5,13 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <cstdint>
 #include <cstring>
 #include <deque>
 #include <mutex>
 #include <stdexcept>
 #include <thread>
 
+#include "base/frame.h"
 #include "base/unique_fd.h"
 #include "common/json.h"
 
@@ -34,20 +34,11 @@ struct ScriptedServer::State {
     void Serve(UniqueFd connection);
 };
 
-std::string Frame(const std::string& text) {
-    const auto size = static_cast<std::uint32_t>(text.size());
-    return std::string(reinterpret_cast<const char*>(&size), sizeof(size)) + text;
-}
-
 bool ReadRequest(int fd, Json::Value& request) {
-    std::uint32_t size = 0;
-    if (recv(fd, &size, sizeof(size), MSG_WAITALL) != static_cast<ssize_t>(sizeof(size))) {
-        return false;
-    }
-    std::string text(size, '\0');
-    const ssize_t got = recv(fd, text.data(), size, MSG_WAITALL);
+    std::string text;
+    const bool is_whole = quivra::base::ReceiveFrame(fd, text);
     quivra::fromString(request, text);
-    return got == static_cast<ssize_t>(size);
+    return is_whole;
 }
 
 void ScriptedServer::State::Serve(UniqueFd connection) {

@@ -7,10 +7,11 @@
 #include <string>
 #include <vector>
 
+#include "tests/support/files.h"
+
 namespace fake {
 
-/// The bytes of a message on a daemon's socket: its length in 4 bytes, then the text.
-std::string Frame(const std::string& text);
+using support::Frame;
 
 /// What the server does with one connection: the default is to read the request, send `bytes` and
 /// close.

@@ -6,14 +6,13 @@
 
 #include <chrono>
 #include <filesystem>
-#include <fstream>
-#include <sstream>
 #include <string>
 
 #include "common/error.h"
 #include "common/json.h"
 #include "tests/fake/fake_libc.h"
 #include "tests/fake/fake_platform.h"
+#include "tests/support/files.h"
 
 namespace quivra::fileindex {
 
@@ -55,16 +54,8 @@ inline Json::Value Parse(const std::string& text) {
     return value;
 }
 
-inline std::string ReadFile(const std::string& path) {
-    std::ifstream file(path, std::ios::binary);
-    std::ostringstream text;
-    text << file.rdbuf();
-    return text.str();
-}
-
-inline void WriteFile(const std::string& path, const std::string& text) {
-    std::ofstream(path, std::ios::binary | std::ios::trunc) << text;
-}
+using support::ReadFile;
+using support::WriteFile;
 
 inline std::size_t OpenDescriptors() {
     const std::filesystem::directory_iterator entries("/proc/self/fd");

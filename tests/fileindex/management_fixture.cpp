@@ -1,5 +1,7 @@
 #include "tests/fileindex/management_fixture.h"
 
+#include <fstream>
+
 #include "common/lock_file.h"
 
 namespace quivra::fileindex {

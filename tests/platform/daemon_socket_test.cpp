@@ -4,16 +4,16 @@
 
 #include <cerrno>
 #include <csignal>
-#include <cstdint>
-#include <cstring>
 #include <thread>
 
+#include "base/frame.h"
 #include "tests/platform/platform_test.h"
 
 namespace {
 
 using namespace platform_test;
 using kestodaemon::DomainSockConnection;
+using support::Frame;
 
 class DaemonSocketTest : public PlatformTest {
   protected:
@@ -28,22 +28,22 @@ class DaemonSocketTest : public PlatformTest {
     DomainSockConnection connection_{"/volume1/socket"};
 };
 
-std::string Frame(std::uint32_t size, const std::string& body) {
-    std::string frame(sizeof(size), '\0');
-    std::memcpy(frame.data(), &size, sizeof(size));
-    return frame + body;
+/// A frame that announces another length than it has.
+std::string FrameOf(std::size_t announced, const std::string& body) {
+    const auto prefix = quivra::base::MakeFramePrefix(announced);
+    return std::string(prefix.begin(), prefix.end()) + body;
 }
 
 TEST_F(DaemonSocketTest, HostileFramesFail) {
     const std::string large(3U << 20, 'x');
     const std::pair<std::string, int> rows[] = {
-        {Frame(5, "hello and more"), 0},
-        {Frame(0, ""), 0},
-        {Frame(3U << 20, large), 0},
-        {Frame(5, "hello").substr(0, 3), ECONNRESET},
-        {Frame(6, "hello"), ECONNRESET},
-        {Frame(1U << 30, "hello"), ECONNRESET},  // announced, and never allocated
-        {Frame((1U << 30) + 1, ""), EMSGSIZE},
+        {FrameOf(5, "hello and more"), 0},
+        {Frame(""), 0},
+        {Frame(large), 0},
+        {Frame("hello").substr(0, 3), ECONNRESET},
+        {FrameOf(6, "hello"), ECONNRESET},
+        {FrameOf(1U << 30, "hello"), ECONNRESET},  // announced, and never allocated
+        {FrameOf((1U << 30) + 1, ""), EMSGSIZE},
     };
     for (const auto& [sent, error] : rows) {
         ASSERT_TRUE(connection_.Connect());
@@ -56,8 +56,7 @@ TEST_F(DaemonSocketTest, HostileFramesFail) {
         errno = 0;
         EXPECT_EQ(connection_.Recv(message), error == 0);
         EXPECT_EQ(errno, error);
-        EXPECT_TRUE(error != 0 ||
-                    sent.starts_with(Frame(static_cast<std::uint32_t>(message.size()), message)));
+        EXPECT_TRUE(error != 0 || sent.starts_with(Frame(message)));
         server.join();
     }
 }
@@ -70,7 +69,7 @@ TEST_F(DaemonSocketTest, SendsWholeFramesAndSurvivesAHangUp) {
     std::thread reader([&] { recv(peer, received.data(), received.size(), MSG_WAITALL); });
     EXPECT_TRUE(connection_.Send(large));
     reader.join();
-    EXPECT_TRUE(received == Frame(3U << 20, large));
+    EXPECT_TRUE(received == Frame(large));
     close(peer);
     static volatile std::sig_atomic_t broken_pipes = 0;
     const auto old_handler = std::signal(SIGPIPE, [](int /*signal*/) { broken_pipes = 1; });

@@ -3,52 +3,21 @@
 #include <gtest/gtest.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
-#include <cstdlib>
 #include <filesystem>
-#include <fstream>
-#include <functional>
-#include <iterator>
 #include <string>
 
 #include "tests/fake/fake_libc.h"
+#include "tests/support/files.h"
+#include "tests/support/users.h"
 
 namespace platform_test {
 
-inline void WriteFile(const std::string& path, const std::string& content) {
-    std::filesystem::create_directories(std::filesystem::path(path).parent_path());
-    std::ofstream(path, std::ios::binary) << content;
-}
-
-inline std::string ReadFile(const std::string& path) {
-    std::ifstream file(path, std::ios::binary);
-    return {std::istreambuf_iterator<char>(file), {}};
-}
-
-inline unsigned int ModeOf(const std::string& path) {
-    struct stat status {};
-    return lstat(path.c_str(), &status) == 0 ? status.st_mode & 07777 : 0;
-}
-
-/// Whether other users than root exist here; a user namespace may map one id only.
-inline bool HasOtherUsers() {
-    return ReadFile("/proc/self/uid_map").find("4294967295") != std::string::npos;
-}
-
-/// What the body returns in a process of its own, where it may change its identity; nothing when it
-/// crashes.
-inline std::string InChild(const std::function<std::string()>& body) {
-    const pid_t pid = fork();
-    if (pid == 0) {
-        std::ofstream result("/tmp/result");
-        result << body() << std::flush;
-        _exit(0);
-    }
-    waitpid(pid, nullptr, 0);
-    return ReadFile("/tmp/result");
-}
+using support::HasOtherUsers;
+using support::InChild;
+using support::ModeOf;
+using support::ReadFile;
+using support::WriteFile;
 
 /// Something mounted for the length of a scope.
 class Mount {

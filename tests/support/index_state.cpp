@@ -3,22 +3,14 @@
 #include <gtest/gtest.h>
 
 #include <filesystem>
-#include <fstream>
-#include <sstream>
 
 #include "fileindex/elastic/elastic_control.h"
+#include "tests/support/files.h"
 
 namespace support {
 namespace {
 
 namespace fs = std::filesystem;
-
-std::string Read(const fs::path& path) {
-    std::ifstream file(path, std::ios::binary);
-    std::ostringstream text;
-    text << file.rdbuf();
-    return text.str();
-}
 
 std::string Lines(const std::string& label, const Contents& some, const Contents& other) {
     std::string lines;
@@ -39,7 +31,7 @@ Contents ContentsOnDisk(const std::string& root) {
         if (it->path().filename() == "@eaDir") {
             it.disable_recursion_pending();
         } else {
-            contents[it->path()] = it->is_directory() ? "/" : Read(it->path());
+            contents[it->path()] = it->is_directory() ? "/" : ReadFile(it->path());
         }
     }
     return contents;

@@ -14,15 +14,12 @@
 #include "common/error.h"
 #include "common/log.h"
 #include "fileindex/util.h"
+#include "tests/support/files.h"
 
 namespace {
 
 namespace fs = std::filesystem;
 using namespace quivra::fileindex;
-
-void Write(const std::string& path, const std::string& content) {
-    std::ofstream(path, std::ios::binary) << content;
-}
 
 /// An empty EROFS file system: a superblock and the inode of the root directory.
 std::string ErofsImage() {
@@ -51,20 +48,20 @@ class ClassificationTest : public testing::Test {
               "/volume1/NetBackup", "/volume1/homes/ada/#recycle"}) {
             fs::create_directories(path);
         }
-        Write("/etc/kesto/shares.conf",
-              "[photo]\npath = /volume1/photo\nrecycle = yes\n"
-              "[keeper]\npath = /volume1/keeper\n"
-              "[vault]\npath = /volume1/vault\nencryption = yes\n"
-              "[locked]\npath = /volume1/locked\nencryption = yes\nencrypted = yes\n"
-              "[fixed]\npath = /volume1/fixed\nread only = yes\n"
-              "[NetBackup]\npath = /volume1/NetBackup\n"
-              "[homes]\npath = /volume1/homes\n");
-        Write("/volume1/photo/dir/a.jpg", "x");
+        support::WriteFile("/etc/kesto/shares.conf",
+                           "[photo]\npath = /volume1/photo\nrecycle = yes\n"
+                           "[keeper]\npath = /volume1/keeper\n"
+                           "[vault]\npath = /volume1/vault\nencryption = yes\n"
+                           "[locked]\npath = /volume1/locked\nencryption = yes\nencrypted = yes\n"
+                           "[fixed]\npath = /volume1/fixed\nread only = yes\n"
+                           "[NetBackup]\npath = /volume1/NetBackup\n"
+                           "[homes]\npath = /volume1/homes\n");
+        support::WriteFile("/volume1/photo/dir/a.jpg", "x");
         fs::create_directory_symlink("/volume1/photo/dir", "/volume1/photo/link");
         fs::create_directory_symlink("/volume1/nowhere", "/volume1/photo/dangling");
         Mount("/volume1/photo/dir", "/volume1/photo/bound", "", MS_BIND);
         Mount("none", "/volume1/photo/tmpfs", "tmpfs", 0);
-        Write("/volume1/photo/tmpfs/file", "x");
+        support::WriteFile("/volume1/photo/tmpfs/file", "x");
         Mount("none", "/volume1/vault", "tmpfs", 0);
     }
 
@@ -111,7 +108,7 @@ TEST_F(ClassificationTest, EveryRule) {
         {"/volume1/NetBackup", false, "an excluded share"},
         {"/proc/self/status", false, "the kernel's own file system"},
     };
-    Write("/volume1/photo/#recycle/x", "x");
+    support::WriteFile("/volume1/photo/#recycle/x", "x");
     for (const auto& row : rows) {
         EXPECT_EQ(CanFullPathBeIndexed(row.path), row.indexable) << row.rule << ": " << row.path;
     }
@@ -120,7 +117,7 @@ TEST_F(ClassificationTest, EveryRule) {
 }
 
 TEST_F(ClassificationTest, AMountedImageIsNotIndexed) {
-    Write("/volume1/image", ErofsImage());
+    support::WriteFile("/volume1/image", ErofsImage());
     if (std::system("mount -t erofs -o loop,ro /volume1/image /volume1/photo/image 2>/dev/null") !=
         0) {
         GTEST_SKIP() << "no loop devices or no EROFS here";

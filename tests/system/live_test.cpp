@@ -17,6 +17,7 @@
 #include "common/log.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/status_mgr.h"
+#include "tests/support/files.h"
 #include "tests/support/index_state.h"
 #include "tests/support/program.h"
 #include "tests/system/file_user.h"
@@ -28,6 +29,7 @@ using namespace quivra::fileindex;
 using support::Contents;
 using support::Eventually;
 using support::Program;
+using support::WriteFile;
 using Clock = std::chrono::steady_clock;
 
 const std::string kVolume = "/volume1";
@@ -35,10 +37,6 @@ const std::string kRoot = kVolume + "/photo";
 
 double MillisecondsSince(Clock::time_point start) {
     return std::chrono::duration<double, std::milli>(Clock::now() - start).count();
-}
-
-void Write(const std::string& path, const std::string& content) {
-    std::ofstream(path) << content;
 }
 
 void MountVolume(const std::string& path, const char* options) {
@@ -49,8 +47,8 @@ void MountVolume(const std::string& path, const char* options) {
 void SetShare(const std::string& path) {
     fs::create_directories("/etc/kesto");
     // Replaced, as an administrator's editor does it.
-    Write("/etc/kesto/shares.conf.new",
-          "[" + fs::path(path).filename().string() + "]\npath = " + path + "\n");
+    WriteFile("/etc/kesto/shares.conf.new",
+              "[" + fs::path(path).filename().string() + "]\npath = " + path + "\n");
     fs::rename("/etc/kesto/shares.conf.new", "/etc/kesto/shares.conf");
 }
 
@@ -84,7 +82,7 @@ class LiveTest : public testing::Test {
         fs::create_directories("/var/packages/Quivra/etc");
         SetShare(kRoot);
         StartAll();
-        Write(kRoot + "/first.txt", "there before the folder was chosen\n");
+        WriteFile(kRoot + "/first.txt", "there before the folder was chosen\n");
         FolderAdd(FolderRequest("/photo"), false);
         ExpectSettled("photo", kRoot);
     }
@@ -147,7 +145,7 @@ class LiveTest : public testing::Test {
     void MakeDirectory(const std::string& path, int files) {
         fs::create_directories(path);
         for (int i = 0; i < files; ++i) {
-            Write(path + "/file " + std::to_string(i) + ".txt", "number " + std::to_string(i));
+            WriteFile(path + "/file " + std::to_string(i) + ".txt", "number " + std::to_string(i));
         }
     }
 
@@ -158,13 +156,13 @@ class LiveTest : public testing::Test {
 
 TEST_F(LiveTest, ChangesAreFoundSoon) {
     const auto start = Clock::now();
-    Write(kRoot + "/fresh.txt", "hello\n");
+    WriteFile(kRoot + "/fresh.txt", "hello\n");
     EXPECT_TRUE(Eventually([&] { return IsFound(kRoot + "/fresh.txt", "hello\n"); }));
     std::cout << "from close to found: " << MillisecondsSince(start) << " ms\n";
 
-    Write(kRoot + "/fresh.txt", "changed\n");
+    WriteFile(kRoot + "/fresh.txt", "changed\n");
     fs::create_directories(kRoot + "/a/b/c");
-    Write(kRoot + "/a/b/c/deep.txt", "deep\n");
+    WriteFile(kRoot + "/a/b/c/deep.txt", "deep\n");
     ExpectSettled();
     fs::rename(kRoot + "/a/b", kRoot + "/b");
     fs::remove(kRoot + "/fresh.txt");
@@ -205,7 +203,7 @@ TEST_F(LiveTest, KilledDaemonsLoseNothing) {
     MakeDirectory(kRoot + "/four", 300);
     monitor_->Stop(SIGKILL);
     fs::rename(kRoot + "/two", kRoot + "/five");
-    Write(kRoot + "/unseen.txt", "written while nobody watched\n");
+    WriteFile(kRoot + "/unseen.txt", "written while nobody watched\n");
     fs::remove_all(kRoot + "/three");
     StartMonitor();
     ExpectSettled();
@@ -232,7 +230,7 @@ TEST_F(LiveTest, StormsAreFollowedWithDaemonsDyingInBetween) {
 TEST_F(LiveTest, PausesAndResumes) {
     for (const bool volume : {false, true}) {
         volume ? VolumePause(kVolume) : SharePause("photo");
-        Write(kRoot + "/while paused.txt", volume ? "volume\n" : "share\n");
+        WriteFile(kRoot + "/while paused.txt", volume ? "volume\n" : "share\n");
         fs::rename(kRoot + "/first.txt", kRoot + "/tmp");
         fs::rename(kRoot + "/tmp", kRoot + "/first.txt");
         volume ? VolumeResume(kVolume) : ShareResume("photo");
@@ -240,7 +238,7 @@ TEST_F(LiveTest, PausesAndResumes) {
     }
 
     StatusMgr().Pause(0);
-    Write(kRoot + "/later.txt", "later\n");
+    WriteFile(kRoot + "/later.txt", "later\n");
     EXPECT_TRUE(Eventually([] { return StatusText() == "paused"; }));
     EXPECT_FALSE(IsFound(kRoot + "/later.txt", "later\n"));
     indexer_->Stop(SIGTERM);
@@ -251,7 +249,7 @@ TEST_F(LiveTest, PausesAndResumes) {
 }
 
 TEST_F(LiveTest, FullVolumeIsSurvived) {
-    Write(kRoot + "/before.txt", "before\n");
+    WriteFile(kRoot + "/before.txt", "before\n");
     ExpectSettled();
     {
         std::ofstream ballast(kVolume + "/ballast");
@@ -261,9 +259,9 @@ TEST_F(LiveTest, FullVolumeIsSurvived) {
     }
     MakeDirectory(kRoot + "/more", 5);  // empty files: there is no room for content
     fs::rename(kRoot + "/before.txt", kRoot + "/after.txt");
-    Write(kRoot + "/no room.txt", "");
+    WriteFile(kRoot + "/no room.txt", "");
     fs::remove(kVolume + "/ballast");
-    Write(kRoot + "/room again.txt", "room\n");
+    WriteFile(kRoot + "/room again.txt", "room\n");
     ExpectSettled();
 }
 
@@ -276,7 +274,7 @@ TEST_F(LiveTest, SharesAreRenamedAndMoved) {
     SetShare(renamed);
     ShareRename("photo", "pictures");
     ExpectSettled("pictures", renamed);
-    Write(renamed + "/under the new name.txt", "new\n");
+    WriteFile(renamed + "/under the new name.txt", "new\n");
     ExpectSettled("pictures", renamed);
 
     MountVolume("/volume2", "size=400m");
@@ -290,7 +288,7 @@ TEST_F(LiveTest, SharesAreRenamedAndMoved) {
     SetShare(moved);
     ShareMigrate("pictures", renamed);
     ExpectSettled("pictures", moved);
-    Write(moved + "/at the new place.txt", "moved\n");
+    WriteFile(moved + "/at the new place.txt", "moved\n");
     ExpectSettled("pictures", moved);
 }
 
