@@ -14,15 +14,21 @@ constexpr const char* kMountTable = "/proc/self/mountinfo";
 
 using Table = std::unique_ptr<libmnt_table, void (*)(libmnt_table*)>;
 
+using Iterator = std::unique_ptr<libmnt_iter, void (*)(libmnt_iter*)>;
+
 Table ReadTable() {
     return {mnt_new_table_from_file(kMountTable), mnt_unref_table};
+}
+
+/// Backward, because the last mount at a place hides those before it.
+Iterator Backward() {
+    return {mnt_new_iter(MNT_ITER_BACKWARD), mnt_free_iter};
 }
 
 /// The mount that holds the path, from the table; null when it is not found.
 libmnt_fs* FindMount(const Table& table, const struct statx& status) {
     libmnt_fs* found = nullptr;
-    const std::unique_ptr<libmnt_iter, void (*)(libmnt_iter*)> iterator(
-        mnt_new_iter(MNT_ITER_BACKWARD), mnt_free_iter);
+    const Iterator iterator = Backward();
     const auto id = static_cast<int>(status.stx_mnt_id);
     while (mnt_table_next_fs(table.get(), iterator.get(), &found) == 0) {
         if (mnt_fs_get_id(found) == id) {
@@ -33,6 +39,26 @@ libmnt_fs* FindMount(const Table& table, const struct statx& status) {
 }
 
 }  // namespace
+
+std::optional<std::set<std::string>> ReadMountPoints() {
+    const Table table = ReadTable();
+    if (table == nullptr) {
+        return std::nullopt;
+    }
+    std::set<std::string> points;
+    const Iterator iterator = Backward();
+    libmnt_fs* mount = nullptr;
+    while (mnt_table_next_fs(table.get(), iterator.get(), &mount) == 0) {
+        if (const char* point = mnt_fs_get_target(mount)) {
+            points.insert(point);
+        }
+    }
+    return points;
+}
+
+quivra::base::UniqueFd WatchMounts() {
+    return quivra::base::UniqueFd(open(kMountTable, O_RDONLY | O_CLOEXEC));
+}
 
 int IsMountRoot(const char* path) {
     struct statx status {};

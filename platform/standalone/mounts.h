@@ -1,8 +1,23 @@
 #pragma once
 
+#include <optional>
+#include <set>
 #include <string>
 
+#include "base/unique_fd.h"
+
+/// The mount table as this process sees it, read with libmount: the library kesto_mounts, for the
+/// platform and for the programs that belong to it.
 namespace kesto {
+
+/// Every path that something is mounted at, bind mounts included, as the kernel writes it. Nothing,
+/// with errno set, when the table cannot be read.
+std::optional<std::set<std::string>> ReadMountPoints();
+
+/// A descriptor that polls as exceptional (POLLPRI, EPOLLPRI) once for any number of changes of the
+/// table since it was opened or last polled. It need not be read. Not valid, with errno set, on
+/// failure.
+quivra::base::UniqueFd WatchMounts();
 
 /// 1 when the path is the root of a mount (bind mounts count, links do not), 0 when not, -1 with
 /// errno set on failure. Mounts nothing on demand.

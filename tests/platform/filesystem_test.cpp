@@ -2,6 +2,7 @@
 #include <kesto/error.h>
 #include <kesto/filesystem.h>
 #include <linux/magic.h>
+#include <poll.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -58,6 +59,22 @@ TEST_F(FilesystemTest, MountRootsAreTold) {
         EXPECT_EQ(KESTOFSDirIsMntPoint(path), expected) << path;
         EXPECT_EQ(kesto::IsMountRootByTable(path), expected) << path;
     }
+}
+
+TEST_F(FilesystemTest, MountsAreWatched) {
+    const char* odd = "/volume1/a b\\\n\t";
+    fs::create_directories(odd);
+    const quivra::base::UniqueFd watch = kesto::WatchMounts();
+    pollfd entry{watch.Get(), POLLPRI, 0};
+    EXPECT_EQ(poll(&entry, 1, 0), 0);
+    {
+        const Mount tmpfs("tmpfs", odd, "tmpfs");
+        EXPECT_EQ(poll(&entry, 1, 0), 1);
+        EXPECT_EQ(poll(&entry, 1, 0), 0);
+        EXPECT_TRUE(kesto::ReadMountPoints().value().contains(odd));
+    }
+    EXPECT_EQ(poll(&entry, 1, 0), 1);
+    EXPECT_FALSE(kesto::ReadMountPoints().value().contains(odd));
 }
 
 TEST_F(FilesystemTest, TypesAreClassed) {
