@@ -17,18 +17,6 @@ namespace {
 
 constexpr std::size_t kReadChunk = 64U << 10;
 
-/// Keeps the errno that tells why over the calls that clean up.
-class KeepErrno {
-  public:
-    KeepErrno() = default;
-    ~KeepErrno() { errno = saved_; }
-    KeepErrno(const KeepErrno&) = delete;
-    KeepErrno& operator=(const KeepErrno&) = delete;
-
-  private:
-    const int saved_ = errno;
-};
-
 /// What openat2 does in one call, for kernels before 5.6 and sandboxes that do not know it.
 UniqueFd WalkTo(int parent, const std::string& path, int flags) {
     // O_PATH: to pass through a directory takes no right to list it.

@@ -2,6 +2,7 @@
 
 #include <sys/types.h>
 
+#include <cerrno>
 #include <cstddef>
 #include <string>
 #include <string_view>
@@ -13,6 +14,20 @@
 /// symbolic link. Failures leave their cause in errno; nothing is logged or thrown. All
 /// descriptors are close-on-exec. Any thread may call.
 namespace quivra::base {
+
+/// Gives errno its old value back at the end of a scope: over calls that clean up behind the one
+/// that failed, and over a try that did not matter, whose errno would turn up in the caller's next
+/// log line.
+class KeepErrno {
+  public:
+    KeepErrno() = default;
+    ~KeepErrno() { errno = saved_; }
+    KeepErrno(const KeepErrno&) = delete;
+    KeepErrno& operator=(const KeepErrno&) = delete;
+
+  private:
+    const int saved_ = errno;
+};
 
 /// Writes all of it, however many calls that takes. False when one fails; a part may be written
 /// then.

@@ -150,7 +150,7 @@ bool ParseFile(const std::string& full_path, const Json::Value& cfg, Json::Value
     if (!object.IsValid() || !Examine(object, status)) {
         return false;
     }
-    const kesto::KeepErrno keep_errno;
+    const quivra::base::KeepErrno keep_errno;
     file_data = Json::Value(Json::objectValue);
     AddNames(full_path, file_data);
     AddAttributes(status, file_data);

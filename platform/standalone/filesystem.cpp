@@ -5,6 +5,7 @@
 #include <sys/vfs.h>
 #include <unistd.h>
 
+#include "base/file.h"
 #include "platform/standalone/error_state.h"
 #include "platform/standalone/fs_types.h"
 #include "platform/standalone/mounts.h"
@@ -38,7 +39,7 @@ int KESTOACLPermGet(const char* path) {
     if (faccessat(AT_FDCWD, path, F_OK, AT_EACCESS) != 0) {
         return kesto::SetError(KESTO_ERR_SYSTEM);
     }
-    const kesto::KeepErrno keep_errno;
+    const quivra::base::KeepErrno keep_errno;
     // The kernel weighs POSIX ACLs, capabilities and read-only mounts in.
     int mask = 0;
     mask |= faccessat(AT_FDCWD, path, R_OK, AT_EACCESS) == 0 ? KESTO_ACL_PERM_READ : 0;

@@ -8,7 +8,7 @@
 #include <cstdint>
 #include <cstdio>
 
-#include "platform/standalone/file_io.h"
+#include "base/file.h"
 
 namespace {
 
@@ -28,11 +28,13 @@ std::string FilePath(const std::string& queue_path, const std::string& app) {
     const std::string name = app + ":" + queue_path;
     std::string stem;
     for (const char c : name) {
-        if (c != '/' && c != '%' && c != '\n' && c != '\0') {
+        const auto byte = static_cast<unsigned char>(c);
+        // Control characters would reach the terminal of whoever lists the directory.
+        if (c != '/' && c != '%' && byte >= 0x20 && byte != 0x7f) {
             stem += c;
         } else {
             std::array<char, 4> code{};
-            std::snprintf(code.data(), code.size(), "%%%02X", static_cast<unsigned char>(c));
+            std::snprintf(code.data(), code.size(), "%%%02X", byte);
             stem += code.data();
         }
     }
@@ -45,11 +47,17 @@ std::string FilePath(const std::string& queue_path, const std::string& app) {
     return std::string(KESTO_MONITOR_DIRECTORY) + "/" + stem + ".json";
 }
 
-bool MakeDirectory(const char* path, mode_t mode) {
+bool MakeDirectories() {
     const int saved_errno = errno;
-    const bool is_there = mkdir(path, mode) == 0 || errno == EEXIST;
-    errno = is_there ? saved_errno : errno;
-    return is_there;
+    if ((mkdir("/var/lib/kesto", 0755) != 0 && errno != EEXIST) ||
+        (mkdir(KESTO_MONITOR_DIRECTORY, 0700) != 0 && errno != EEXIST)) {
+        return false;
+    }
+    // The names in it are those of private folders. An installer may have made it with another
+    // mode; where that cannot be changed, its owner has decided so.
+    [[maybe_unused]] const int result = chmod(KESTO_MONITOR_DIRECTORY, 0700);
+    errno = saved_errno;
+    return true;
 }
 
 }  // namespace
@@ -79,9 +87,10 @@ bool MonitorQueue::Upsert(const MonitorQueue& queue, const std::string& app,
     Json::StreamWriterBuilder builder;
     builder["indentation"] = "";
     builder["emitUTF8"] = true;  // keeps the bytes of paths that are not valid UTF-8
-    return MakeDirectory("/var/lib/kesto", 0755) && MakeDirectory(KESTO_MONITOR_DIRECTORY, 0700) &&
-           kesto::ReplaceFile(FilePath(description["queue"].asString(), app),
-                              Json::writeString(builder, registration) + "\n", 0600);
+    return MakeDirectories() &&
+           quivra::base::ReplaceFile(FilePath(description["queue"].asString(), app),
+                                     Json::writeString(builder, registration) + "\n",
+                                     0600) == quivra::base::Replaced::kYes;
 }
 
 bool MonitorQueue::Delete(const std::string& queue_path, const std::string& app,

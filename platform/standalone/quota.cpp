@@ -1,4 +1,5 @@
 #include "platform/standalone/quota.h"
+#include "base/file.h"
 
 #include <fcntl.h>
 #include <kesto/error.h>
@@ -25,7 +26,7 @@ namespace {
 /// Whether the effective user's quota on the file system leaves that much. It does where no quota
 /// is set or none can be asked for (a kernel before 5.14 included).
 bool IsWithinQuota(int fd, unsigned long long bytes) {
-    const KeepErrno keep_errno;
+    const quivra::base::KeepErrno keep_errno;
     dqblk quota{};
     return syscall(SYS_quotactl_fd, fd, QCMD(Q_GETQUOTA, USRQUOTA), geteuid(), &quota) != 0 ||
            LeavesRoom(quota, bytes);

@@ -1,4 +1,5 @@
 #include "platform/standalone/run_program.h"
+#include "base/file.h"
 
 #include <fcntl.h>
 #include <kesto/error.h>
@@ -14,7 +15,6 @@
 
 #include "base/unique_fd.h"
 #include "platform/standalone/error_state.h"
-#include "platform/standalone/file_io.h"
 
 namespace kesto {
 namespace {
@@ -110,11 +110,11 @@ pid_t StartSupervisor(const char* program, char* const* argv, int output,
 
 /// Takes in all of the output, so that the program never waits for a reader, and keeps its start.
 void Collect(int fd, std::string& output) {
-    ReadUpTo(fd, kMaxOutput, output);
+    quivra::base::ReadUpTo(fd, kMaxOutput, output);
     std::string rest;
     do {
         rest.clear();
-    } while (ReadUpTo(fd, kMaxOutput, rest) && !rest.empty());
+    } while (quivra::base::ReadUpTo(fd, kMaxOutput, rest) && !rest.empty());
 }
 
 }  // namespace

@@ -8,8 +8,8 @@
 #include <string>
 #include <string_view>
 
+#include "base/path.h"
 #include "platform/standalone/error_state.h"
-#include "platform/standalone/paths.h"
 #include "platform/standalone/shares_conf.h"
 
 namespace kesto {
@@ -38,7 +38,7 @@ int IsInShareDirectory(const char* path, const char* name) {
         return -1;
     }
     const ShareConf* share = FindShareOfPath(*shares, path);
-    return share != nullptr && IsAtOrBelow(path, share->path + "/" + name);
+    return share != nullptr && quivra::base::IsAtOrBelow(path, share->path + "/" + name);
 }
 
 int ReadFlag(const KESTOShare* share, int KESTOShare::*field, int* flag) {

@@ -1,4 +1,6 @@
 #include "platform/standalone/shares_conf.h"
+#include "base/file.h"
+#include "base/path.h"
 
 #include <fcntl.h>
 #include <kesto/error.h>
@@ -18,8 +20,6 @@
 
 #include "base/unique_fd.h"
 #include "platform/standalone/error_state.h"
-#include "platform/standalone/file_io.h"
-#include "platform/standalone/paths.h"
 
 namespace kesto {
 namespace {
@@ -178,7 +178,7 @@ class Parser {
         if (!IsCanonical(share.path)) {
             return "the path is not absolute, or has empty, \".\" or \"..\" parts";
         }
-        if (share.name != LastComponent(share.path)) {
+        if (share.name != quivra::base::Name(share.path)) {
             return "the section's name is not the last component of its path";
         }
         if (share.name.size() >= sizeof(KESTOShare::szName) ||
@@ -243,7 +243,7 @@ std::shared_ptr<const ShareList> ReadShares(Cache& cache) {
         return nullptr;
     }
     std::string text;
-    if (!S_ISREG(status.st_mode) || !ReadUpTo(fd.Get(), kMaxFileSize + 1, text) ||
+    if (!S_ISREG(status.st_mode) || !quivra::base::ReadUpTo(fd.Get(), kMaxFileSize + 1, text) ||
         text.size() > kMaxFileSize) {
         errno = errno == 0 ? EFBIG : errno;
         return nullptr;
@@ -291,9 +291,12 @@ const ShareConf* FindShare(const ShareList& shares, std::string_view name) {
 }
 
 const ShareConf* FindShareOfPath(const ShareList& shares, std::string_view full_path) {
+    while (full_path.size() > 1 && full_path.ends_with('/')) {
+        full_path.remove_suffix(1);
+    }
     const ShareConf* found = nullptr;
     for (const ShareConf& share : shares) {
-        if (IsAtOrBelow(full_path, share.path) &&
+        if (quivra::base::IsAtOrBelow(full_path, share.path) &&
             (found == nullptr || share.path.size() > found->path.size())) {
             found = &share;
         }

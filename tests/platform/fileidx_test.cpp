@@ -30,7 +30,7 @@ TEST_F(FileidxTest, MakesThePrivateDirectoryWhateverTheUmask) {
     EXPECT_STREQ(path_, "/volume1/photo/@eaDir/fileindex/queue");
     EXPECT_EQ(ModeOf(kEaDir), 0755U);
     EXPECT_EQ(ModeOf(kDirectory), 0700U);
-    chmod(kDirectory, 0777);
+    chmod(kDirectory, 0755);
     errno = 0;
     EXPECT_EQ(FILEIDXDBPathCompose(kRoot, path_, sizeof(path_)), 0);
     EXPECT_STREQ(path_, "/volume1/photo/@eaDir/fileindex/db");
@@ -44,6 +44,10 @@ TEST_F(FileidxTest, RefusesWhatSomebodyPlanted) {
         [](const char* place) { fs::create_directory_symlink("/volume1/target", place); },
         [](const char* place) { fs::create_symlink("/nowhere", place); },
         [](const char* place) { WriteFile(place, ""); },
+        [](const char* place) {
+            fs::create_directory(place);
+            chmod(place, 0777);
+        },
         [](const char* place) {
             fs::create_directory(place);
             EXPECT_EQ(chown(place, 1026, 100), 0);
@@ -60,8 +64,16 @@ TEST_F(FileidxTest, RefusesWhatSomebodyPlanted) {
             plant(place);
             EXPECT_EQ(Compose(), -1) << place << &plant - plants;
             EXPECT_EQ(KLIBCErrGet(), KESTO_ERR_UNSAFE_PLACE);
-            EXPECT_EQ(fake::LogLinesWith("Remove it to have the share indexed").size(), 1U);
+            EXPECT_EQ(Compose(), -1);
+            const auto lines = fake::LogLinesWith(place);
+            ASSERT_EQ(lines.size(), 1U);  // once for both questions
+            EXPECT_EQ(FILEIDXProblem(kRoot, path_, sizeof(path_)), 1);
+            EXPECT_EQ(lines[0], std::string("The share is not indexed: ") + path_);
             EXPECT_TRUE(fs::is_empty("/volume1/target"));
+            fs::remove_all(kEaDir);
+            EXPECT_EQ(FILEIDXProblem(kRoot, path_, sizeof(path_)), 0);
+            EXPECT_STREQ(path_, "");
+            EXPECT_EQ(Compose(), 0);  // it heals by itself
             fs::remove_all(kEaDir);
         }
     }
