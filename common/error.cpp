@@ -1,15 +1,17 @@
 #include "common/error.h"
 
+#include <sstream>
+
 namespace quivra {
 namespace {
 
 std::string ComposeMessage(int code, const std::string& reason) {
-    // Not by a stream: the host program's locale may group digits.
-    std::string message = "Quivra error, code=" + std::to_string(code);
+    std::ostringstream message;
+    message << "Quivra error, code=" << code;
     if (!reason.empty()) {
-        message += ", reason=[" + reason + "]";
+        message << ", reason=[" << reason << "]";
     }
-    return message;
+    return message.str();
 }
 
 }  // namespace

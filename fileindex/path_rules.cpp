@@ -158,7 +158,7 @@ PathFinding Examine(const Rule& rule, const std::string& full_path) {
     try {
         return rule.examine(full_path);
     } catch (const Error& error) {
-        return Failed("it cannot be told: " + std::string(error.what()));
+        return Failed("it cannot be told: " + error.reason);
     }
 }
 

@@ -2,7 +2,6 @@
 #include "common/json.h"
 #include "common/log.h"
 #include "fileindex/elastic/elastic_control.h"
-#include "fileindex/elastic/request.h"
 
 namespace quivra::fileindex::elastic {
 namespace {
@@ -76,7 +75,8 @@ constexpr const char* kMappings = R"({
 Json::Value GetFileIndexMappings() {
     Json::Value ret;
     if (!fromString(ret, kMappings)) {
-        Fail(unit::kMappings.Here(), "!ret.fromString(mappings)", Error(Error::kSystemCallFailed));
+        Fail({"elastic_control", __LINE__}, "!ret.fromString(mappings)",
+             Error(Error::kSystemCallFailed));
     }
     return ret;
 }

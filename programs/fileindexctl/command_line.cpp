@@ -94,6 +94,7 @@ CommandLine::CommandLine()
     AddSearchCommand(*this);
     AddStatusCommand(*this);
     AddWhyCommand(*this);
+    AddFailedCommand(*this);
     AddServiceCommands(*this);
     AddShareCommands(*this);
     AddVolumeCommands(*this);

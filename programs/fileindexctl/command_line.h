@@ -70,5 +70,6 @@ void AddVolumeCommands(CommandLine& line);
 void AddServiceCommands(CommandLine& line);
 void AddStatusCommand(CommandLine& line);
 void AddWhyCommand(CommandLine& line);
+void AddFailedCommand(CommandLine& line);
 
 }  // namespace quivra::ctl

@@ -1,10 +1,15 @@
 #include "programs/fileindexctl/daemons.h"
 
+#include <fcntl.h>
+#include <unistd.h>
+
 #include <cerrno>
 
+#include "base/file.h"
 #include "base/frame.h"
 #include "common/json.h"
 #include "fileindex/communication.h"
+#include "fileindex/elastic/protocol.h"
 
 namespace quivra::ctl {
 
@@ -12,8 +17,8 @@ using Reach = DaemonState::Reach;
 
 const Daemon kIndexer = {"fileindexd", fileindex::kFileIndexDaemonSocketPath,
                          "pkg-Quivra-fileindexd", "type", "changes wait in the queues"};
-const Daemon kSearchDaemon = {"kestoelasticd", "/var/run/kestoelasticd.sock", "kestoelasticd",
-                              "command", "nothing can be found or indexed"};
+const Daemon kSearchDaemon = {"kestoelasticd", fileindex::elastic::kSearchDaemonSocketPath,
+                              "kestoelasticd", "command", "nothing can be found or indexed"};
 const Daemon kMonitor = {"kestotifyd", "/var/run/kestotifyd.sock", "kestotifyd", "type",
                          "changes of files are not noticed"};
 
@@ -35,6 +40,14 @@ Reach ReachAfterFailure() {
     }
 }
 
+/// A monitor of a version that has no socket yet.
+bool IsOldMonitorUp() {
+    constexpr const char* kLock = "/var/lib/kesto/monitor-state/lock";
+    base::UniqueFd fd;
+    return access(kLock, F_OK) == 0 &&
+           base::TryLock(AT_FDCWD, kLock, true, 0600, fd) == base::LockAttempt::kBusy;
+}
+
 }  // namespace
 
 DaemonState AskDaemon(const Daemon& daemon, const std::string& request, const Json::Value& data) {
@@ -53,8 +66,7 @@ DaemonState AskDaemon(const Daemon& daemon, const std::string& request, const Js
         return state;
     }
     Json::Value parsed;
-    if (!fromString(parsed, reply) || !parsed.isObject() || parsed["success"] != true ||
-        !(parsed["data"].isObject() || parsed["data"].isArray())) {
+    if (!fromString(parsed, reply) || !parsed.isObject() || parsed["success"] != true) {
         state.reach = Reach::kRefused;
         return state;
     }
@@ -64,7 +76,14 @@ DaemonState AskDaemon(const Daemon& daemon, const std::string& request, const Js
 }
 
 DaemonState AskState(const Daemon& daemon) {
-    return AskDaemon(daemon, "state");
+    DaemonState state = AskDaemon(daemon, "state");
+    if (state.reach == Reach::kNotRunning && daemon.name == kMonitor.name && IsOldMonitorUp()) {
+        state.reach = Reach::kRefused;
+    }
+    if (state.reach == Reach::kReplied && !state.data.isObject()) {
+        state = {Reach::kRefused, Json::Value(Json::objectValue)};
+    }
+    return state;
 }
 
 std::string DescribeProblem(const Daemon& daemon, const DaemonState& state) {
@@ -79,9 +98,11 @@ std::string DescribeProblem(const Daemon& daemon, const DaemonState& state) {
                    " restart' helps.";
         case Reach::kDenied:
             return name + " serves root only: permission denied, run this as root.";
-        default:
-            return std::string();
+        case Reach::kRefused:
+        case Reach::kReplied:
+            break;
     }
+    return std::string();
 }
 
 }  // namespace quivra::ctl

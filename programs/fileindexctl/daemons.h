@@ -45,11 +45,11 @@ struct DaemonState {
 DaemonState AskDaemon(const Daemon& daemon, const std::string& request,
                       const Json::Value& data = Json::Value(Json::objectValue));
 
-/// Its "state".
+/// Its "state": an object, which is empty unless the daemon told it.
 DaemonState AskState(const Daemon& daemon);
 
-/// What is wrong with the daemon and what to do, as one sentence with its full stop; empty while it
-/// takes requests.
+/// What is wrong with the daemon and what to do, as one sentence with its full stop; empty when it
+/// replied.
 std::string DescribeProblem(const Daemon& daemon, const DaemonState& state);
 
 }  // namespace quivra::ctl

@@ -3,7 +3,12 @@
 #include <algorithm>
 #include <array>
 
+#include "fileindex/elastic/protocol.h"
+
 namespace quivra::ctl {
+
+namespace elastic = fileindex::elastic;
+
 namespace {
 
 /// Where the reason of an error tells more than the table can.
@@ -14,17 +19,6 @@ struct ErrorText {
     const char* cause;
     const char* remedy;
     Reason reason;
-};
-
-/// Codes of the search daemon that a user can do something about; docs/search-daemon.md has all.
-enum SearchDaemonCode : int {
-    kNoSuchIndex = 1404,
-    kIndexExists = 1405,
-    kIndexPaused = 1407,
-    kBadQuery = 1410,
-    kNoSpace = 1412,
-    kIndexUnavailable = 1413,
-    kReplyTooLarge = 1416,
 };
 
 /// Every code that the library throws of itself, then the search daemon's.
@@ -68,18 +62,21 @@ constexpr std::array kErrorTexts = {
               "try again in a few minutes", Reason::kTell},
     ErrorText{Error::kPathLookupFailed, "the path is not canonical",
               "give it absolute, without '.', '..', doubled or trailing '/'", Reason::kTell},
-    ErrorText{kNoSuchIndex, "it has no index",
+    ErrorText{elastic::kNoSuchIndex, "it has no index",
               "choose a folder of it with 'fileindexctl folder add'", Reason::kLeaveOut},
-    ErrorText{kIndexExists, "its index belongs to another share",
+    ErrorText{elastic::kIndexExists, "its index belongs to another share",
               "'fileindexctl share clear' forgets one that is gone", Reason::kTell},
-    ErrorText{kIndexPaused, "its index is paused", "'fileindexctl share resume' goes on with it",
-              Reason::kLeaveOut},
-    ErrorText{kBadQuery, "kestoelasticd cannot follow the query",
+    ErrorText{elastic::kPaused, "its index is paused",
+              "'fileindexctl share resume' goes on with it", Reason::kLeaveOut},
+    ErrorText{elastic::kBadQuery, "kestoelasticd cannot follow the query",
               "see 'fileindexctl search --help'", Reason::kTell},
-    ErrorText{kNoSpace, "the volume of the index is full", "free space there", Reason::kTell},
-    ErrorText{kIndexUnavailable, "the files of its index are missing or unreadable",
+    ErrorText{elastic::kNoSpace, "the volume of the index is full", "free space there",
+              Reason::kTell},
+    ErrorText{elastic::kIndexUnavailable, "the files of its index are missing or unreadable",
               "check that its volume is mounted", Reason::kTell},
-    ErrorText{kReplyTooLarge, "there are too many hits for one reply", "use --limit",
+    ErrorText{elastic::kIndexMadeAnew, "its index was damaged or missing and is made anew",
+              "'fileindexctl status' shows how far it is", Reason::kLeaveOut},
+    ErrorText{elastic::kReplyTooLarge, "there are too many hits for one reply", "use --limit",
               Reason::kLeaveOut},
 };
 

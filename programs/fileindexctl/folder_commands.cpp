@@ -101,7 +101,7 @@ int Add(const Options& options, Session& session) {
     const bool existed = fileindex::FolderMgr().HasFolder(path);
     try {
         const Silence silence;
-        WaitFor(session, Needs::kIndexerAndSearch,
+        WaitFor(session, Needs::kBothDaemons,
                 [list = ListOf(folder)] { fileindex::FolderAdd(list, false); });
     } catch (const std::exception&) {
         if (!existed && fileindex::FolderMgr().HasFolder(path)) {
@@ -123,7 +123,7 @@ int Set(const Options& options, Session& session) {
     RequirePlaceOfIndex(share);
     {
         const Silence silence;
-        WaitFor(session, Needs::kIndexerAndSearch, [share, list = ListOf(folder)] {
+        WaitFor(session, Needs::kBothDaemons, [share, list = ListOf(folder)] {
             // There already, unless adding the folder was cut off; making it again changes nothing.
             fileindex::elastic::ShareIndexCreate(share);
             fileindex::FolderSet(list, false);
@@ -208,7 +208,7 @@ int Delete(const Options& options, Session& session) {
     fileindex::FolderGet(folder, path);
     try {
         const Silence silence;
-        WaitFor(session, Needs::kIndexerAndSearch,
+        WaitFor(session, Needs::kBothDaemons,
                 [list = ListOf(path)] { fileindex::FolderDelete(list); });
     } catch (const std::exception&) {
         if (!fileindex::FolderMgr().HasFolder(path)) {

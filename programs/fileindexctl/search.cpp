@@ -6,10 +6,13 @@
 #include "common/error.h"
 #include "common/json.h"
 #include "fileindex/elastic/elastic_control.h"
+#include "fileindex/elastic/protocol.h"
 #include "programs/fileindexctl/error_text.h"
 
 namespace quivra::ctl {
 namespace {
+
+namespace field = fileindex::elastic::field;
 
 /// Whether `a` comes before `b`. Hits without the field come last, whatever the direction.
 bool ComesBefore(const Json::Value& a, const Json::Value& b, const SortOrder& order) {
@@ -93,9 +96,9 @@ Rest SearchShare(const std::string& share, const Json::Value& query, SearchResul
 
 std::uint64_t CountDocuments(const std::string& share, const std::string& full_path) {
     Json::Value own(Json::objectValue);
-    own["term"]["KESTOMDPath"] = full_path;
+    own["term"][field::kPath] = full_path;
     Json::Value below(Json::objectValue);
-    below["prefix"]["KESTOMDPath"] = full_path + "/";
+    below["prefix"][field::kPath] = full_path + "/";
     Json::Value query(Json::objectValue);
     query["qsl"]["any"].append(own);
     query["qsl"]["any"].append(below);

@@ -5,6 +5,7 @@
 
 #include "common/json.h"
 #include "common/util.h"
+#include "fileindex/elastic/protocol.h"
 #include "programs/fileindexctl/command_line.h"
 #include "programs/fileindexctl/search.h"
 #include "programs/fileindexctl/search_query.h"
@@ -14,15 +15,16 @@
 namespace quivra::ctl {
 namespace {
 
+namespace field = fileindex::elastic::field;
+
 constexpr unsigned int kDefaultLimit = 20;
 /// Marks around the words found. File contents hardly ever hold these characters, and where they
 /// do, a wrong word is bold.
 constexpr char kMarkBegin = '\x02';
 constexpr char kMarkEnd = '\x03';
 /// Where a line worth showing may come from, the best first.
-constexpr std::array kHighlightFields = {"KESTOMDTextContent", "KESTOMDTitle",
-                                         "KESTOMDDescription", "KESTOMDComment",
-                                         "KESTOMDKeywords",    "KESTOMDAuthors"};
+constexpr std::array kHighlightFields = {field::kTextContent, field::kTitle,    field::kDescription,
+                                         field::kComment,     field::kKeywords, field::kAuthors};
 
 struct Options {
     std::string share;
@@ -45,7 +47,7 @@ SortOrder ParseSort(const std::string& sort) {
                         "' to sort by; see 'fileindexctl search --help'");
     }
     // The name's own field is made for finding parts; sorting goes by the whole name.
-    return {name == "name" ? "KESTOMDFSName" : field.name, descending};
+    return {name == "name" ? field::kFSName : field.name, descending};
 }
 
 /// People see paths and one line, so the daemon need not send more; programs get all fields.
@@ -59,8 +61,8 @@ Json::Value MakeRequest(const Json::Value& qsl, const Options& options, const So
         sort["order"] = order.descending ? "desc" : "asc";
     }
     if (!json) {
-        request["fields"].append("KESTOMDPath");
-        if (!order.field.empty() && order.field != "KESTOMDPath") {
+        request["fields"].append(field::kPath);
+        if (!order.field.empty() && order.field != field::kPath) {
             request["fields"].append(order.field);
         }
     }
@@ -99,7 +101,7 @@ std::string ShownHighlight(const std::string& text, const Session& session) {
 }
 
 void PrintHit(const Json::Value& hit, const Options& options, Session& session) {
-    const std::string path = hit["KESTOMDPath"].asString();
+    const std::string path = hit[field::kPath].asString();
     if (options.paths) {
         session.out << (options.null ? path : Shown(path)) << (options.null ? '\0' : '\n');
         return;

@@ -11,10 +11,13 @@
 
 #include "common/util.h"
 #include "fileindex/elastic/elastic_control.h"
+#include "fileindex/elastic/protocol.h"
 #include "programs/fileindexctl/session.h"
 
 namespace quivra::ctl {
 namespace {
+
+namespace field = fileindex::elastic::field;
 
 struct ShortName {
     const char* name;
@@ -24,24 +27,24 @@ struct ShortName {
 };
 
 constexpr std::array kShortNames = {
-    ShortName{"name", "KESTOMDSearchFileName", FieldKind::kText, "a part of the file name"},
-    ShortName{"text", "KESTOMDTextContent", FieldKind::kText, "the content"},
-    ShortName{"title", "KESTOMDTitle", FieldKind::kText, "the title"},
-    ShortName{"author", "KESTOMDAuthors", FieldKind::kText, "the authors or artists"},
+    ShortName{"name", field::kSearchFileName, FieldKind::kText, "a part of the file name"},
+    ShortName{"text", field::kTextContent, FieldKind::kText, "the content"},
+    ShortName{"title", field::kTitle, FieldKind::kText, "the title"},
+    ShortName{"author", field::kAuthors, FieldKind::kText, "the authors or artists"},
     ShortName{"album", "KESTOMDAlbum", FieldKind::kText, "the album"},
     ShortName{"genre", "KESTOMDMusicalGenre", FieldKind::kText, "the genre of music"},
     ShortName{"composer", "KESTOMDComposer", FieldKind::kText, "the composer"},
-    ShortName{"comment", "KESTOMDComment", FieldKind::kText, "the comment"},
-    ShortName{"keywords", "KESTOMDKeywords", FieldKind::kText, "the keywords"},
+    ShortName{"comment", field::kComment, FieldKind::kText, "the comment"},
+    ShortName{"keywords", field::kKeywords, FieldKind::kText, "the keywords"},
     ShortName{"camera", "KESTOMDAcquisitionModel", FieldKind::kText, "the model of the camera"},
-    ShortName{"ext", "KESTOMDExtension", FieldKind::kExact, "the extension, without the dot"},
-    ShortName{"dir", "KESTOMDParent", FieldKind::kExact, "the directory that holds the file"},
-    ShortName{"path", "KESTOMDPath", FieldKind::kExact, "the full path"},
-    ShortName{"size", "KESTOMDFSSize", FieldKind::kSize, "the size in bytes, or 10K, 10M, 10G"},
+    ShortName{"ext", field::kExtension, FieldKind::kExact, "the extension, without the dot"},
+    ShortName{"dir", field::kParent, FieldKind::kExact, "the directory that holds the file"},
+    ShortName{"path", field::kPath, FieldKind::kExact, "the full path"},
+    ShortName{"size", field::kFSSize, FieldKind::kSize, "the size in bytes, or 10K, 10M, 10G"},
     ShortName{"year", "KESTOMDRecordingYear", FieldKind::kNumber, "the year of the recording"},
     ShortName{"seconds", "KESTOMDDurationSecond", FieldKind::kNumber, "the duration"},
-    ShortName{"modified", "KESTOMDFSContentChangeDate", FieldKind::kDate, "as 2024-12-31"},
-    ShortName{"created", "KESTOMDFSCreationDate", FieldKind::kDate, "as 2024-12-31"},
+    ShortName{"modified", field::kFSContentChangeDate, FieldKind::kDate, "as 2024-12-31"},
+    ShortName{"created", field::kFSCreationDate, FieldKind::kDate, "as 2024-12-31"},
 };
 
 /// The kind of a field that has no short name, from the index's own mapping.
@@ -154,7 +157,7 @@ Json::Value RangeClause(const Field& field, const std::string& value) {
 Json::Value AnywhereClause(const std::string& text) {
     Json::Value clause(Json::objectValue);
     clause["any"].append(Clause("match", "_all", text));
-    clause["any"].append(Clause("match", "KESTOMDSearchFileName", text));
+    clause["any"].append(Clause("match", field::kSearchFileName, text));
     return clause;
 }
 
@@ -166,7 +169,7 @@ Json::Value FieldClause(const Field& field, const std::string& value) {
         case FieldKind::kExact:
             return Clause(
                 "term", field.name,
-                field.name == "KESTOMDExtension" ? GetFileExtension("." + value, true) : value);
+                field.name == field::kExtension ? GetFileExtension("." + value, true) : value);
         default:
             return RangeClause(field, value);
     }

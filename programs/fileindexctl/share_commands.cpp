@@ -58,7 +58,7 @@ int RunOperation(const Operation& operation, const Arguments& arguments, Session
     session.doing = std::string(operation.doing) + " " + arguments.first;
     {
         const Silence silence;
-        WaitFor(session, Needs::kIndexerAndSearch, [operation, arguments] {
+        WaitFor(session, Needs::kBothDaemons, [operation, arguments] {
             std::optional<LockFile> lock;
             if (operation.under_lock) {
                 lock.emplace(fileindex::kFileIndexFoldersLockPath, true);

@@ -1,12 +1,14 @@
 #include "programs/fileindexctl/shares.h"
 
 #include <algorithm>
+#include <array>
+#include <climits>
 #include <memory>
 #include <set>
 
+#include <kesto/fileidx.h>
 #include <kesto/share.h>
 
-#include "base/private_directory.h"
 #include "common/error.h"
 #include "common/util.h"
 #include "fileindex/folder_mgr.h"
@@ -14,12 +16,6 @@
 #include "sdk/share.h"
 
 namespace quivra::ctl {
-namespace {
-
-/// Where the queue and the index of a share lie, below its root.
-constexpr const char* kPlaceOfIndex = "/@eaDir/fileindex";
-
-}  // namespace
 
 std::vector<std::string> AllShares() {
     KLIBCSzList* list = KLIBCSzListAlloc(1024);
@@ -45,7 +41,10 @@ std::string RootOf(const std::string& share) {
 
 std::string ProblemOfPlace(const std::string& share) {
     const std::string root = RootOf(share);
-    return root.empty() ? "" : base::PrivateDirectory::Open(root + kPlaceOfIndex).Problem();
+    std::array<char, 2 * PATH_MAX> problem{};
+    const bool is_told = !root.empty() && FILEIDXProblem(root.c_str(), problem.data(),
+                                                         static_cast<int>(problem.size())) == 1;
+    return is_told ? problem.data() : "";
 }
 
 void RequirePlaceOfIndex(const std::string& share) {

@@ -10,14 +10,14 @@
 #include "fileindex/status_mgr.h"
 #include "programs/fileindexctl/command_line.h"
 #include "programs/fileindexctl/folder_status.h"
-#include "programs/fileindexctl/share_status.h"
+#include "programs/fileindexctl/status.h"
 #include "programs/fileindexctl/table.h"
 #include "programs/fileindexctl/text.h"
 
 namespace quivra::ctl {
 namespace {
 
-constexpr std::chrono::seconds kInterval(1);
+constexpr std::chrono::milliseconds kInterval(500);
 constexpr unsigned int kBarWidth = 24;
 
 struct Options {
@@ -25,41 +25,50 @@ struct Options {
     bool until_finished = false;
 };
 
-std::string Number(std::uint64_t value, const char* one, const char* many) {
-    return std::to_string(value) + " " + (value == 1 ? one : many);
-}
-
 /// The bar is for eyes; a program finds the two numbers.
-std::string Progress(const WorkerStatus& worker, const Session& session) {
-    const std::string counts = std::to_string(worker.done) + " of " + std::to_string(worker.total);
-    if (!session.out_is_terminal || worker.total == 0) {
+std::string Progress(const ShareLine& share, const Session& session) {
+    const std::string counts = std::to_string(share.done) + " of " + std::to_string(share.total);
+    if (!session.out_is_terminal || share.total == 0) {
         return counts;
     }
-    const double share = static_cast<double>(worker.done) / static_cast<double>(worker.total);
-    return ProgressBar(share, kBarWidth) + " " + counts;
+    const double part = static_cast<double>(share.done) / static_cast<double>(share.total);
+    return ProgressBar(part, kBarWidth) + " " + counts;
+}
+
+/// "120 files of 3.2 MB waiting for content, about 2 minutes left"; empty when none wait.
+std::string Backlog(const ShareLine& share) {
+    if (share.waiting == 0) {
+        return "";
+    }
+    std::string text = Number(share.waiting, "file", "files");
+    text += share.waiting_bytes == 0 ? "" : " of " + Bytes(share.waiting_bytes);
+    text += " waiting";
+    text += share.phase.empty() ? "" : " (" + Shown(share.phase) + ")";
+    return share.eta < 0 ? text : text + ", about " + Duration(share.eta) + " left";
 }
 
 void PrintShare(const ShareLine& share, Session& session) {
-    const std::uint64_t pending = share.queue_lines + share.working_lines;
     session.out << "  " << Shown(share.name) << ": "
                 << (share.documents < 0 ? "documents unknown"
                                         : Number(static_cast<std::uint64_t>(share.documents),
                                                  "document", "documents"))
-                << ", " << Number(pending, "change", "changes") << " waiting";
-    if (share.worker.running) {
-        session.out << ", " << Shown(share.worker.state);
-    } else {
-        session.out << ", no worker";
+                << ", " << Number(share.queue_lines + share.working_lines, "change", "changes")
+                << " waiting, " << (share.has_worker ? Shown(share.state) : "no worker") << "\n";
+    if (share.has_worker && share.state == "processing") {
+        session.out << "    " << Progress(share, session) << "  " << Shown(share.current) << "\n";
     }
-    session.out << "\n";
-    if (share.worker.running && share.worker.state == "processing") {
-        session.out << "    " << Progress(share.worker, session) << "  "
-                    << Shown(share.worker.current) << "\n";
+    if (share.waiting > 0) {
+        session.out << "    " << Backlog(share) << "\n";
     }
-    for (const std::string& error : {share.worker.last_error, share.error}) {
-        if (!error.empty()) {
-            session.out << "    last error: " << Shown(error) << "\n";
-        }
+    if (share.failed > 0) {
+        session.out << "    " << Number(share.failed, "file", "files")
+                    << " without content, see 'fileindexctl failed " << Shown(share.name) << "'\n";
+    }
+    for (const std::string& problem : share.problems) {
+        session.out << "    problem: " << Shown(problem) << "\n";
+    }
+    if (!share.last_error.empty()) {
+        session.out << "    last error: " << Shown(share.last_error) << "\n";
     }
 }
 
@@ -74,11 +83,8 @@ void PrintFolders(const Status& status, Session& session) {
 
 /// What stops the whole system comes first.
 void PrintDaemons(const Status& status, Session& session) {
-    if (!status.elastic_answers) {
-        session.out << "kestoelasticd does not answer: nothing can be found until it runs.\n";
-    }
-    if (!status.indexer_answers) {
-        session.out << "fileindexd does not answer: changes wait in the queues until it runs.\n";
+    for (const std::string& problem : status.problems) {
+        session.out << Shown(problem) << "\n";
     }
     if (status.resume_time == fileindex::kPausedWithoutEnd) {
         session.out << "All indexing is paused until 'fileindexctl resume'.\n";
@@ -92,11 +98,11 @@ void PrintDaemons(const Status& status, Session& session) {
 }
 
 void PrintStatus(const Status& status, Session& session) {
-    PrintDaemons(status, session);
     if (status.folders.empty()) {
         session.out << "Nothing is indexed; choose a folder with 'fileindexctl folder add PATH'.\n";
         return;
     }
+    PrintDaemons(status, session);
     PrintFolders(status, session);
     session.out << "Shares:\n";
     for (const ShareLine& share : status.shares) {
@@ -164,20 +170,58 @@ class Screen {
     unsigned int lines_ = 0;
 };
 
+/// Ends a wait that cannot come to its end. A daemon that is being started gets some time; one
+/// that was there and has gone is noticed within two seconds.
+class Patience {
+  public:
+    /// To be asked at each look, kInterval apart.
+    bool IsOver(const Status& status) {
+        if (status.folders.empty()) {
+            return false;
+        }
+        const bool daemons_up = status.AreDaemonsUp();
+        were_up_ = were_up_ || daemons_up;
+        const bool is_stuck = !daemons_up || (status.IsFinished() && status.HasProblem());
+        looks_ = is_stuck ? looks_ + 1 : 0;
+        return looks_ > (were_up_ ? 2 : 10);
+    }
+
+  private:
+    bool were_up_ = false;
+    int looks_ = 0;
+};
+
+/// The reason why "until finished" ends without that.
+std::string WhyUnfinished(const Status& status) {
+    if (!status.problems.empty()) {
+        return status.problems.front();
+    }
+    for (const FolderLine& folder : status.folders) {
+        const std::string text = folder.status["text"].asString();
+        if (text == "error" || text == "incomplete") {
+            return folder.path + " is not finished: " + StatusText(folder.status);
+        }
+    }
+    return "a share has a problem";
+}
+
 int StatusCommand(const Options& options, Session& session) {
     session.doing = "tell the status";
-    const bool watch = options.watch || options.until_finished;
     Screen screen(session);
+    Patience patience;
     while (true) {
         const Status status = TakeStatus();
         const std::string text = Rendered(status, session);
-        if (!watch) {
+        if (!options.watch && !options.until_finished) {
             session.out << text;
-            return kSuccess;
+            return status.HasProblem() ? kFailure : kSuccess;
         }
         screen.Draw(text);
-        if (options.until_finished && status.IsFinished()) {
-            return status.HasError() ? kFailure : kSuccess;
+        if (options.until_finished && status.IsFinished() && !status.HasProblem()) {
+            return kSuccess;
+        }
+        if (options.until_finished && patience.IsOver(status)) {
+            throw Failure(WhyUnfinished(status));
         }
         if (!session.out) {
             return kSuccess;  // the reader has gone
@@ -193,13 +237,14 @@ void AddStatusCommand(CommandLine& line) {
         line.Root(), "status", "Show what is indexed and what is still to do",
         "  fileindexctl status\n"
         "  fileindexctl status --watch                     until Ctrl-C\n"
-        "  fileindexctl status --watch --until-finished    for scripts: 1 when a folder has an "
-        "error\n"
+        "  fileindexctl status --watch --until-finished    for scripts: 1 when that cannot be\n"
         "  fileindexctl status --json | jq '.share[].documents'");
     auto options = std::make_shared<Options>();
-    command.add_flag("--watch", options->watch, "Show it again every second");
-    command.add_flag("--until-finished", options->until_finished,
-                     "Watch until nothing is left to do");
+    command.add_flag("--watch", options->watch, "Show it again and again");
+    command.add_flag(
+        "--until-finished", options->until_finished,
+        "Watch until nothing is left to do; fail when a daemon has gone or a folder has an "
+        "error");
     line.OnCommand(command,
                    [options](Session& session) { return StatusCommand(*options, session); });
 }

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstddef>
+#include <cstdint>
 #include <string>
 #include <string_view>
 
@@ -15,6 +16,18 @@ std::string Shown(std::string_view bytes);
 
 /// The number of terminal cells of a text, near enough for tables: one for each character.
 std::size_t DisplayWidth(std::string_view text);
+
+/// A number of bytes for people: "512 bytes", "3.2 MB" (powers of 1000).
+std::string Bytes(std::uint64_t count);
+
+/// A number of seconds for people, in its largest unit: "2 minutes".
+std::string Duration(std::int64_t seconds);
+
+/// Seconds since the epoch in local time: "2026-11-21 22:10".
+std::string LocalTime(std::int64_t seconds);
+
+/// A number and its noun: "1 file", "2 files".
+std::string Number(std::uint64_t value, const char* one, const char* many);
 
 /// A progress bar of `width` cells, brackets included, for a share from 0 to 1.
 std::string ProgressBar(double share, unsigned int width);

@@ -132,7 +132,7 @@ void WaitFor(Session& session, Needs needs, std::function<void()> body) {
     while (!call->ended.wait_for(lock, kLook, [&] { return call->has_ended; })) {
         lock.unlock();
         const bool indexer_gone = indexer_closed.Holds(HasClosed(kIndexer));
-        const bool is_away = needs == Needs::kIndexerAndSearch && IsAway(kSearchDaemon);
+        const bool is_away = needs == Needs::kBothDaemons && IsAway(kSearchDaemon);
         search_was_there = search_was_there || !is_away;
         const bool search_gone = search_was_there && search_away.Holds(is_away);
         if (indexer_gone || search_gone) {

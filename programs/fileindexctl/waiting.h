@@ -14,8 +14,8 @@ struct GivenUp : std::runtime_error {
 };
 
 enum class Needs {
-    kIndexer,           ///< the call talks to fileindexd only
-    kIndexerAndSearch,  ///< to both daemons: it is given up when kestoelasticd ends, too
+    kIndexingDaemon,  ///< the call talks to fileindexd only
+    kBothDaemons,     ///< to both daemons: it is given up when kestoelasticd ends, too
 };
 
 /// Makes a call of the library that may wait for daemons, without an end where they let it down:

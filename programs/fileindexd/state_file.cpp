@@ -8,7 +8,6 @@
 #include <cstdio>
 #include <ctime>
 
-#include "base/file.h"
 #include "base/unique_fd.h"
 #include "common/json.h"
 #include "common/log.h"
@@ -50,7 +49,8 @@ bool Replace(const std::string& path, const std::string& text) {
         if (!fd.IsValid()) {
             return false;
         }
-        if (quivra::base::WriteAll(fd.Get(), text) && rename(aside.c_str(), path.c_str()) == 0) {
+        if (quivra::WriteAll(fd.Get(), text.data(), text.size()) &&
+            rename(aside.c_str(), path.c_str()) == 0) {
             return true;
         }
     }

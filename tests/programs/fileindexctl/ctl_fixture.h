@@ -1,7 +1,9 @@
 #pragma once
 
+#include <optional>
 #include <sstream>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "programs/fileindexctl/application.h"
@@ -31,9 +33,9 @@ class CtlTest : public fileindex::LibraryTest {
     static Result Piped(const std::vector<std::string>& arguments) {
         return RunWith(arguments, false);
     }
-    static Json::Value PipedJson(const std::vector<std::string>& arguments) {
+    static Json::Value PipedJson(const std::vector<std::string>& arguments, int status = kSuccess) {
         const Result result = Piped(arguments);
-        EXPECT_EQ(result.status, kSuccess) << result.err;
+        EXPECT_EQ(result.status, status) << result.err;
         return Parse(result.out);
     }
 
@@ -70,6 +72,45 @@ class CtlTest : public fileindex::LibraryTest {
         const int status = ctl::Run(arguments, session);
         return {status, out.str(), err.str()};
     }
+};
+
+/// All daemons run and say that share "s" is as it should be.
+class DaemonsTest : public CtlTest {
+  protected:
+    DaemonsTest() { StartDaemons(); }
+
+    void StartDaemons() {
+        for (auto& [daemon, socket] :
+             {std::pair(&indexer_, kDaemonSocket), std::pair(&search_, kSearchSocket),
+              std::pair(&monitor_, "/var/run/kestotifyd.sock")}) {
+            if (!daemon->has_value()) {
+                daemon->emplace(socket);
+            }
+        }
+        TellThatAllIsWell();
+    }
+
+    void TellThatAllIsWell() {
+        Tell(indexer_, R"({"shares":[{"share":"s","state":"idle","waiting":0,"eta":-1}]})");
+        Tell(search_, R"({"indexes":[{"id":"fileindex_s","documents":7,"fresh":false}]})");
+        Tell(monitor_, R"({"backend":"inotify","overflows":0,"last_event":0,"problem":"",
+            "folders":[{"queue":")" +
+                           QueueOf("s") + R"(","watched":9,"unwatched":0}]})");
+    }
+
+    /// What the daemon says of itself; other requests to the search daemon find `document_`.
+    void Tell(std::optional<fake::ScriptedServer>& daemon, const std::string& state) {
+        daemon->SetHandler([state, this](const Json::Value& request) {
+            const bool asks_state = request["type"] == "state" || request["command"] == "state";
+            return fake::Frame(R"({"success":true,"data":)" + (asks_state ? state : document_) +
+                               R"(,"total":1})");
+        });
+    }
+
+    std::string document_ = "[]";
+    std::optional<fake::ScriptedServer> indexer_;
+    std::optional<fake::ScriptedServer> search_;
+    std::optional<fake::ScriptedServer> monitor_;
 };
 
 }  // namespace quivra::ctl
