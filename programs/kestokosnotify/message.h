@@ -10,7 +10,11 @@ namespace notify {
 /// so that no notice is lost.
 std::string ResolveMessage(const std::string& key, const std::vector<std::string>& arguments = {});
 
-/// The text as a plain line: without <tags> and control characters, which a terminal would obey.
-std::string PlainText(const std::string& text);
+/// The text as one line that a terminal or log shows and does not obey: a blank for each control
+/// character (those beyond ASCII included), a "?" for each byte that is not UTF-8.
+std::string OneLine(const std::string& text);
+
+/// The text without its <tags>.
+std::string WithoutTags(const std::string& text);
 
 }  // namespace notify

@@ -19,12 +19,13 @@ bool IsRecipient(const Notice& notice, const std::string& user) {
 }  // namespace
 
 int Send(const Notice& notice) {
-    const std::string title = ResolveMessage(notice.title);
-    const std::string message = ResolveMessage(notice.message, notice.arguments);
-    syslog(LOG_WARNING, "%s to %s: %s: %s", notice.application.c_str(), notice.recipient.c_str(),
-           title.c_str(), message.c_str());
-    const std::string text = "\r\n\a" + PlainText(title) + ": " + PlainText(message) + "\r\n";
-    return WriteToTerminals(text,
+    const std::string text = OneLine(ResolveMessage(notice.title) + ": " +
+                                     ResolveMessage(notice.message, notice.arguments));
+    // The log keeps the tags: a reader of it may want the link.
+    syslog(LOG_WARNING, "%s to %s: %s", OneLine(notice.application).c_str(),
+           OneLine(notice.recipient).c_str(), text.c_str());
+    const std::string shown = "\r\n\a" + WithoutTags(text) + "\r\n";
+    return WriteToTerminals(shown,
                             [&](const std::string& user) { return IsRecipient(notice, user); });
 }
 

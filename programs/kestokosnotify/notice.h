@@ -14,8 +14,8 @@ struct Notice {
     std::vector<std::string> arguments;  ///< for the message's places
 };
 
-/// Writes the notice to the system log, as it is, and to the recipients' terminals, as plain text.
-/// The number of terminals that took it.
+/// Writes the notice to the system log and, without its tags, to the recipients' terminals. Returns
+/// the number of terminals that took it.
 int Send(const Notice& notice);
 
 }  // namespace notify

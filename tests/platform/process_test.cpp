@@ -69,10 +69,31 @@ TEST_F(ProcessTest, ServicesAreRunByTheirManager) {
     EXPECT_EQ(ReadFile("/volume1/done"), "stop\nrestart\n");
     EXPECT_EQ(KLIBServicectlStop("pkg-test", KLIB_SERVICECTL_UPSTART), -1);
     EXPECT_EQ(KLIBCErrGet(), KESTO_ERR_COMMAND_FAILED);
+    EXPECT_EQ(KLIBServiceStop("pkg-none", 1), 0);
+    EXPECT_EQ(KLIBServiceStart("pkg-none", 1), -1);
+    EXPECT_EQ(KLIBCErrGet(), KESTO_ERR_NOT_FOUND);
     for (const char* name : {"", "-x", "../evil", "a;b"}) {
         EXPECT_EQ(KLIBServiceStart(name, 1), -1) << name;
         EXPECT_EQ(KLIBCErrGet(), KESTO_ERR_BAD_ARGUMENT);
     }
+}
+
+TEST_F(ProcessTest, SystemdIsAskedWhetherThereIsSuchAService) {
+    WriteFile("/volume1/systemctl",
+              "#!/bin/sh\necho $* >>/volume1/calls\n"
+              "case $* in *none) echo not-found;; *) echo loaded;; esac\n");
+    chmod("/volume1/systemctl", 0755);
+    const Mount fake("/volume1/systemctl", "/usr/bin/systemctl", nullptr, MS_BIND);
+    if (!fake.IsMounted()) {
+        GTEST_SKIP() << "no systemctl";
+    }
+    std::filesystem::create_directories("/run/systemd/system");
+    EXPECT_EQ(KLIBServicectlStart("pkg-none", KLIB_SERVICECTL_UPSTART), -1);
+    EXPECT_EQ(KLIBCErrGet(), KESTO_ERR_NOT_FOUND);
+    EXPECT_EQ(KLIBServicectlStart("pkg-test", KLIB_SERVICECTL_UPSTART), 0);
+    std::filesystem::remove_all("/run/systemd");
+    EXPECT_NE(ReadFile("/volume1/calls").find("start pkg-test.service"), std::string::npos)
+        << ReadFile("/volume1/calls");
 }
 
 }  // namespace

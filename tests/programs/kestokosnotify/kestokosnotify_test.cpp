@@ -86,12 +86,15 @@ TEST_F(NotifyTest, OddLoginsAndStoppedTerminalsAreLeftOut) {
     tcflow(stopped.slave, TCOOFF);
     const Terminal root("root");
     LogIn("root", ttyname(root.slave) + std::strlen("/dev/"));  // once more
-    EXPECT_EQ(notify::Send({"App", "root", "<b>title</b>", "a\x1b[2Jc\n<open", {}}), 1);
-    EXPECT_EQ(root.Shown(), "\r\r\n\atitle: a [2Jc \r\r\n");
+    EXPECT_EQ(notify::Send(
+                  {"App\n", "root", "<b>title</b>", "a\x1b[2Jc\n\u00fc\xc2\x9b\x9b\xc3<open", {}}),
+              1);
+    EXPECT_EQ(root.Shown(), "\r\r\n\atitle: a [2Jc \u00fc ??\r\r\n");
     std::string content;
     std::ifstream("/tmp/file") >> content;
     EXPECT_EQ(content, "old");
-    EXPECT_EQ(fake::LogLinesWith("App to root: <b>title</b>").size(), 1U);  // the log keeps links
+    EXPECT_EQ(fake::LogLinesWith("App  to root: <b>title</b>: a [2Jc").size(),
+              1U);  // the log keeps links
 }
 
 }  // namespace
