@@ -3,7 +3,7 @@
 #include <utility>
 #include <vector>
 
-#include "programs/kestotifyd/queue_translator.h"
+#include "base/path.h"
 
 namespace kestotifyd {
 namespace {
@@ -13,13 +13,10 @@ using Entries = std::vector<std::pair<std::string, std::string>>;
 /// The (path, handle) pairs at and below the path.
 Entries Below(const std::map<std::string, std::string>& by_path, const std::string& path) {
     Entries found;
-    // Names that merely begin alike ("/a/b.txt") sort between "/a/b" and "/a/b/c".
-    for (auto it = by_path.lower_bound(path);
-         it != by_path.end() && it->first.compare(0, path.size(), path) == 0; ++it) {
-        if (IsAtOrBelow(it->first, path)) {
-            found.push_back(*it);
-        }
-    }
+    const auto own = by_path.equal_range(path);
+    found.assign(own.first, own.second);
+    const auto below = quivra::base::Subtree(by_path, path);
+    found.insert(found.end(), below.first, below.second);
     return found;
 }
 

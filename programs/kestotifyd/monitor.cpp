@@ -14,6 +14,7 @@
 #include <utility>
 #include <vector>
 
+#include "base/path.h"
 #include "common/error.h"
 #include "common/log.h"
 
@@ -181,7 +182,8 @@ void Monitor::HandleMountChange() {
     // What a mount had covered lies open again, and has not been looked into.
     for (const std::string& removed : mounts_.TakeRemoved()) {
         for (const auto& [path, root] : roots_) {
-            if (root.backend != nullptr && path != removed && IsAtOrBelow(removed, path)) {
+            if (root.backend != nullptr && path != removed &&
+                quivra::base::IsAtOrBelow(removed, path)) {
                 root.backend->Rescan(path);
             }
         }

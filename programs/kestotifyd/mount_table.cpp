@@ -8,8 +8,8 @@
 #include <iterator>
 #include <sstream>
 
+#include "base/path.h"
 #include "common/log.h"
-#include "programs/kestotifyd/queue_translator.h"
 
 #include <kesto/filesystem.h>
 
@@ -86,7 +86,7 @@ std::string MountTable::Covering(const std::string& path) const {
 std::set<std::string> MountTable::Below(const std::string& path) const {
     std::set<std::string> below;
     for (const std::string& point : points_) {
-        if (point != path && IsAtOrBelow(point, path) &&
+        if (point != path && quivra::base::IsAtOrBelow(point, path) &&
             KESTOGetFSType(point.c_str(), 0) != KESTO_FS_VIRTUAL) {
             below.insert(point);
         }

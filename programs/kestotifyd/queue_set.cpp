@@ -4,6 +4,7 @@
 #include <thread>
 #include <utility>
 
+#include "base/path.h"
 #include "common/json.h"
 #include "fileindex/event.h"
 
@@ -89,7 +90,7 @@ std::set<std::string> QueueSet::OutermostFolders() const {
     std::set<std::string> outermost;
     for (const std::string& folder : all) {
         const bool is_inside = std::any_of(all.begin(), all.end(), [&](const std::string& other) {
-            return other != folder && IsAtOrBelow(folder, other);
+            return other != folder && quivra::base::IsAtOrBelow(folder, other);
         });
         if (!is_inside) {
             outermost.insert(folder);
@@ -132,12 +133,27 @@ bool QueueSet::Covers(const std::string& path) const {
 void QueueSet::Apply(const Change& change, Time now) {
     for (Queue* const queue : Concerned(change)) {
         queue->translator->Apply(change, now);
-        const bool may_wait = change.kind == Change::Kind::kWritten;
-        Schedule(*queue, now + (may_wait ? QueueTranslator::kOpenFileInterval : kBatchTime));
+        if (queue->translator->LineCount() > 0 || MovesQueue(change, *queue)) {
+            Schedule(*queue, now + kBatchTime);
+        } else if (const std::optional<Time> due = queue->translator->NextDue()) {
+            Schedule(*queue, *due);
+        }
         if (queue->translator->LineCount() > kMaxBatchLines) {
             FlushQueue(*queue, now, now);
         }
     }
+}
+
+/// Whether the change may put another directory in the place of the queue's. Nothing needs to be
+/// written then, but what was written last may be out of the reader's reach.
+bool QueueSet::MovesQueue(const Change& change, const Queue& queue) {
+    using Kind = Change::Kind;
+    const std::string& directory = queue.writer->Directory();
+    const bool is_move = change.kind == Kind::kRenamed || change.kind == Kind::kDeleted ||
+                         change.kind == Kind::kCreated;
+    return is_move && (quivra::base::IsAtOrBelow(directory, change.path) ||
+                       (change.kind == Kind::kRenamed &&
+                        quivra::base::IsAtOrBelow(directory, change.path_old)));
 }
 
 void QueueSet::Schedule(Queue& queue, Time due) {
@@ -147,7 +163,7 @@ void QueueSet::Schedule(Queue& queue, Time due) {
 void QueueSet::PayFolders(const std::string& root, Time now) {
     for (auto& [queue_path, queue] : queues_) {
         for (auto& [path, folder] : queue.folders) {
-            if (IsAtOrBelow(path, root)) {
+            if (quivra::base::IsAtOrBelow(path, root)) {
                 Pay(queue, path, folder, now);
             }
         }
@@ -163,7 +179,8 @@ void QueueSet::OnRootComplete(const std::string& root, Time now) {
             Schedule(queue, now + kBatchTime);
         }
         for (auto& [path, folder] : queue.folders) {
-            if (folder.owes_crash && !folder.owes_reindex && IsAtOrBelow(root, path)) {
+            if (folder.owes_crash && !folder.owes_reindex &&
+                quivra::base::IsAtOrBelow(root, path)) {
                 Pay(queue, path, folder, now);
             }
         }
@@ -186,7 +203,7 @@ void QueueSet::Pay(Queue& queue, const std::string& path, Folder& folder, Time n
 void QueueSet::OnRootLost(const std::string& root, bool is_deleted, Time now) {
     for (auto& [queue_path, queue] : queues_) {
         for (auto& [path, folder] : queue.folders) {
-            if (!IsAtOrBelow(path, root)) {
+            if (!quivra::base::IsAtOrBelow(path, root)) {
                 continue;
             }
             if (is_deleted) {
@@ -202,7 +219,8 @@ void QueueSet::OnRootLost(const std::string& root, bool is_deleted, Time now) {
 void QueueSet::OweCrashMarker(const std::string& root) {
     for (auto& [queue_path, queue] : queues_) {
         for (auto& [path, folder] : queue.folders) {
-            folder.owes_crash |= IsAtOrBelow(path, root) || IsAtOrBelow(root, path);
+            folder.owes_crash |=
+                quivra::base::IsAtOrBelow(path, root) || quivra::base::IsAtOrBelow(root, path);
         }
     }
 }
@@ -218,7 +236,7 @@ void QueueSet::Flush(Time now) {
 void QueueSet::FlushQueue(Queue& queue, Time now, Time held_until) {
     queue.translator->Flush(held_until);
     queue.writer->Add(queue.translator->TakeLines());
-    switch (queue.writer->Write()) {
+    switch (queue.writer->Write(MayMake(queue))) {
         case QueueWriter::Result::kDone:
             queue.translator->OnWritten(queue.writer->HasBegunFile());
             queue.flush_due = queue.translator->NextDue();
@@ -230,6 +248,17 @@ void QueueSet::FlushQueue(Queue& queue, Time now, Time held_until) {
             queue.flush_due = now + kFailedRetry;
             break;
     }
+}
+
+/// A directory that is missing is made anew, but not at once, and only while the folder is watched:
+/// else it may be the volume that is missing, and what is made in its place would make an absent
+/// volume look like an empty one.
+quivra::base::PrivateDirectory::Make QueueSet::MayMake(const Queue& queue) {
+    using Make = quivra::base::PrivateDirectory::Make;
+    const bool is_watched = std::any_of(
+        queue.folders.begin(), queue.folders.end(),
+        [](const auto& entry) { return !entry.second.is_pending && !entry.second.owes_reindex; });
+    return is_watched && !queue.writer->Problem().empty() ? Make::kMissing : Make::kNo;
 }
 
 void QueueSet::FlushAll(Time deadline) {

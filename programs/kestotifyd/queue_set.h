@@ -67,6 +67,8 @@ class QueueSet {
 
     void UpdateQueue(const Registration& registration, bool is_start, Time now);
     void Pay(Queue& queue, const std::string& path, Folder& folder, Time now);
+    static bool MovesQueue(const Change& change, const Queue& queue);
+    static quivra::base::PrivateDirectory::Make MayMake(const Queue& queue);
     std::set<Queue*> Concerned(const Change& change) const;
     void AddConcerned(const std::string& path, std::set<Queue*>& concerned) const;
     void RebuildIndex();

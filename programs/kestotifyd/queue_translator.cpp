@@ -2,6 +2,8 @@
 
 #include <algorithm>
 
+#include "base/path.h"
+#include "base/queue_file.h"
 #include "common/json.h"
 #include "fileindex/event.h"
 
@@ -25,14 +27,6 @@ constexpr std::size_t kMaxDeleted = 65536;
 
 }  // namespace
 
-bool IsAtOrBelow(const std::string& path, const std::string& folder) {
-    if (folder == "/") {
-        return true;
-    }
-    return path.compare(0, folder.size(), folder) == 0 &&
-           (path.size() == folder.size() || path[folder.size()] == '/');
-}
-
 QueueTranslator::QueueTranslator(Registration registration, NameTest is_hidden)
     : registration_(std::move(registration)), is_hidden_(std::move(is_hidden)) {}
 
@@ -51,13 +45,13 @@ bool QueueTranslator::IsIgnoredBelow(const std::string& path, const std::string&
 
 bool QueueTranslator::Matches(const std::string& path, bool muted_too) const {
     // A consumer that works on its own queue must not be woken by that.
-    if (path == registration_.queue || path == registration_.queue + ".tmp") {
+    if (path == registration_.queue || path == quivra::base::WorkingCopy(registration_.queue)) {
         return false;
     }
     return std::any_of(
         registration_.folders.begin(), registration_.folders.end(), [&](const std::string& folder) {
-            return IsAtOrBelow(path, folder) && (muted_too || !muted_.contains(folder)) &&
-                   !IsIgnoredBelow(path, folder);
+            return quivra::base::IsAtOrBelow(path, folder) &&
+                   (muted_too || !muted_.contains(folder)) && !IsIgnoredBelow(path, folder);
         });
 }
 
@@ -150,18 +144,16 @@ void QueueTranslator::Hold(const std::string& path, Time due) {
 }
 
 void QueueTranslator::ReleaseBelow(const std::string& path, bool emit) {
-    // Names that merely begin alike ("/a/b.txt") sort between "/a/b" and "/a/b/c".
-    for (auto it = held_.lower_bound(path);
-         it != held_.end() && it->first.compare(0, path.size(), path) == 0;) {
-        if (!IsAtOrBelow(it->first, path)) {
-            ++it;
-            continue;
-        }
-        if (emit) {
+    const auto release = [&](auto begin, auto end) {
+        for (auto it = begin; emit && it != end; ++it) {
             Emit(EVENT_MODIFY, false, it->first);
         }
-        it = held_.erase(it);
-    }
+        held_.erase(begin, end);
+    };
+    const auto own = held_.equal_range(path);
+    release(own.first, own.second);
+    const auto below = quivra::base::Subtree(held_, path);
+    release(below.first, below.second);
 }
 
 std::optional<Time> QueueTranslator::NextDue() const {

@@ -78,7 +78,4 @@ class QueueTranslator {
     bool are_deletes_unknown_ = false;   ///< there were too many to remember
 };
 
-/// Whether `path` is `folder` or lies below it.
-bool IsAtOrBelow(const std::string& path, const std::string& folder);
-
 }  // namespace kestotifyd

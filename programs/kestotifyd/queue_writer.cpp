@@ -1,32 +1,33 @@
 #include "programs/kestotifyd/queue_writer.h"
 
 #include <fcntl.h>
-#include <sys/file.h>
 #include <sys/stat.h>
-#include <unistd.h>
 
 #include <cerrno>
-#include <utility>
 
+#include "base/file.h"
+#include "base/path.h"
+#include "base/queue_file.h"
 #include "common/log.h"
 
 namespace kestotifyd {
 namespace {
 
-constexpr std::size_t kMaxChunk = 1U << 20;
-constexpr int kMaxOpenAttempts = 8;
+using quivra::base::LockAttempt;
+using quivra::base::PrivateDirectory;
 
-bool IsStillAtPath(int fd, const std::string& path) {
-    struct stat held {};
-    struct stat named {};
-    return fstat(fd, &held) == 0 && lstat(path.c_str(), &named) == 0 &&
-           held.st_dev == named.st_dev && held.st_ino == named.st_ino;
-}
+/// A reader that waits for the lock gets it between two chunks' worth of lines at the latest.
+constexpr std::size_t kMaxChunk = 1U << 20;
+/// How often in a row the reader may take the queue away between our opening and locking it.
+constexpr int kMaxOpenAttempts = 8;
 
 }  // namespace
 
-QueueWriter::QueueWriter(std::string path, std::string crash_line, std::size_t max_pending)
-    : path_(std::move(path)), crash_line_(std::move(crash_line)), max_pending_(max_pending) {}
+QueueWriter::QueueWriter(const std::string& path, std::string crash_line, std::size_t max_pending)
+    : directory_(quivra::base::Directory(path)),
+      name_(quivra::base::Name(path)),
+      crash_line_(std::move(crash_line)),
+      max_pending_(max_pending) {}
 
 void QueueWriter::Add(std::vector<std::string> lines) {
     for (std::string& line : lines) {
@@ -36,79 +37,105 @@ void QueueWriter::Add(std::vector<std::string> lines) {
     if (pending_bytes_ > max_pending_) {
         errno = 0;
         quivra::LogError({"queue_writer", __LINE__},
-                         "%zu event lines for %s were dropped, for they could not be written: its "
-                         "share will be indexed again as a whole",
-                         pending_.size(), path_.c_str());
-        pending_.assign(1, crash_line_);
-        pending_bytes_ = crash_line_.size();
+                         "%zu event lines for %s/%s were dropped, for they could not be written: "
+                         "its share will be indexed again as a whole",
+                         pending_.size(), directory_.c_str(), name_.c_str());
+        LosePending();
     }
 }
 
-QueueWriter::Result QueueWriter::Write() {
+void QueueWriter::LosePending() {
+    pending_.assign(1, crash_line_);
+    pending_bytes_ = crash_line_.size();
+}
+
+QueueWriter::Result QueueWriter::Write(PrivateDirectory::Make make) {
     has_begun_file_ = false;
+    PrivateDirectory directory;
+    if (!OpenDirectory(make, directory)) {
+        return Result::kFailed;
+    }
     if (pending_.empty()) {
+        problem_.clear();
         return Result::kDone;
     }
     quivra::base::UniqueFd queue;
-    const Result opened = OpenLocked(queue);
-    if (opened == Result::kFailed) {
-        return Fail("open or lock");
-    }
-    if (opened == Result::kBusy) {
+    const Result opened = OpenLocked(directory.Fd(), queue);
+    if (opened != Result::kDone) {
         return opened;
     }
-    if (!EndTornLine(queue.Get())) {
-        return Fail("repair");
-    }
+    struct stat status {};
+    has_begun_file_ = fstat(queue.Get(), &status) == 0 && status.st_size == 0;
     while (!pending_.empty()) {
         if (Append(queue.Get()) != Result::kDone) {
-            return Fail("append to");
+            return FailCall("write to");
         }
     }
-    is_failure_logged_ = false;
+    problem_.clear();
     return Result::kDone;
 }
 
-QueueWriter::Result QueueWriter::Fail(const char* action) {
-    if (!std::exchange(is_failure_logged_, true)) {
-        quivra::LogError({"queue_writer", __LINE__},
-                         "Cannot %s the queue %s, its events wait in memory", action,
-                         path_.c_str());
+/// The lines that wait for a directory that somebody has exchanged are given up: nobody knows for
+/// how long, and the whole share has to be looked at again in any case.
+bool QueueWriter::OpenDirectory(PrivateDirectory::Make make, PrivateDirectory& directory) {
+    directory = PrivateDirectory::Open(directory_, make);
+    if (!directory.IsValid()) {
+        if (directory.Problem().empty()) {
+            FailCall("open the directory of");
+        } else {
+            LosePending();
+            Fail(directory.Problem());
+        }
+        return false;
     }
-    return Result::kFailed;
+    struct stat status {};
+    if (fstat(directory.Fd(), &status) != 0) {
+        FailCall("open the directory of");
+        return false;
+    }
+    const std::pair<std::uint64_t, std::uint64_t> found(status.st_dev, status.st_ino);
+    if (written_to_.second != 0 && written_to_ != found) {
+        LosePending();
+    }
+    written_to_ = found;
+    return true;
 }
 
-QueueWriter::Result QueueWriter::OpenLocked(quivra::base::UniqueFd& queue) const {
+QueueWriter::Result QueueWriter::OpenLocked(int directory, quivra::base::UniqueFd& queue) {
     for (int attempt = 0; attempt < kMaxOpenAttempts; ++attempt) {
-        queue.Reset(open(path_.c_str(),
-                         O_RDWR | O_APPEND | O_CREAT | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, 0600));
-        struct stat status {};
-        if (!queue.IsValid() || fstat(queue.Get(), &status) != 0) {
-            return Result::kFailed;
-        }
-        if (!S_ISREG(status.st_mode)) {
-            errno = EINVAL;
-            return Result::kFailed;
-        }
-        if (flock(queue.Get(), LOCK_EX | LOCK_NB) != 0) {
-            return errno == EWOULDBLOCK || errno == EINTR ? Result::kBusy : Result::kFailed;
-        }
-        // The reader renames the queue away while it holds the lock.
-        if (IsStillAtPath(queue.Get(), path_)) {
-            return Result::kDone;
+        switch (quivra::base::TryLock(directory, name_, true, quivra::base::kQueueMode, queue)) {
+            case LockAttempt::kTaken:
+                return Result::kDone;
+            case LockAttempt::kBusy:
+                return Result::kBusy;
+            case LockAttempt::kReplaced:
+                continue;
+            case LockAttempt::kOpenFailed:
+                if (errno == ELOOP || errno == EINVAL || errno == EISDIR || errno == ENXIO) {
+                    return Fail(directory_ + "/" + name_ + " is not a regular file; remove it");
+                }
+                return FailCall("open");
+            case LockAttempt::kLockFailed:
+                return FailCall("lock");
         }
     }
     return Result::kBusy;
 }
 
-bool QueueWriter::EndTornLine(int fd) {
-    const off_t size = lseek(fd, 0, SEEK_END);
-    has_begun_file_ = size == 0;
-    char last = '\n';
-    if (size < 0 || (size > 0 && pread(fd, &last, 1, size - 1) != 1)) {
-        return false;
+QueueWriter::Result QueueWriter::FailCall(const char* action) {
+    const std::string cause = quivra::SystemErrorText(errno);
+    return Fail(std::string("Cannot ") + action + " the queue " + directory_ + "/" + name_ + ": " +
+                cause);
+}
+
+/// One line for each cause, not one for each attempt.
+QueueWriter::Result QueueWriter::Fail(std::string problem) {
+    if (problem_ != problem) {
+        problem_ = std::move(problem);
+        errno = 0;
+        quivra::LogError({"queue_writer", __LINE__}, "%s", problem_.c_str());
     }
-    return last == '\n' || write(fd, "\n", 1) == 1;
+    return Result::kFailed;
 }
 
 QueueWriter::Result QueueWriter::Append(int fd) {
@@ -116,30 +143,9 @@ QueueWriter::Result QueueWriter::Append(int fd) {
     for (auto it = pending_.begin(); it != pending_.end() && chunk.size() < kMaxChunk; ++it) {
         chunk += *it;
     }
-    std::size_t written = 0;
-    while (written < chunk.size()) {
-        const ssize_t size = write(fd, chunk.data() + written, chunk.size() - written);
-        if (size < 0 && errno == EINTR) {
-            continue;
-        }
-        if (size <= 0) {
-            break;
-        }
-        written += static_cast<std::size_t>(size);
-    }
-    const int saved_errno = errno;
-    const std::size_t whole = chunk.rfind('\n', written - 1) + 1;
-    const std::size_t kept = written == 0 ? 0 : whole;
-    DropWritten(kept);
-    if (written == chunk.size()) {
-        return Result::kDone;
-    }
-    const off_t end = lseek(fd, 0, SEEK_END);
-    if (end >= 0 && ftruncate(fd, end - static_cast<off_t>(written - kept)) != 0) {
-        // The next append ends the line instead.
-    }
-    errno = saved_errno;
-    return Result::kFailed;
+    const std::size_t written = quivra::base::AppendLines(fd, chunk);
+    DropWritten(written);
+    return written == chunk.size() ? Result::kDone : Result::kFailed;
 }
 
 void QueueWriter::DropWritten(std::size_t size) {

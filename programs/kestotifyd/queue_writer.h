@@ -1,17 +1,27 @@
 #pragma once
 
 #include <cstddef>
+#include <cstdint>
 #include <deque>
 #include <string>
+#include <utility>
 #include <vector>
 
+#include "base/private_directory.h"
 #include "base/unique_fd.h"
 
 namespace kestotifyd {
 
-/// Appends lines to one queue file. It takes the same lock as LockFile, but never waits for it, so
-/// that one busy or broken queue holds up no other: what cannot be written now stays in memory, and
-/// when that grows too large it gives way to one line that says that events were lost.
+/// Appends lines to one queue file, under the lock that its reader takes, too. It never waits for
+/// that lock, so that one busy or broken queue holds up no other: what cannot be written now stays
+/// in memory, and when that grows too large it gives way to one line that says that events were
+/// lost.
+///
+/// The queue lies where users may exchange the directories above it. So each write opens the
+/// queue's directory anew (a descriptor that is kept would forbid to unmount the volume) and works
+/// through that descriptor. Nothing is written to a directory that is not private, and whenever
+/// the one that was written to last is not the one that is there, the line about lost events
+/// follows: what the consumer has not read yet may be in the other one.
 class QueueWriter {
   public:
     static constexpr std::size_t kMaxPendingBytes = 16U << 20;
@@ -19,12 +29,12 @@ class QueueWriter {
     enum class Result {
         kDone,    ///< nothing is left
         kBusy,    ///< another process holds the lock: try again soon
-        kFailed,  ///< no directory, no space, ...: try again later; logged once until it works
-                  ///< again
+        kFailed,  ///< Problem() tells why: try again later
     };
 
-    /// `crash_line` takes the place of lost lines. `max_pending` bounds the memory, in bytes.
-    QueueWriter(std::string path, std::string crash_line,
+    /// `path` is canonical. `crash_line` takes the place of lost lines. `max_pending` bounds the
+    /// memory, in bytes.
+    QueueWriter(const std::string& path, std::string crash_line,
                 std::size_t max_pending = kMaxPendingBytes);
 
     /// Takes whole lines, each with its "\n".
@@ -35,25 +45,36 @@ class QueueWriter {
 
     bool IsEmpty() const { return pending_.empty(); }
 
-    /// Appends what is pending, in order, to the file that is at the path now; it is made with mode
-    /// 0600 when missing. A line that somebody left without its end is ended first; what a full
-    /// disk leaves of a line of ours is taken back.
-    Result Write();
+    const std::string& Directory() const { return directory_; }
+
+    /// Why the last Write failed, in one sentence, which has been logged; empty when it did not.
+    const std::string& Problem() const { return problem_; }
+
+    /// Appends what is pending, in order, to the file that is at the path now; it is made when
+    /// missing, and its directory, too, with `make`. The directory is looked at even when nothing
+    /// is pending.
+    Result Write(
+        quivra::base::PrivateDirectory::Make make = quivra::base::PrivateDirectory::Make::kNo);
 
   private:
-    Result Fail(const char* action);
-    Result OpenLocked(quivra::base::UniqueFd& queue) const;
-    bool EndTornLine(int fd);
+    Result Fail(std::string problem);
+    Result FailCall(const char* action);
+    bool OpenDirectory(quivra::base::PrivateDirectory::Make make,
+                       quivra::base::PrivateDirectory& directory);
+    Result OpenLocked(int directory, quivra::base::UniqueFd& queue);
     Result Append(int fd);
     void DropWritten(std::size_t size);
+    void LosePending();
 
-    std::string path_;
+    std::string directory_;
+    std::string name_;
     std::string crash_line_;
     std::size_t max_pending_;
     std::deque<std::string> pending_;
     std::size_t pending_bytes_ = 0;
+    std::pair<std::uint64_t, std::uint64_t> written_to_{};  ///< device and inode of the directory
     bool has_begun_file_ = false;
-    bool is_failure_logged_ = false;
+    std::string problem_;
 };
 
 }  // namespace kestotifyd

@@ -8,6 +8,7 @@
 #include <set>
 #include <system_error>
 
+#include "base/path.h"
 #include "common/error.h"
 #include "common/json.h"
 #include "common/log.h"
@@ -19,20 +20,8 @@ using quivra::Error;
 
 constexpr std::uintmax_t kMaxFileSize = 16U << 20;
 
-bool IsCanonical(const std::string& path) {
-    if (path.empty() || path.front() != '/' || path.find('\0') != std::string::npos) {
-        return false;
-    }
-    if (path == "/") {
-        return true;
-    }
-    const std::string closed = path + "/";
-    return closed.find("//") == std::string::npos && closed.find("/./") == std::string::npos &&
-           closed.find("/../") == std::string::npos;
-}
-
 std::string ReadPath(const Json::Value& value) {
-    if (!value.isString() || !IsCanonical(value.asString())) {
+    if (!value.isString() || !quivra::base::IsCanonicalText(value.asString())) {
         throw Error(Error::kBadArgument,
                     "Not a canonical absolute path" + quivra::AppendData(value));
     }

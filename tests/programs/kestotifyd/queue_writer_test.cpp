@@ -1,10 +1,15 @@
 #include "programs/kestotifyd/queue_writer.h"
 
 #include <gtest/gtest.h>
+#include <signal.h>
 #include <sys/mount.h>
+#include <sys/prctl.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
+#include <chrono>
+#include <cstdio>
 #include <filesystem>
 #include <fstream>
 #include <iterator>
@@ -18,6 +23,7 @@ namespace kestotifyd {
 namespace {
 
 namespace fs = std::filesystem;
+using quivra::base::PrivateDirectory;
 using Result = QueueWriter::Result;
 
 class QueueWriterTest : public testing::Test {
@@ -61,9 +67,9 @@ TEST_F(QueueWriterTest, KeepsItsLinesUntilLockAndDirectoryAreThere) {
     EXPECT_EQ(writer_.Write(), Result::kFailed);
     EXPECT_EQ(writer_.Write(), Result::kFailed);
     EXPECT_EQ(fake::LogLinesWith(queue_).size(), 1U);
-    fs::create_directories(directory_);
-    EXPECT_EQ(writer_.Write(), Result::kDone);
-    EXPECT_EQ(Content(), "a\n");
+    EXPECT_EQ(writer_.Write(PrivateDirectory::Make::kMissing), Result::kDone);
+    EXPECT_EQ(writer_.Problem(), "");
+    EXPECT_EQ(Content(), "crash\n") << "another directory than before";
 }
 
 TEST_F(QueueWriterTest, WhatDoesNotFitInMemoryBecomesACrashMarker) {
@@ -83,10 +89,101 @@ TEST_F(QueueWriterTest, RefusesWhatIsNoRegularFile) {
     fs::remove(queue_);
     ASSERT_EQ(mkfifo(queue_.c_str(), 0600), 0);
     EXPECT_EQ(writer_.Write(), Result::kFailed);
+    fs::remove(queue_);
+    fs::create_directory(queue_);
+    EXPECT_EQ(writer_.Write(), Result::kFailed);
+    EXPECT_EQ(writer_.Problem(), queue_ + " is not a regular file; remove it");
+    EXPECT_EQ(fake::LogLinesWith("not a regular file").size(), 1U);
+    fs::remove(queue_);
+    EXPECT_EQ(writer_.Write(), Result::kDone);
+    EXPECT_EQ(Content(), "a\n");
+}
+
+TEST_F(QueueWriterTest, WhatWentToAnExchangedDirectoryIsOwed) {
+    writer_.Add({"a\n"});
+    EXPECT_EQ(writer_.Write(), Result::kDone);
+    fs::rename(directory_, directory_ + "_away");
+    fs::create_directory(directory_);
+    EXPECT_EQ(writer_.Write(), Result::kDone) << "looked at although nothing is pending";
+    EXPECT_EQ(Content(), "crash\n");
+    fs::remove_all(directory_ + "_away");
+}
+
+TEST_F(QueueWriterTest, NothingIsWrittenWhereOthersMayWrite) {
+    writer_.Add({"a\n", "b\n"});
+    fs::permissions(directory_, fs::perms(0777));
+    EXPECT_EQ(writer_.Write(), Result::kFailed);
+    EXPECT_EQ(writer_.Write(), Result::kFailed);
+    EXPECT_TRUE(fs::is_empty(directory_));
+    EXPECT_EQ(fake::LogLinesWith("can be written to by other users").size(), 1U);
+    fs::permissions(directory_, fs::perms(0755));
+    EXPECT_EQ(writer_.Write(), Result::kDone);
+    EXPECT_EQ(Content(), "crash\n");
+}
+
+/// A user who may write to the share's root puts a directory of their own in the queue's place and
+/// back, as fast as they can, until they are killed.
+pid_t StartSwapping(const std::string& share) {
+    const pid_t pid = fork();
+    if (pid != 0) {
+        return pid;
+    }
+    if (setresgid(65534, 65534, 65534) != 0 || setresuid(65534, 65534, 65534) != 0) {
+        _exit(1);
+    }
+    const std::string place = share + "/@eaDir";
+    const std::string own = share + "/own";
+    const std::string away = share + "/away";
+    mkdir(own.c_str(), 0777);
+    mkdir((own + "/fileindex").c_str(), 0777);
+    prctl(PR_SET_PDEATHSIG, SIGKILL);
+    while (true) {
+        rename(place.c_str(), away.c_str());
+        rename(own.c_str(), place.c_str());
+        rename(place.c_str(), own.c_str());
+        rename(away.c_str(), place.c_str());
+    }
+}
+
+TEST_F(QueueWriterTest, AnotherUserWhoSwapsDirectoriesLearnsNothingAndLosesNothing) {
+    const std::string share = directory_ + "/share";
+    const std::string queue = share + "/@eaDir/fileindex/queue";
+    fs::create_directories(fs::path(queue).parent_path());
+    if (chown(share.c_str(), 65534, 65534) != 0) {
+        GTEST_SKIP() << "this user namespace has no other user";
+    }
+    QueueWriter writer(queue, "crash\n");
+    const pid_t attacker = StartSwapping(share);
+    int refused = 0;
+    int written = 0;
+    const auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(700);
+    while (std::chrono::steady_clock::now() < end) {
+        writer.Add({"secret\n"});
+        const bool is_done = writer.Write() == Result::kDone;
+        written += is_done ? 1 : 0;
+        refused += is_done || writer.Problem().find("user 65534") == std::string::npos ? 0 : 1;
+    }
+    kill(attacker, SIGKILL);
+    ASSERT_EQ(waitpid(attacker, nullptr, 0), attacker);
+    if (fs::exists(share + "/away")) {
+        if (fs::exists(share + "/@eaDir")) {
+            fs::rename(share + "/@eaDir", share + "/own");
+        }
+        fs::rename(share + "/away", share + "/@eaDir");
+    }
+    writer.Add({"last\n"});
+    EXPECT_EQ(writer.Write(), Result::kDone);
+    EXPECT_TRUE(fs::is_empty(share + "/own/fileindex"));
+    std::ifstream file(queue);
+    const std::string content(std::istreambuf_iterator<char>(file), {});
+    EXPECT_GT(written, 0);
+    EXPECT_GT(refused, 0);
+    EXPECT_NE(content.find("crash\n"), std::string::npos);
+    EXPECT_NE(content.find("last\n"), std::string::npos);
 }
 
 TEST_F(QueueWriterTest, AFullDiskTearsNoLine) {
-    ASSERT_EQ(mount("none", directory_.c_str(), "tmpfs", 0, "size=16k"), 0);
+    ASSERT_EQ(mount("none", directory_.c_str(), "tmpfs", 0, "size=16k,mode=755"), 0);
     QueueWriter writer(queue_, "crash\n");
     std::string expected;
     std::vector<std::string> lines;

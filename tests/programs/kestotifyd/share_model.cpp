@@ -7,13 +7,13 @@
 #include <iterator>
 #include <utility>
 
+#include "base/path.h"
 #include "common/lock_file.h"
 #include "fileindex/event.h"
-#include "programs/kestotifyd/queue_translator.h"
 #include "tests/support/program.h"
 
 namespace fs = std::filesystem;
-using kestotifyd::IsAtOrBelow;
+using quivra::base::IsAtOrBelow;
 
 ShareModel::ShareModel(std::string folder, std::string queue)
     : folder_(std::move(folder)), queue_(std::move(queue)) {}
