@@ -8,13 +8,14 @@
 
 #include <array>
 #include <cerrno>
-#include <cstddef>
 #include <cstdint>
-#include <cstring>
+#include <string_view>
 #include <utility>
 
+#include "base/path.h"
 #include "common/log.h"
 #include "programs/kestotifyd/file_handle.h"
+#include "programs/kestotifyd/raw_events.h"
 
 namespace kestotifyd {
 namespace {
@@ -22,9 +23,11 @@ namespace {
 constexpr std::uint64_t kMarkMask =
     FAN_CREATE | FAN_DELETE | FAN_RENAME | FAN_MODIFY | FAN_CLOSE_WRITE | FAN_ATTRIB | FAN_ONDIR;
 
-constexpr int kMaxReads = 16;
-constexpr std::size_t kMaxKnownPaths = 65536;  // per mount
-constexpr std::size_t kMaxUncheckedRenames = 65536;
+/// How long events are read in one go, and when the daemon stops.
+constexpr std::chrono::milliseconds kSlice{50};
+constexpr std::chrono::milliseconds kLastSlice{300};
+constexpr std::chrono::seconds kSightRetry{1};
+constexpr std::size_t kMaxKnownBytes = 32U << 20;  // per mount
 
 quivra::base::UniqueFd OpenDirectory(const std::string& path) {
     return quivra::base::UniqueFd(open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
@@ -38,49 +41,27 @@ std::string FileSystemOf(int fd) {
     return std::string(reinterpret_cast<const char*>(&status.f_fsid), sizeof(status.f_fsid));
 }
 
-/// A structure of the kernel's at any address: events follow each other at multiples of four bytes
-/// only.
-template <typename T>
-T Load(const char* bytes) {
-    T value;
-    std::memcpy(&value, bytes, sizeof(value));
-    return value;
+/// Whether the failure has nothing to do with the object: it may work again later.
+bool IsShortage(int error_number) {
+    return error_number == EMFILE || error_number == ENFILE || error_number == ENOMEM;
 }
 
-/// Reads one information record of an event.
-void ReadRecord(const char* record, std::uint8_t type, FanotifyEvent& event) {
-    const char* const bytes = record + offsetof(fanotify_event_info_fid, handle);
-    const std::size_t size = sizeof(file_handle) + Load<file_handle>(bytes).handle_bytes;
-    const std::string key(bytes, size);
-    event.file_system.assign(record + offsetof(fanotify_event_info_fid, fsid),
-                             sizeof(fanotify_event_info_fid::fsid));
-    switch (type) {
-        case FAN_EVENT_INFO_TYPE_FID:
-            event.target = key;
-            break;
-        case FAN_EVENT_INFO_TYPE_DFID_NAME:
-            event.place = {key, bytes + size};
-            break;
-        case FAN_EVENT_INFO_TYPE_OLD_DFID_NAME:
-            event.old_place = {key, bytes + size};
-            break;
-        case FAN_EVENT_INFO_TYPE_NEW_DFID_NAME:
-            event.new_place = {key, bytes + size};
-            break;
-        default:
-            break;
+/// Remembers the directories above an open one, so that a later rename of one of them shows that
+/// the disk was ahead. Step by step from below: a look-up from the root for each of them took a
+/// tenth of a second for one event, a thousand directories deep.
+void RememberAbove(const quivra::base::UniqueFd& directory, int mount_id, std::string path,
+                   HandlePaths& paths) {
+    quivra::base::UniqueFd at;
+    while (path.size() > 1 && !paths.IsAhead()) {
+        const int below = at.IsValid() ? at.Get() : directory.Get();
+        at = quivra::base::UniqueFd(openat(below, "..", O_PATH | O_DIRECTORY | O_CLOEXEC));
+        path = quivra::base::Directory(path);
+        const auto above = at.IsValid() ? HandleOf(at.Get()) : std::nullopt;
+        if (!above || above->mount_id != mount_id || paths.Find(above->handle) == path) {
+            return;
+        }
+        paths.Set(above->handle, path);
     }
-}
-
-FanotifyEvent ReadEvent(const char* begin, const fanotify_event_metadata& metadata) {
-    FanotifyEvent event;
-    event.mask = metadata.mask;
-    for (std::size_t at = metadata.metadata_len; at < metadata.event_len;) {
-        const auto header = Load<fanotify_event_info_header>(begin + at);
-        ReadRecord(begin + at, header.info_type, event);
-        at += header.len;
-    }
-    return event;
 }
 
 }  // namespace
@@ -121,6 +102,7 @@ bool FanotifyBackend::AddRoot(const std::string& path) {
 }
 
 void FanotifyBackend::RemoveRoot(const std::string& path) {
+    std::erase(completed_, path);
     for (auto it = views_.begin(); it != views_.end(); ++it) {
         if (it->second.roots.erase(path) == 0 || !it->second.roots.empty()) {
             continue;
@@ -143,32 +125,58 @@ void FanotifyBackend::RemoveRoot(const std::string& path) {
 }
 
 void FanotifyBackend::Work(bool is_last) {
-    bool is_empty = ReadEvents();
-    while (is_last && !is_empty) {
-        is_empty = ReadEvents();
+    const Time end = Clock::now() + (is_last ? kLastSlice : kSlice);
+    bool is_empty = ReadEvents(end);
+    while (is_last && !is_empty && Clock::now() < end) {
+        is_empty = ReadEvents(end);
     }
     for (auto& [mount, view] : views_) {
-        if (is_empty || view.renames.size() > kMaxUncheckedRenames) {
-            FinishTurn(view);
+        if (is_empty || view.renames.IsFull()) {
+            FinishTurn(view, is_empty);
         }
     }
     if (is_empty) {
+        RecoverSight();
         CompleteRoots();
     }
 }
 
-/// Everything that the kernel had queued has been processed.
-void FanotifyBackend::FinishTurn(View& view) {
-    CheckRenames(view);
-    view.renames_before = std::exchange(view.renames, {});
-    view.paths.Settle();
-    if (view.paths.Size() > kMaxKnownPaths) {
-        view.paths.Clear();
+void FanotifyBackend::FinishTurn(View& view, bool is_empty) {
+    view.renames.Run(sink_, view.paths.IsAhead());
+    if (is_empty) {  // everything that the kernel had queued has been processed
+        view.paths.Settle();
+    }
+    if (view.paths.Size() > kMaxKnownBytes) {
+        is_empty ? view.paths.Clear() : view.paths.BecomeAhead();
+    }
+}
+
+/// What happened below the roots of a blind view is lost. They are complete again, with the marker
+/// that this brings, once a descriptor can be had.
+void FanotifyBackend::RecoverSight() {
+    const Time now = Clock::now();
+    if (sight_due_ && now < *sight_due_) {
+        return;
+    }
+    sight_due_.reset();
+    for (auto& [mount, view] : views_) {
+        if (!view.is_blind) {
+            continue;
+        }
+        if (!OpenDirectory(*view.roots.begin()).IsValid() && IsShortage(errno)) {
+            sight_due_ = now + kSightRetry;
+            continue;
+        }
+        view.is_blind = false;
+        for (const std::string& root : view.roots) {
+            sink_.OnGaps(root);
+            completed_.push_back(root);
+        }
     }
 }
 
 std::optional<Time> FanotifyBackend::NextDue() const {
-    return completed_.empty() ? std::nullopt : std::optional(Time::min());
+    return completed_.empty() ? sight_due_ : std::optional(Time::min());
 }
 
 void FanotifyBackend::CompleteRoots() {
@@ -177,24 +185,24 @@ void FanotifyBackend::CompleteRoots() {
     }
 }
 
-/// True when no event was left.
-bool FanotifyBackend::ReadEvents() {
+/// True when no event was left. Stops at `end`, so that a storm that goes on for longer keeps
+/// nobody from the signals, the registrations and the queues.
+bool FanotifyBackend::ReadEvents(Time end) {
     std::array<char, 65536> buffer;
-    for (int reads = 0; reads < kMaxReads; ++reads) {
+    do {
         const ssize_t size = read(group_.Get(), buffer.data(), buffer.size());
         if (size <= 0) {
             return true;
         }
-        for (const char* at = buffer.data(); at < buffer.data() + size;) {
-            const auto metadata = Load<fanotify_event_metadata>(at);
-            if ((metadata.mask & FAN_Q_OVERFLOW) != 0) {
+        std::string_view events(buffer.data(), static_cast<std::size_t>(size));
+        while (const std::optional<FanotifyEvent> event = TakeFanotifyEvent(events)) {
+            if ((event->mask & FAN_Q_OVERFLOW) != 0) {
                 HandleOverflow();
-            } else if (metadata.pid != getpid()) {
-                Handle(ReadEvent(at, metadata));
+            } else if (event->pid != getpid()) {
+                Handle(*event);
             }
-            at += metadata.event_len;
         }
-    }
+    } while (Clock::now() < end);
     return false;
 }
 
@@ -209,63 +217,45 @@ void FanotifyBackend::Handle(const FanotifyEvent& event) {
         for (const Change& change : TranslateFanotify(event, view.paths, lookup)) {
             sink_.OnChange(change);
             if (change.kind == Change::Kind::kRenamed) {
-                view.renames.push_back({change.path_old, change.path, change.is_dir});
+                view.renames.Add(change);
             }
+        }
+        if (view.is_blind && !sight_due_) {
+            sight_due_ = Clock::now() + kSightRetry;
         }
     }
 }
 
-/// The directory's path, and with it the paths of all directories above it, so that a later rename
-/// of one of them shows that this one was ahead.
 std::string FanotifyBackend::Lookup(View& view, const std::string& handle) const {
     const std::string known = view.paths.Find(handle);
     if (!known.empty()) {
         return known;
     }
+    errno = 0;
+    const std::string path = LookUpOnDisk(view, handle);
+    view.is_blind |= path.empty() && IsShortage(errno);
+    return path;
+}
+
+std::string FanotifyBackend::LookUpOnDisk(View& view, const std::string& handle) const {
     // No descriptor is kept open, for that would forbid to unmount.
     const quivra::base::UniqueFd mount = OpenDirectory(*view.roots.begin());
     const quivra::base::UniqueFd fd =
         mount.IsValid() ? OpenHandle(mount.Get(), handle) : quivra::base::UniqueFd();
     const std::string path = fd.IsValid() ? PathOfDescriptor(fd.Get()) : std::string();
-    if (path.empty()) {
-        return path;
+    if (path.empty() || view.paths.IsAhead()) {
+        return path;  // nothing is remembered while the disk is ahead
     }
+    const auto known_as = HandleOf(fd.Get());
     view.paths.Set(handle, path);
-    std::string above = path;
-    for (std::size_t slash = above.rfind('/'); slash != 0; slash = above.rfind('/')) {
-        above.resize(slash);
-        const quivra::base::UniqueFd ancestor = OpenDirectory(above);
-        const auto known_as = ancestor.IsValid() ? HandleOf(ancestor.Get()) : std::nullopt;
-        if (!known_as || view.paths.Find(known_as->handle) == above) {
-            break;
-        }
-        view.paths.Set(known_as->handle, above);
+    if (known_as) {
+        RememberAbove(fd, known_as->mount_id, path, view.paths);
+    }
+    // Renamed in between, the directories that were met above need not be those of the path.
+    if (PathOfDescriptor(fd.Get()) != path) {
+        view.paths.BecomeAhead();
     }
     return path;
-}
-
-/// The kernel merges equal renames: of a -> b, b -> a, a -> b the first two arrive, and the object
-/// seems to be at a. So each rename's result is compared with the disk. Where names were used too
-/// early, all results are indexed again: also those of the turn before, for the event of a rename
-/// is queued a moment after the disk shows it.
-void FanotifyBackend::CheckRenames(const View& view) {
-    using Kind = Change::Kind;
-    for (const Rename& rename : view.renames) {
-        struct stat status {};
-        if (lstat(rename.to.c_str(), &status) != 0) {
-            sink_.OnChange({Kind::kDeleted, rename.is_dir, rename.to});
-        }
-        if (lstat(rename.from.c_str(), &status) == 0) {
-            sink_.OnChange({Kind::kCreated, S_ISDIR(status.st_mode), rename.from});
-        }
-    }
-    if (view.paths.IsAhead()) {
-        for (const std::vector<Rename>* const turn : {&view.renames_before, &view.renames}) {
-            for (const Rename& rename : *turn) {
-                sink_.OnChange({Kind::kReindex, true, rename.to});
-            }
-        }
-    }
 }
 
 void FanotifyBackend::HandleOverflow() {

@@ -11,6 +11,7 @@
 #include "programs/kestotifyd/backend.h"
 #include "programs/kestotifyd/fanotify_translation.h"
 #include "programs/kestotifyd/handle_paths.h"
+#include "programs/kestotifyd/rename_check.h"
 
 namespace kestotifyd {
 
@@ -32,34 +33,31 @@ class FanotifyBackend : public Backend {
     std::optional<Time> NextDue() const override;
 
   private:
-    struct Rename {
-        std::string from;
-        std::string to;
-        bool is_dir;
-    };
     /// One mount, as far as roots lie in it.
     struct View {
         std::string file_system;
         std::set<std::string> roots{};
         HandlePaths paths{};
-        std::vector<Rename> renames{};         ///< since the kernel's queue was last empty
-        std::vector<Rename> renames_before{};  ///< and in the turn before that
+        RenameCheck renames{};
+        bool is_blind = false;  ///< events were dropped, because descriptors or memory are short
     };
 
     FanotifyBackend(BackendSink& sink, quivra::base::UniqueFd group);
 
-    bool ReadEvents();
+    bool ReadEvents(Time end);
     void Handle(const FanotifyEvent& event);
     void HandleOverflow();
     void CompleteRoots();
-    void FinishTurn(View& view);
-    void CheckRenames(const View& view);
+    void FinishTurn(View& view, bool is_empty);
+    void RecoverSight();
     std::string Lookup(View& view, const std::string& handle) const;
+    std::string LookUpOnDisk(View& view, const std::string& handle) const;
 
     BackendSink& sink_;
     quivra::base::UniqueFd group_;
     std::map<int, View> views_;  ///< by mount id
     std::vector<std::string> completed_;
+    std::optional<Time> sight_due_;  ///< when to try whether a blind view can see again
 };
 
 }  // namespace kestotifyd

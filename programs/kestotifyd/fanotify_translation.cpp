@@ -5,6 +5,8 @@
 #include <array>
 #include <utility>
 
+#include "base/path.h"
+
 namespace kestotifyd {
 namespace {
 
@@ -15,7 +17,7 @@ std::string PathOf(const FanotifyEvent::Place& place, const HandleLookup& lookup
     if (directory.empty() || place.name == ".") {
         return directory;
     }
-    return directory == "/" ? "/" + place.name : directory + "/" + place.name;
+    return quivra::base::Join(directory, place.name);
 }
 
 std::vector<Change> TranslateRename(const FanotifyEvent& event, HandlePaths& paths,
@@ -39,6 +41,14 @@ std::vector<Change> TranslateRename(const FanotifyEvent& event, HandlePaths& pat
         if (is_dir) {
             paths.Set(event.target, to);
         }
+        return changes;
+    }
+    using quivra::base::IsAtOrBelow;
+    if (is_dir && (IsAtOrBelow(to, from) || IsAtOrBelow(from, to))) {
+        // No file system does that; merged events can look so. Every such rename would make the
+        // paths below it longer, up to twice as long, without end.
+        changes.push_back({Kind::kReindex, true, IsAtOrBelow(to, from) ? from : to});
+        paths.BecomeAhead();
         return changes;
     }
     changes.push_back({Kind::kRenamed, is_dir, to, from});

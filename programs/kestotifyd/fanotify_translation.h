@@ -18,6 +18,7 @@ struct FanotifyEvent {
     };
 
     std::uint64_t mask = 0;
+    int pid = 0;  ///< of the process that did it
     std::string file_system{};
     Place place{};      ///< of everything but a rename
     Place old_place{};  ///< of a rename

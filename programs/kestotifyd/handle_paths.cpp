@@ -20,7 +20,18 @@ Entries Below(const std::map<std::string, std::string>& by_path, const std::stri
     return found;
 }
 
+/// Both strings are kept twice.
+std::size_t Cost(const std::string& handle, const std::string& path) {
+    return 2 * (handle.size() + path.size() + 64);
+}
+
 }  // namespace
+
+void HandlePaths::Insert(const std::string& handle, const std::string& path) {
+    by_handle_[handle] = path;
+    by_path_[path] = handle;
+    size_ += Cost(handle, path);
+}
 
 std::string HandlePaths::Find(const std::string& handle) const {
     const auto it = by_handle_.find(handle);
@@ -34,8 +45,7 @@ void HandlePaths::Set(const std::string& handle, const std::string& path) {
     const auto there = by_path_.find(path);
     const auto known = by_handle_.find(handle);
     if (there == by_path_.end() && known == by_handle_.end()) {
-        by_handle_[handle] = path;
-        by_path_[path] = handle;
+        Insert(handle, path);
     } else if (there == by_path_.end() || there->second != handle) {
         BecomeAhead();
     }
@@ -44,6 +54,7 @@ void HandlePaths::Set(const std::string& handle, const std::string& path) {
 void HandlePaths::Erase(const std::string& handle) {
     const auto it = by_handle_.find(handle);
     if (it != by_handle_.end()) {
+        size_ -= Cost(handle, it->second);
         by_path_.erase(it->second);
         by_handle_.erase(it);
     }
@@ -51,13 +62,14 @@ void HandlePaths::Erase(const std::string& handle) {
 
 void HandlePaths::EraseBelow(const std::string& path) {
     for (const auto& [below, handle] : Below(by_path_, path)) {
-        by_path_.erase(below);
-        by_handle_.erase(handle);
+        Erase(handle);
     }
 }
 
 void HandlePaths::Rename(const std::string& handle, const std::string& from,
                          const std::string& to) {
+    // The map stands at the event only when the object is where the event takes it from, nobody
+    // else is there, and nothing is at or below the new place.
     const std::string known = Find(handle);
     const auto occupant = by_path_.find(from);
     if ((!known.empty() && known != from) ||
@@ -86,6 +98,7 @@ void HandlePaths::Settle() {
 void HandlePaths::Clear() {
     by_handle_.clear();
     by_path_.clear();
+    size_ = 0;
 }
 
 }  // namespace kestotifyd

@@ -30,17 +30,22 @@ class HandlePaths {
 
     bool IsAhead() const { return is_ahead_; }
 
+    /// Something else has shown that the disk is ahead, or that the paths are not to be trusted.
+    void BecomeAhead();
+
     /// The stream has been processed to its end: the disk is ahead no more.
     void Settle();
 
-    std::size_t Size() const { return by_handle_.size(); }
+    /// Memory taken by the paths, in bytes, more or less.
+    std::size_t Size() const { return size_; }
     void Clear();
 
   private:
-    void BecomeAhead();
+    void Insert(const std::string& handle, const std::string& path);
 
     std::unordered_map<std::string, std::string> by_handle_;
     std::map<std::string, std::string> by_path_;
+    std::size_t size_ = 0;
     bool is_ahead_ = false;
 };
 
