@@ -1,5 +1,7 @@
 #pragma once
 
+#include <cerrno>
+#include <cstddef>
 #include <optional>
 #include <string>
 
@@ -53,8 +55,30 @@ class Backend {
     /// With `is_last` nothing waits for more to come.
     virtual void Work(bool is_last) = 0;
 
+    /// How much of a root is watched.
+    struct Coverage {
+        std::size_t watched = 0;    ///< directories; with one mark for a file system: 1
+        std::size_t unwatched = 0;  ///< directories that were refused; what is below them is not
+                                    ///< counted
+        std::string problem{};      ///< why, and what to do, in one sentence
+    };
+    virtual Coverage CoverageOf(const std::string& root) const = 0;
+
+    /// How often the kernel's queue has run over.
+    std::size_t Overflows() const { return overflows_; }
+
     /// When Work wants to be called although nothing is readable; none when it does not.
     virtual std::optional<Time> NextDue() const = 0;
+
+  protected:
+    std::size_t overflows_ = 0;
 };
+
+/// Whether a system call failed for want of something that may be free again later, and not
+/// because of the object.
+inline bool IsShortage(int error_number) {
+    return error_number == EMFILE || error_number == ENFILE || error_number == ENOMEM ||
+           error_number == ENOSPC;
+}
 
 }  // namespace kestotifyd

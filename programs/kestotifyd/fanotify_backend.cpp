@@ -41,11 +41,6 @@ std::string FileSystemOf(int fd) {
     return std::string(reinterpret_cast<const char*>(&status.f_fsid), sizeof(status.f_fsid));
 }
 
-/// Whether the failure has nothing to do with the object: it may work again later.
-bool IsShortage(int error_number) {
-    return error_number == EMFILE || error_number == ENFILE || error_number == ENOMEM;
-}
-
 /// Remembers the directories above an open one, so that a later rename of one of them shows that
 /// the disk was ahead. Step by step from below: a look-up from the root for each of them took a
 /// tenth of a second for one event, a thousand directories deep.
@@ -95,7 +90,7 @@ bool FanotifyBackend::AddRoot(const std::string& path) {
         return false;
     }
     View& view = views_.try_emplace(root->mount_id, View{FileSystemOf(fd.Get())}).first->second;
-    view.roots.insert(path);
+    view.roots[path] = root->handle;
     view.paths.Set(root->handle, path);
     completed_.push_back(path);
     return true;
@@ -163,12 +158,12 @@ void FanotifyBackend::RecoverSight() {
         if (!view.is_blind) {
             continue;
         }
-        if (!OpenDirectory(*view.roots.begin()).IsValid() && IsShortage(errno)) {
+        if (!OpenDirectory(view.roots.begin()->first).IsValid() && IsShortage(errno)) {
             sight_due_ = now + kSightRetry;
             continue;
         }
         view.is_blind = false;
-        for (const std::string& root : view.roots) {
+        for (const auto& [root, handle] : view.roots) {
             sink_.OnGaps(root);
             completed_.push_back(root);
         }
@@ -200,6 +195,7 @@ bool FanotifyBackend::ReadEvents(Time end) {
                 HandleOverflow();
             } else if (event->pid != getpid()) {
                 Handle(*event);
+                DropMovedRoots(*event);
             }
         }
     } while (Clock::now() < end);
@@ -226,6 +222,25 @@ void FanotifyBackend::Handle(const FanotifyEvent& event) {
     }
 }
 
+/// The name of a removed directory is gone with the one above it, its handle is not.
+void FanotifyBackend::DropMovedRoots(const FanotifyEvent& event) {
+    if ((event.mask & (FAN_DELETE | FAN_RENAME)) == 0 || (event.mask & FAN_ONDIR) == 0) {
+        return;
+    }
+    std::vector<std::string> lost;
+    for (const auto& [mount, view] : views_) {
+        for (const auto& [path, handle] : view.roots) {
+            if (view.file_system == event.file_system && handle == event.target) {
+                lost.push_back(path);
+            }
+        }
+    }
+    for (const std::string& path : lost) {
+        RemoveRoot(path);
+        sink_.OnRootLost(path);
+    }
+}
+
 std::string FanotifyBackend::Lookup(View& view, const std::string& handle) const {
     const std::string known = view.paths.Find(handle);
     if (!known.empty()) {
@@ -239,7 +254,7 @@ std::string FanotifyBackend::Lookup(View& view, const std::string& handle) const
 
 std::string FanotifyBackend::LookUpOnDisk(View& view, const std::string& handle) const {
     // No descriptor is kept open, for that would forbid to unmount.
-    const quivra::base::UniqueFd mount = OpenDirectory(*view.roots.begin());
+    const quivra::base::UniqueFd mount = OpenDirectory(view.roots.begin()->first);
     const quivra::base::UniqueFd fd =
         mount.IsValid() ? OpenHandle(mount.Get(), handle) : quivra::base::UniqueFd();
     const std::string path = fd.IsValid() ? PathOfDescriptor(fd.Get()) : std::string();
@@ -258,7 +273,20 @@ std::string FanotifyBackend::LookUpOnDisk(View& view, const std::string& handle)
     return path;
 }
 
+Backend::Coverage FanotifyBackend::CoverageOf(const std::string& root) const {
+    for (const auto& [mount, view] : views_) {
+        if (view.roots.contains(root)) {
+            return view.is_blind ? Coverage{0, 1,
+                                            "No descriptor or no memory is free: changes are "
+                                            "missed. Raise LimitNOFILE of the service"}
+                                 : Coverage{1, 0, ""};
+        }
+    }
+    return {};
+}
+
 void FanotifyBackend::HandleOverflow() {
+    ++overflows_;
     errno = 0;
     quivra::LogError(
         {"fanotify", __LINE__},
@@ -267,7 +295,7 @@ void FanotifyBackend::HandleOverflow() {
     completed_.clear();
     for (auto& [mount, view] : views_) {
         view.paths.Clear();
-        for (const std::string& root : view.roots) {
+        for (const auto& [root, handle] : view.roots) {
             sink_.OnOverflow(root);
             completed_.push_back(root);
         }

@@ -3,7 +3,6 @@
 #include <map>
 #include <memory>
 #include <optional>
-#include <set>
 #include <string>
 #include <vector>
 
@@ -31,12 +30,13 @@ class FanotifyBackend : public Backend {
     void Rescan(const std::string& path) override { completed_.push_back(path); }
     void Work(bool is_last) override;
     std::optional<Time> NextDue() const override;
+    Coverage CoverageOf(const std::string& root) const override;
 
   private:
     /// One mount, as far as roots lie in it.
     struct View {
         std::string file_system;
-        std::set<std::string> roots{};
+        std::map<std::string, std::string> roots{};  ///< handles by path
         HandlePaths paths{};
         RenameCheck renames{};
         bool is_blind = false;  ///< events were dropped, because descriptors or memory are short
@@ -46,6 +46,7 @@ class FanotifyBackend : public Backend {
 
     bool ReadEvents(Time end);
     void Handle(const FanotifyEvent& event);
+    void DropMovedRoots(const FanotifyEvent& event);
     void HandleOverflow();
     void CompleteRoots();
     void FinishTurn(View& view, bool is_empty);

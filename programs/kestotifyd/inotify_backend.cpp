@@ -12,9 +12,11 @@
 #include <cstring>
 #include <fstream>
 #include <memory>
+#include <string_view>
+#include <utility>
 
-#include "common/error.h"
 #include "common/log.h"
+#include "programs/kestotifyd/raw_events.h"
 
 namespace kestotifyd {
 namespace {
@@ -33,7 +35,14 @@ constexpr std::chrono::milliseconds kScanSlice{10};
 constexpr std::chrono::milliseconds kRetryDelay{10};
 constexpr int kMaxRetries = 200;
 constexpr std::chrono::seconds kRescanDelay{1};
-constexpr std::chrono::minutes kRefusalRetry{30};
+/// While directories are unwatched: how often to look whether something has come free, how soon
+/// one rescan for that may follow another (twice as long each time, since each one has the share
+/// indexed again), and when to rescan in any case, because what happens in there stays unknown.
+constexpr std::chrono::seconds kGapCheck{3};
+constexpr std::chrono::seconds kMinGapDelay{5};
+constexpr std::chrono::minutes kForcedRescan{30};
+constexpr std::chrono::milliseconds kProcessSlice{50};
+constexpr std::chrono::milliseconds kLastSlice{300};
 
 std::size_t ReadLimit() {
     std::size_t limit = kDefaultLimit;
@@ -45,13 +54,14 @@ struct DirectoryCloser {
     void operator()(DIR* directory) const { closedir(directory); }
 };
 
-/// The entries that are directories.
+/// The entries that are directories. False, with errno set, when they are not all known.
 bool ListDirectories(quivra::base::UniqueFd fd, std::vector<std::string>& names) {
     const std::unique_ptr<DIR, DirectoryCloser> directory(fdopendir(fd.Get()));
     if (!directory) {
         return false;
     }
     fd.Release();  // closed with the stream
+    errno = 0;
     while (const dirent* const entry = readdir(directory.get())) {
         const char* const name = entry->d_name;
         if (std::strcmp(name, ".") == 0 || std::strcmp(name, "..") == 0) {
@@ -66,13 +76,15 @@ bool ListDirectories(quivra::base::UniqueFd fd, std::vector<std::string>& names)
         if (is_dir) {
             names.emplace_back(name);
         }
+        errno = 0;
     }
-    return true;
+    return errno == 0;
 }
 
+/// Whether the directory is there and cannot be watched. A path that is too long may become shorter
+/// by a rename above.
 bool IsRefusal(int error_number) {
-    return error_number == ENOSPC || error_number == ENOMEM || error_number == EMFILE ||
-           error_number == ENFILE;
+    return IsShortage(error_number) || error_number == ENAMETOOLONG;
 }
 
 std::string Below(int directory, const std::string& name) {
@@ -81,26 +93,25 @@ std::string Below(int directory, const std::string& name) {
 
 }  // namespace
 
-InotifyBackend::InotifyBackend(BackendSink& sink, std::size_t max_watches)
-    : sink_(sink),
-      inotify_(inotify_init1(IN_NONBLOCK | IN_CLOEXEC)),
-      configured_limit_(max_watches),
-      limit_(max_watches == 0 ? ReadLimit() : max_watches) {
-    if (!inotify_.IsValid()) {
-        const std::string reason =
-            "inotify_init1 failed, reason=" + quivra::SystemErrorText(errno) +
-            ". Raise the limit: sysctl fs.inotify.max_user_instances=512";
-        quivra::Fail({"inotify", __LINE__}, "!inotify_.IsValid()",
-                     quivra::Error(quivra::Error::kSystemCallFailed, reason));
+std::unique_ptr<InotifyBackend> InotifyBackend::Create(BackendSink& sink, std::size_t max_watches) {
+    quivra::base::UniqueFd inotify(inotify_init1(IN_NONBLOCK | IN_CLOEXEC));
+    if (!inotify.IsValid()) {
+        return nullptr;
     }
+    return std::unique_ptr<InotifyBackend>(
+        new InotifyBackend(sink, std::move(inotify), max_watches));
 }
+
+InotifyBackend::InotifyBackend(BackendSink& sink, quivra::base::UniqueFd inotify,
+                               std::size_t max_watches)
+    : sink_(sink),
+      inotify_(std::move(inotify)),
+      configured_limit_(max_watches),
+      limit_(max_watches == 0 ? ReadLimit() : max_watches) {}
 
 bool InotifyBackend::AddRoot(const std::string& path) {
     const int wd = Watch(path, true);
     if (wd < 0) {
-        if (IsRefusal(errno)) {
-            Refuse(errno, path, path);
-        }
         return false;
     }
     WatchNode* const node = tree_.AddRoot(path, wd);
@@ -109,6 +120,7 @@ bool InotifyBackend::AddRoot(const std::string& path) {
 }
 
 void InotifyBackend::RemoveRoot(const std::string& path) {
+    unwatched_.erase(path);
     WatchNode* const root = tree_.FindRoot(path);
     if (root != nullptr) {
         Release(tree_.Remove(*root));
@@ -139,34 +151,40 @@ std::optional<Time> InotifyBackend::NextDue() const {
     for (const Retry& retry : retries_) {
         consider(retry.due);
     }
-    for (const std::optional<Time>& rescan : {rescan_due_, refusal_retry_due_}) {
-        if (rescan) {
-            consider(*rescan);
-        }
+    if (rescan_due_) {
+        consider(*rescan_due_);
+    }
+    if (!unwatched_.empty()) {
+        consider(next_gap_check_);
     }
     return due;
 }
 
 void InotifyBackend::ReadEvents() {
-    alignas(inotify_event) std::array<char, 65536> buffer;
-    for (int reads = 0; reads < kMaxReads; ++reads) {
+    std::array<char, 65536> buffer;
+    // What is not taken yet stays with the kernel, which says so when it becomes too much.
+    for (int reads = 0; reads < kMaxReads && !pairing_.IsFull(); ++reads) {
         const ssize_t size = read(inotify_.Get(), buffer.data(), buffer.size());
         if (size <= 0) {
             return;  // EAGAIN; an interrupted read is repeated by the next call
         }
         const Time now = Clock::now();
-        for (const char* at = buffer.data(); at < buffer.data() + size;) {
-            const auto* const event = reinterpret_cast<const inotify_event*>(at);
-            const std::string name = event->len > 0 ? std::string(event->name) : std::string();
-            pairing_.Push({event->wd, event->mask, event->cookie, name}, now);
-            at += sizeof(inotify_event) + event->len;
+        std::string_view events(buffer.data(), static_cast<std::size_t>(size));
+        while (std::optional<InotifyEvent> event = TakeInotifyEvent(events)) {
+            pairing_.Push(std::move(*event), now);
         }
     }
 }
 
 void InotifyBackend::Process(bool is_last) {
-    const Time now = is_last ? Time::max() : Clock::now();
-    while (const std::optional<MovePairing::Paired> paired = pairing_.Pop(now)) {
+    const Time start = Clock::now();
+    const Time end = start + (is_last ? kLastSlice : kProcessSlice);
+    while (Clock::now() < end) {
+        const auto paired = pairing_.Pop(is_last ? Time::max() : start);
+        if (!paired) {
+            renames_.Run(sink_, false);
+            return;
+        }
         Handle(*paired);
     }
 }
@@ -176,9 +194,15 @@ void InotifyBackend::Handle(const MovePairing::Paired& paired) {
     Release(outcome.unused_watches);
     for (const Change& change : outcome.changes) {
         sink_.OnChange(change);
+        if (change.kind == Change::Kind::kRenamed) {
+            renames_.Add(change);
+        }
+    }
+    if (renames_.IsFull()) {
+        renames_.Run(sink_, false);
     }
     for (const InotifyOutcome::Appeared& appeared : outcome.appeared) {
-        Appear({appeared.parent, appeared.parent->wd}, appeared.name, 0);
+        Appear(appeared.parent, appeared.name, 0);
     }
     for (const std::string& root : outcome.lost_roots) {
         RemoveRoot(root);
@@ -190,6 +214,7 @@ void InotifyBackend::Handle(const MovePairing::Paired& paired) {
 }
 
 void InotifyBackend::HandleOverflow() {
+    ++overflows_;
     errno = 0;
     quivra::LogError(
         {"inotify", __LINE__},
@@ -203,23 +228,40 @@ void InotifyBackend::HandleOverflow() {
 
 void InotifyBackend::StartRescans() {
     const Time now = Clock::now();
-    const bool is_due =
-        (rescan_due_ && *rescan_due_ <= now) || (refusal_retry_due_ && *refusal_retry_due_ <= now);
+    bool is_due = rescan_due_ && *rescan_due_ <= now;
+    if (!is_due && !unwatched_.empty() && next_gap_check_ <= now) {
+        next_gap_check_ = now + kGapCheck;
+        is_due = forced_rescan_ <= now || (now >= gap_rescan_ && IsRoomFree());
+    }
     if (!is_due || !scans_.empty()) {
         return;
     }
     rescan_due_.reset();
-    refusal_retry_due_.reset();
-    roots_with_gaps_.clear();
     limit_ = configured_limit_ == 0 ? ReadLimit() : configured_limit_;
+    for (const auto& [root, count] : std::exchange(unwatched_, {})) {
+        sink_.OnGaps(root);  // what happened in there meanwhile is lost
+    }
+    gap_delay_ = std::clamp<Clock::duration>(gap_delay_ * 2, kMinGapDelay, kForcedRescan);
+    gap_rescan_ = now + gap_delay_;
+    forced_rescan_ = now + kForcedRescan;
     for (const std::string& path : tree_.RootPaths()) {
         Rescan(path);
     }
 }
 
-bool InotifyBackend::IsAlive(const NodeRef& ref) const {
-    const std::vector<WatchNode*> nodes = tree_.Find(ref.wd);
-    return std::find(nodes.begin(), nodes.end(), ref.node) != nodes.end();
+/// Whether what was refused last would be taken now.
+bool InotifyBackend::IsRoomFree() {
+    limit_ = configured_limit_ == 0 ? ReadLimit() : configured_limit_;
+    const quivra::base::UniqueFd directory(
+        open(refused_path_.c_str(), O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+    if (!directory.IsValid()) {
+        return !IsRefusal(errno);  // gone, it wants no watch any more
+    }
+    const int wd = Watch(Below(directory.Get(), "."), true);
+    if (wd >= 0 && tree_.Find(wd).empty()) {
+        inotify_rm_watch(inotify_.Get(), wd);
+    }
+    return wd >= 0;
 }
 
 int InotifyBackend::Watch(const std::string& path, bool follow) {
@@ -240,7 +282,7 @@ void InotifyBackend::Release(const std::vector<int>& watches) {
 }
 
 /// Opens the directory of a node, provided that the node's path still leads to it. Setting a watch
-/// that is there already answers its descriptor: that is the proof.
+/// that is there already returns its descriptor: that is the proof.
 quivra::base::UniqueFd InotifyBackend::OpenVerified(WatchNode& node) {
     const int link_flag = node.parent == nullptr ? 0 : O_NOFOLLOW;
     quivra::base::UniqueFd fd(
@@ -286,7 +328,7 @@ InotifyBackend::Child InotifyBackend::EnsureChild(WatchNode& parent, int parent_
     return Adopt(parent, name, wd);
 }
 
-/// Puts a watch into the tree. When the kernel answers a watch that another node has, the directory
+/// Puts a watch into the tree. When the kernel returns a watch that another node has, the directory
 /// has been moved from there, or both places show it (a bind mount).
 InotifyBackend::Child InotifyBackend::Adopt(WatchNode& parent, const std::string& name, int wd) {
     for (WatchNode* const other : tree_.Find(wd)) {
@@ -301,12 +343,12 @@ InotifyBackend::Child InotifyBackend::Adopt(WatchNode& parent, const std::string
 }
 
 void InotifyBackend::Appear(const NodeRef& parent, const std::string& name, int attempts) {
-    if (!IsAlive(parent)) {
+    if (!tree_.IsAlive(parent)) {
         return;
     }
     const quivra::base::UniqueFd fd = OpenVerified(*parent.node);
     if (!fd.IsValid()) {
-        ScheduleRetry(parent, name, attempts);
+        Postpone(parent, name, attempts);
         return;
     }
     const Child child = EnsureChild(*parent.node, fd.Get(), name);
@@ -317,8 +359,12 @@ void InotifyBackend::Appear(const NodeRef& parent, const std::string& name, int 
     }
 }
 
-void InotifyBackend::ScheduleRetry(const NodeRef& parent, const std::string& name, int attempts) {
-    if (attempts < kMaxRetries) {
+/// OpenVerified has failed for the node. For want of descriptors or watches, waiting for an event
+/// that explains it would be in vain, and giving the directory up wrong: the rescan takes it up.
+void InotifyBackend::Postpone(const NodeRef& parent, const std::string& name, int attempts) {
+    if (IsRefusal(errno)) {
+        Refuse(errno, parent.node->Root().name, parent.node->PathOf(name.empty() ? "." : name));
+    } else if (attempts < kMaxRetries) {
         retries_.push_back({parent, name, Clock::now() + kRetryDelay, attempts + 1});
     } else if (parent.node->parent != nullptr) {
         // Nobody has explained for seconds where the directory went: it is not below the roots.
@@ -334,7 +380,7 @@ void InotifyBackend::WorkRetries(bool is_last) {
     const std::vector<Retry> due(first_due, retries_.end());
     retries_.erase(first_due, retries_.end());
     for (const Retry& retry : due) {
-        if (!IsAlive(retry.parent)) {
+        if (!tree_.IsAlive(retry.parent)) {
             continue;
         }
         if (!retry.name.empty()) {
@@ -342,7 +388,7 @@ void InotifyBackend::WorkRetries(bool is_last) {
         } else if (OpenVerified(*retry.parent.node).IsValid()) {
             scans_.push_back({retry.parent, true, {retry.parent}});
         } else {
-            ScheduleRetry(retry.parent, "", retry.attempts);
+            Postpone(retry.parent, "", retry.attempts);
         }
     }
 }
@@ -366,20 +412,20 @@ void InotifyBackend::WorkScans() {
 }
 
 void InotifyBackend::ScanDirectory(Scan& scan, const NodeRef& ref) {
-    if (!IsAlive(ref)) {
+    if (!tree_.IsAlive(ref)) {
         return;
     }
     const quivra::base::UniqueFd fd = OpenVerified(*ref.node);
     if (!fd.IsValid()) {
-        if (IsRefusal(errno)) {
-            Refuse(errno, ref.node->Root().name, ref.node->Path());
-        }
-        ScheduleRetry(ref, "", 0);
+        Postpone(ref, "", 0);
         return;
     }
     std::vector<std::string> names;
     quivra::base::UniqueFd listing(openat(fd.Get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
     if (!listing.IsValid() || !ListDirectories(std::move(listing), names)) {
+        if (IsRefusal(errno)) {
+            Refuse(errno, ref.node->Root().name, ref.node->Path());
+        }
         return;
     }
     for (const std::string& name : names) {
@@ -406,8 +452,12 @@ void InotifyBackend::DropMissing(WatchNode& node, const std::set<std::string_vie
 }
 
 void InotifyBackend::Finish(const Scan& scan) {
-    if (!IsAlive(scan.top)) {
+    if (!tree_.IsAlive(scan.top)) {
         return;
+    }
+    if (scans_.empty() && unwatched_.empty()) {
+        problem_.clear();
+        gap_delay_ = {};
     }
     if (scan.top.node->parent == nullptr) {
         sink_.OnRootComplete(scan.top.node->name);
@@ -417,17 +467,51 @@ void InotifyBackend::Finish(const Scan& scan) {
 }
 
 void InotifyBackend::Refuse(int error_number, const std::string& root, const std::string& path) {
-    if (!roots_with_gaps_.insert(root).second) {
-        return;
+    const bool is_first = unwatched_.empty();
+    const bool is_first_of_root = unwatched_[root]++ == 0;
+    refused_path_ = path;
+    std::string problem = DescribeRefusal(error_number);
+    if (is_first) {
+        const Time now = Clock::now();
+        next_gap_check_ = now + kGapCheck;
+        forced_rescan_ = std::max(forced_rescan_, now + kForcedRescan);
+        if (problem_ != problem) {  // not again after each rescan
+            errno = 0;
+            quivra::LogError({"inotify", __LINE__}, "%s cannot be watched, and perhaps others: %s",
+                             path.c_str(), problem.c_str());
+        }
     }
-    refusal_retry_due_ = Clock::now() + kRefusalRetry;
-    errno = error_number;
-    quivra::LogError({"inotify", __LINE__},
-                     "The directory %s cannot be watched, and perhaps others: %zu of at most %zu "
-                     "watches are in use. Raise the limit: sysctl fs.inotify.max_user_watches=%zu",
-                     path.c_str(), tree_.WatchCount(), limit_,
-                     std::max<std::size_t>(limit_ * 4, 524288));
-    sink_.OnGaps(root);
+    problem_ = std::move(problem);
+    if (is_first_of_root) {
+        sink_.OnGaps(root);
+    }
+}
+
+std::string InotifyBackend::DescribeRefusal(int error_number) const {
+    switch (error_number) {
+        case ENOSPC:
+            return std::to_string(tree_.WatchCount()) + " directories are watched, and " +
+                   std::to_string(limit_) +
+                   " may be. Raise the limit: sysctl fs.inotify.max_user_watches=" +
+                   std::to_string(std::max<std::size_t>(limit_ * 4, 524288));
+        case ENAMETOOLONG:
+            return "its path is too long";
+        default:
+            return quivra::SystemErrorText(error_number) +
+                   ". Raise LimitNOFILE of the service, or give the machine more memory";
+    }
+}
+
+Backend::Coverage InotifyBackend::CoverageOf(const std::string& root) const {
+    Coverage coverage;
+    if (const WatchNode* const node = tree_.FindRoot(root)) {
+        coverage.watched = WatchTree::Count(*node);
+    }
+    if (const auto gap = unwatched_.find(root); gap != unwatched_.end()) {
+        coverage.unwatched = gap->second;
+        coverage.problem = problem_;
+    }
+    return coverage;
 }
 
 }  // namespace kestotifyd

@@ -1,6 +1,8 @@
 #pragma once
 
 #include <deque>
+#include <map>
+#include <memory>
 #include <optional>
 #include <set>
 #include <string>
@@ -10,6 +12,7 @@
 #include "programs/kestotifyd/backend.h"
 #include "programs/kestotifyd/inotify_translation.h"
 #include "programs/kestotifyd/move_pairing.h"
+#include "programs/kestotifyd/rename_check.h"
 #include "programs/kestotifyd/watch_tree.h"
 
 namespace kestotifyd {
@@ -24,8 +27,8 @@ namespace kestotifyd {
 class InotifyBackend : public Backend {
   public:
     /// Watches at most `max_watches` directories; 0 stands for 80 % of the system's limit for a
-    /// user, which other programs share. Throws Error 502 when the kernel refuses inotify.
-    explicit InotifyBackend(BackendSink& sink, std::size_t max_watches = 0);
+    /// user, which other programs share. Null, with errno set, when the kernel refuses inotify.
+    static std::unique_ptr<InotifyBackend> Create(BackendSink& sink, std::size_t max_watches = 0);
 
     int Fd() const override { return inotify_.Get(); }
     bool AddRoot(const std::string& path) override;
@@ -33,13 +36,10 @@ class InotifyBackend : public Backend {
     void Rescan(const std::string& path) override;
     void Work(bool is_last) override;
     std::optional<Time> NextDue() const override;
+    Coverage CoverageOf(const std::string& root) const override;
 
   private:
-    /// A node that may be gone by the time it is looked at.
-    struct NodeRef {
-        WatchNode* node;
-        int wd;
-    };
+    InotifyBackend(BackendSink& sink, quivra::base::UniqueFd inotify, std::size_t max_watches);
 
     /// A walk over a tree that sets watches, and what to tell when it is through.
     struct Scan {
@@ -61,8 +61,8 @@ class InotifyBackend : public Backend {
     void Handle(const MovePairing::Paired& paired);
     void HandleOverflow();
     void StartRescans();
+    bool IsRoomFree();
 
-    bool IsAlive(const NodeRef& ref) const;
     int Watch(const std::string& path, bool follow);
     void Release(const std::vector<int>& watches);
     quivra::base::UniqueFd OpenVerified(WatchNode& node);
@@ -82,7 +82,7 @@ class InotifyBackend : public Backend {
     Child EnsureChild(WatchNode& parent, int parent_fd, const std::string& name);
     Child Adopt(WatchNode& parent, const std::string& name, int wd);
     void Appear(const NodeRef& parent, const std::string& name, int attempts);
-    void ScheduleRetry(const NodeRef& parent, const std::string& name, int attempts);
+    void Postpone(const NodeRef& parent, const std::string& name, int attempts);
     void WorkRetries(bool is_last);
 
     void WorkScans();
@@ -90,6 +90,7 @@ class InotifyBackend : public Backend {
     void DropMissing(WatchNode& node, const std::set<std::string_view>& names);
     void Finish(const Scan& scan);
     void Refuse(int error_number, const std::string& root, const std::string& path);
+    std::string DescribeRefusal(int error_number) const;
 
     BackendSink& sink_;
     quivra::base::UniqueFd inotify_;
@@ -100,8 +101,16 @@ class InotifyBackend : public Backend {
     std::deque<Scan> scans_;
     std::vector<Retry> retries_;
     std::optional<Time> rescan_due_;
-    std::optional<Time> refusal_retry_due_;
-    std::set<std::string> roots_with_gaps_;  ///< told to the sink since the last rescan
+    RenameCheck renames_;
+
+    /// By root: the directories that were refused since its last rescan began.
+    std::map<std::string, std::size_t> unwatched_;
+    std::string problem_;          ///< of the last refusal, in one sentence
+    std::string refused_path_;     ///< to try whether it would be refused again
+    Time next_gap_check_{};        ///< while something is unwatched
+    Time gap_rescan_{};            ///< not before that, even when something has come free
+    Time forced_rescan_{};         ///< even when nothing seems to have come free
+    Clock::duration gap_delay_{};  ///< between the last rescan and gap_rescan_
 };
 
 }  // namespace kestotifyd

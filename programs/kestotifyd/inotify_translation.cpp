@@ -3,6 +3,8 @@
 #include <sys/inotify.h>
 
 #include <algorithm>
+#include <optional>
+#include <utility>
 
 namespace kestotifyd {
 namespace {
@@ -23,7 +25,10 @@ class Translation {
             HandleSelf(event);
         } else {
             for (WatchNode* const node : tree_.Find(event.wd)) {
-                HandleEntry(*node, event);
+                // What was done for one node may have dropped another one.
+                if (tree_.IsAlive({node, event.wd})) {
+                    HandleEntry(*node, event);
+                }
             }
         }
     }
@@ -46,7 +51,7 @@ class Translation {
 
     void Create(WatchNode& node, const std::string& name, bool is_dir) {
         if (is_dir && node.Child(name) == nullptr) {
-            outcome_.appeared.push_back({&node, name});
+            outcome_.appeared.push_back({{&node, node.wd}, name});
         } else {
             // A directory that the scan of its parent has already found is watched.
             Report(Kind::kCreated, is_dir, node.PathOf(name));
@@ -62,35 +67,53 @@ class Translation {
     }
 
     /// A directory that is seen under several paths gives one event for all of them. The halves
-    /// that lie below the same root belong together; what is left over came or went.
+    /// that lie below the same root belong together; what is left over came or went. Each step may
+    /// drop nodes that a later one was meant for.
     void HandleMove(const InotifyEvent& from, const InotifyEvent& to) {
         std::vector<WatchNode*> sources = tree_.Find(from.wd);
         std::vector<WatchNode*> targets = tree_.Find(to.wd);
         const bool is_dir = (from.mask & IN_ISDIR) != 0;
-        for (WatchNode*& target : targets) {
-            const auto source = std::find_if(
-                sources.begin(), sources.end(),
-                [&](const WatchNode* candidate) { return &candidate->Root() == &target->Root(); });
-            if (source != sources.end()) {
-                Rename(**source, from.name, *target, to.name, is_dir);
-                sources.erase(source);
-                target = nullptr;
+        const auto drop_dead = [&] {
+            std::erase_if(sources, [&](auto* node) { return !tree_.IsAlive({node, from.wd}); });
+            std::erase_if(targets, [&](auto* node) { return !tree_.IsAlive({node, to.wd}); });
+        };
+        for (bool is_same_root : {true, false}) {
+            for (auto pair = FindPair(sources, targets, is_same_root); pair;
+                 pair = FindPair(sources, targets, is_same_root)) {
+                const auto [source, target] = *pair;
+                std::erase(sources, source);
+                std::erase(targets, target);
+                Rename(*source, from.name, *target, to.name, is_dir);
+                drop_dead();
             }
         }
-        std::erase(targets, nullptr);
         for (WatchNode* const target : targets) {
-            if (sources.empty()) {
-                Create(*target, to.name, is_dir);
-            } else {
-                Rename(*sources.back(), from.name, *target, to.name, is_dir);
-                sources.pop_back();
-            }
+            Create(*target, to.name, is_dir);
         }
-        for (WatchNode* const source : sources) {
+        while (!sources.empty()) {
+            WatchNode* const source = sources.back();
+            sources.pop_back();
             Delete(*source, from.name, is_dir);
+            drop_dead();
         }
     }
 
+    using Pair = std::pair<WatchNode*, WatchNode*>;
+    static std::optional<Pair> FindPair(const std::vector<WatchNode*>& sources,
+                                        const std::vector<WatchNode*>& targets, bool is_same_root) {
+        for (WatchNode* const target : targets) {
+            for (WatchNode* const source : sources) {
+                if (!is_same_root || &source->Root() == &target->Root()) {
+                    return Pair(source, target);
+                }
+            }
+        }
+        return std::nullopt;
+    }
+
+    /// Both places are looked at again: a directory at the old one was exchanged with this one, and
+    /// moving the tree's node to and fro, as the two events of an exchange say, would leave one of
+    /// the two without a watch.
     void Rename(WatchNode& from, const std::string& from_name, WatchNode& to,
                 const std::string& to_name, bool is_dir) {
         outcome_.changes.push_back(
@@ -98,11 +121,11 @@ class Translation {
         if (!is_dir) {
             return;
         }
-        WatchNode* const child = from.Child(from_name);
-        if (child != nullptr) {
+        outcome_.appeared.push_back({{&to, to.wd}, to_name});
+        outcome_.appeared.push_back({{&from, from.wd}, from_name});
+        if (WatchNode* const child = from.Child(from_name)) {
             Release(tree_.Move(*child, to, to_name));
         }
-        outcome_.appeared.push_back({&to, to_name});
     }
 
     /// The watched directory itself.

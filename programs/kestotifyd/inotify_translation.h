@@ -17,7 +17,7 @@ struct InotifyOutcome {
     /// reported as created, so that the report covers whatever was in it by then. After a move this
     /// only makes sure: the object at the place may be another one by now.
     struct Appeared {
-        WatchNode* parent;
+        NodeRef parent;
         std::string name;
     };
     std::vector<Appeared> appeared{};

@@ -29,8 +29,12 @@
 namespace kestotifyd {
 namespace {
 
-/// A folder's disappearance or return that no event tells of is noticed this late at most.
+/// A folder's return, or a registration that could be read again, is noticed this late at most.
 constexpr std::chrono::seconds kCheckInterval{3};
+/// The same for a disappearance that no event tells of, as when a directory above is renamed while
+/// inotify watches. Nothing else turns the loop of an idle monitor.
+constexpr std::chrono::minutes kIdleCheckInterval{1};
+constexpr char kStateSocket[] = "/var/run/kestotifyd.sock";
 constexpr std::chrono::milliseconds kStopTime = quivra::daemon::kStopGrace;
 
 [[noreturn]] void FailSystemCall(int line, const char* call) {
@@ -49,9 +53,12 @@ std::string MakeDirectory(const std::string& path) {
     return path;
 }
 
+/// A directory that cannot be read counts as empty: to take an absent volume for one that is there
+/// would drop its documents.
 bool IsEmptyDirectory(const std::string& path) {
     std::error_code error;
-    return std::filesystem::is_empty(path, error) && !error;
+    const bool is_empty = std::filesystem::is_empty(path, error);
+    return is_empty || error;
 }
 
 void Drain(int fd) {
@@ -86,6 +93,12 @@ Monitor::Monitor(const Options& options)
     if (mounts_.Fd() >= 0) {
         WatchDescriptor(mounts_.Fd(), EPOLLPRI);
     }
+    try {
+        state_server_ = std::make_unique<StateServer>(kStateSocket);
+        WatchDescriptor(state_server_->Fd(), EPOLLIN);
+    } catch (const quivra::Error&) {
+        // Logged where it failed. Who asks sees no monitor then, but no change is missed.
+    }
 }
 
 Monitor::~Monitor() = default;
@@ -107,7 +120,8 @@ void Monitor::Run() {
         std::array<epoll_event, 8> events;
         const int count =
             epoll_wait(epoll_.Get(), events.data(), events.size(), WaitMilliseconds(Clock::now()));
-        bool has_registrations = false;
+        bool has_registrations = are_registrations_due_ && Clock::now() >= next_check_;
+        bool is_asked = false;
         for (int i = 0; i < count; ++i) {
             const int fd = events.at(static_cast<std::size_t>(i)).data.fd;
             if (fd == signals_.Fd()) {
@@ -122,6 +136,7 @@ void Monitor::Run() {
                 HandleMountChange();
             }
             has_registrations |= fd == registration_events_.Get();
+            is_asked |= state_server_ && fd == state_server_->Fd();
         }
         // Changes come before the registrations that were made after them.
         WorkBackends(false);
@@ -133,6 +148,9 @@ void Monitor::Run() {
             CheckRoots();
         }
         queues_.Flush(Clock::now());
+        if (is_asked) {
+            state_server_->Reply(State());
+        }
     }
 }
 
@@ -161,11 +179,14 @@ void Monitor::WorkBackends(bool is_last) {
 }
 
 void Monitor::LoadRegistrations(bool is_start) {
-    std::vector<Registration> registrations;
-    for (auto& [file, registration] : ReadRegistrations(options_.registrations)) {
-        registrations.push_back(std::move(registration));
+    const Registrations read = ReadRegistrations(options_.registrations);
+    registration_problem_ = read.problem;
+    are_registrations_due_ = !read.is_whole;
+    if (are_registrations_due_ && !is_start) {
+        next_check_ = Clock::now() + kCheckInterval;
+        return;  // what is watched stays watched
     }
-    queues_.Update(registrations, is_start, Clock::now());
+    queues_.Update(read.list, is_start, Clock::now());
     UpdateRoots();
     CheckRoots();
     for (const auto& [path, root] : roots_) {
@@ -175,19 +196,42 @@ void Monitor::LoadRegistrations(bool is_start) {
     }
 }
 
+/// A mount hides what its directory holds: for as long as it lasts, the index shows what can be
+/// found at the path, and afterwards what was hidden, each by a reindex. The directory around it is
+/// scanned again in both cases, for watches that are hidden and for directories without one.
 void Monitor::HandleMountChange() {
     mounts_.Reload();
     UpdateRoots();
     CheckRoots();
-    // What a mount had covered lies open again, and has not been looked into.
-    for (const std::string& removed : mounts_.TakeRemoved()) {
-        for (const auto& [path, root] : roots_) {
-            if (root.backend != nullptr && path != removed &&
-                quivra::base::IsAtOrBelow(removed, path)) {
-                root.backend->Rescan(path);
+    const MountTable::Changes changes = mounts_.TakeChanges();
+    std::set<std::string> around;
+    for (const std::set<std::string>* const some : {&changes.added, &changes.removed}) {
+        for (const std::string& point : *some) {
+            const auto root = InnermostRoot(std::string(quivra::base::Directory(point)));
+            if (root == roots_.end()) {
+                continue;
+            }
+            around.insert(root->first);
+            if (some == &changes.removed) {
+                root->second.uncovered.insert(point);
             }
         }
     }
+    for (const std::string& path : around) {
+        roots_.at(path).backend->Rescan(path);
+    }
+}
+
+/// The watched root that the path lies in; end() when there is none.
+Monitor::Roots::iterator Monitor::InnermostRoot(const std::string& path) {
+    auto innermost = roots_.end();
+    for (auto it = roots_.begin(); it != roots_.end(); ++it) {
+        // Sorted by path: of two that the path lies in, the later one is the longer one.
+        if (it->second.backend != nullptr && quivra::base::IsAtOrBelow(path, it->first)) {
+            innermost = it;
+        }
+    }
+    return innermost;
 }
 
 /// The registered folders, and what is mounted below them.
@@ -227,7 +271,6 @@ void Monitor::DropObsoleteRoots() {
 
 void Monitor::CheckRoots() {
     are_roots_stale_ = false;
-    next_check_ = Clock::now() + kCheckInterval;
     std::vector<std::string> lost;
     for (auto& [path, root] : roots_) {
         struct stat status {};
@@ -241,36 +284,56 @@ void Monitor::CheckRoots() {
         roots_.at(path).backend->RemoveRoot(path);
         OnRootLost(path);
     }
+    bool is_complete = !are_registrations_due_;
     for (auto& [path, root] : roots_) {
-        if (root.backend == nullptr && wanted_roots_.contains(path) && IsPresent(path)) {
+        if (root.backend == nullptr && wanted_roots_.contains(path)) {
             StartRoot(path, root);
+            is_complete &= root.backend != nullptr;
         }
     }
+    next_check_ = Clock::now() + (is_complete ? kIdleCheckInterval : kCheckInterval);
     DropObsoleteRoots();
 }
 
 /// An empty folder whose file system was mounted elsewhere when it was last watched is the place
 /// where a volume is missing: taking it for the folder would drop everything from the index.
-bool Monitor::IsPresent(const std::string& path) const {
+/// Empty when the folder is there.
+std::string Monitor::WhyAbsent(const std::string& path) const {
     struct stat status {};
-    if (stat(path.c_str(), &status) != 0 || !S_ISDIR(status.st_mode)) {
-        return false;
+    if (stat(path.c_str(), &status) != 0) {
+        return path + " cannot be watched: " + quivra::SystemErrorText(errno);
+    }
+    if (!S_ISDIR(status.st_mode)) {
+        return path + " cannot be watched: it is not a directory";
     }
     const std::string expected = watched_.MountPoint(path);
-    return expected.empty() || mounts_.Covering(path) == expected || !IsEmptyDirectory(path);
+    if (expected.empty() || mounts_.Covering(path) == expected || !IsEmptyDirectory(path)) {
+        return std::string();
+    }
+    return path + " is empty, and nothing is mounted at " + expected +
+           ", where its file system was";
 }
 
 void Monitor::StartRoot(const std::string& path, Root& root) {
+    const std::string absence = WhyAbsent(path);
+    if (!absence.empty()) {
+        root.problem = absence;
+        return;
+    }
     struct stat status {};
     Backend* const backend = stat(path.c_str(), &status) == 0 ? AddToBackend(path) : nullptr;
     if (backend == nullptr) {
-        if (!std::exchange(root.is_failure_logged, true)) {
-            quivra::LogError({"monitor", __LINE__}, "The folder %s cannot be watched",
-                             path.c_str());
+        const std::string problem =
+            path + " cannot be watched: " + quivra::SystemErrorText(errno) +
+            (errno == ENOSPC ? ". Raise the limit: sysctl fs.inotify.max_user_watches" : "");
+        if (root.problem != problem) {
+            root.problem = problem;
+            errno = 0;
+            quivra::LogError({"monitor", __LINE__}, "%s", problem.c_str());
         }
         return;
     }
-    root = {backend, false, status.st_dev, status.st_ino, mounts_.Covering(path), false};
+    root = {backend, false, status.st_dev, status.st_ino, mounts_.Covering(path)};
     if (options_.common.is_verbose) {
         quivra::LogTrace({"monitor", __LINE__}, "Watching %s with %s", path.c_str(),
                          backend == fanotify_.get() ? "fanotify" : "inotify");
@@ -287,19 +350,40 @@ Backend* Monitor::AddToBackend(const std::string& path) {
         if (fanotify_ && fanotify_->AddRoot(path)) {
             return fanotify_.get();
         }
-        if (options_.backend == BackendChoice::kFanotify) {
+        // Descriptors come free again; the other back end would be kept for good.
+        if (options_.backend == BackendChoice::kFanotify || (fanotify_ && IsShortage(errno))) {
             return nullptr;
         }
     }
     if (!inotify_) {
-        inotify_ = std::make_unique<InotifyBackend>(sink, options_.max_watches);
+        inotify_ = InotifyBackend::Create(sink, options_.max_watches);
+        if (!inotify_) {
+            return nullptr;
+        }
         WatchDescriptor(inotify_->Fd(), EPOLLIN);
     }
     return inotify_->AddRoot(path) ? inotify_.get() : nullptr;
 }
 
 void Monitor::OnChange(const Change& change) {
-    queues_.Apply(change, Clock::now());
+    const Time now = Clock::now();
+    last_event_ = now;
+    queues_.Apply(change, now);
+    // A back end that watches a whole file system does not know whether that was a root, or above
+    // one.
+    const bool is_move =
+        change.kind == Change::Kind::kDeleted || change.kind == Change::Kind::kRenamed;
+    are_roots_stale_ |=
+        is_move && change.is_dir && (HoldsRoot(change.path) || HoldsRoot(change.path_old));
+}
+
+/// Whether a root is at or below the path.
+bool Monitor::HoldsRoot(const std::string& path) const {
+    if (path.empty()) {
+        return false;
+    }
+    const auto below = quivra::base::Subtree(roots_, path);
+    return roots_.contains(path) || below.first != below.second;
 }
 
 void Monitor::OnRootComplete(const std::string& path) {
@@ -309,6 +393,9 @@ void Monitor::OnRootComplete(const std::string& path) {
     watched_.SetMountPoint(path, root.mount_point);
     watched_.Save();
     queues_.OnRootComplete(path, Clock::now());
+    for (const std::string& uncovered : std::exchange(root.uncovered, {})) {
+        OnChange({Change::Kind::kReindex, true, uncovered});
+    }
 }
 
 void Monitor::OnGaps(const std::string& root) {

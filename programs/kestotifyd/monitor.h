@@ -7,6 +7,8 @@
 #include <set>
 #include <string>
 
+#include <json/json.h>
+
 #include "base/unique_fd.h"
 #include "programs/daemon/service_manager.h"
 #include "programs/daemon/signals.h"
@@ -14,13 +16,14 @@
 #include "programs/kestotifyd/mount_table.h"
 #include "programs/kestotifyd/options.h"
 #include "programs/kestotifyd/queue_set.h"
+#include "programs/kestotifyd/state_server.h"
 #include "programs/kestotifyd/watched_folders.h"
 
 namespace kestotifyd {
 
 /// The file monitor: follows the registrations, keeps each registered folder watched by the best
-/// back end that its file system offers, and hands what happens to the queues. One thread, one
-/// epoll loop.
+/// back end that its file system offers, hands what happens to the queues, and tells how it is. One
+/// thread, one epoll loop.
 class Monitor : private BackendSink {
   public:
     /// Takes the lock that only one monitor holds. Throws Error 506 when another one runs, 502 when
@@ -40,8 +43,12 @@ class Monitor : private BackendSink {
         std::uint64_t device = 0;
         std::uint64_t inode = 0;
         std::string mount_point{};
-        bool is_failure_logged = false;
+        std::string problem{};              ///< why it is not watched, in one sentence
+        std::set<std::string> uncovered{};  ///< directories that no mount hides any more; a reindex
+                                            ///< of each is due when the root is complete
     };
+
+    using Roots = std::map<std::string, Root>;
 
     void OnChange(const Change& change) override;
     void OnRootComplete(const std::string& root) override;
@@ -55,10 +62,14 @@ class Monitor : private BackendSink {
     void HandleMountChange();
     void UpdateRoots();
     void CheckRoots();
-    bool IsPresent(const std::string& path) const;
+    std::string WhyAbsent(const std::string& path) const;
     void StartRoot(const std::string& path, Root& root);
     Backend* AddToBackend(const std::string& path);
     void DropObsoleteRoots();
+    Roots::iterator InnermostRoot(const std::string& path);
+    bool HoldsRoot(const std::string& path) const;
+    Json::Value State() const;
+    Json::Value StateOf(const QueueSet::State& queue) const;
     void WorkBackends(bool is_last);
     int WaitMilliseconds(Time now) const;
     void Stop();
@@ -72,10 +83,14 @@ class Monitor : private BackendSink {
     MountTable mounts_;
     WatchedFolders watched_;
     QueueSet queues_;
+    std::unique_ptr<StateServer> state_server_;  ///< null when its socket could not be made
     std::unique_ptr<Backend> inotify_;
     std::unique_ptr<Backend> fanotify_;
-    std::map<std::string, Root> roots_;
+    Roots roots_;
     std::set<std::string> wanted_roots_;  ///< roots_ holds others until they are replaced
+    std::string registration_problem_;
+    bool are_registrations_due_ = false;  ///< some could not be read
+    std::optional<Time> last_event_;
     Time next_check_{};
     bool are_roots_stale_ = false;  ///< CheckRoots has something to do before next_check_
 };

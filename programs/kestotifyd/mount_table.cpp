@@ -52,6 +52,7 @@ MountTable::MountTable() : fd_(open(kMountInfo, O_RDONLY | O_CLOEXEC)) {
         quivra::LogError({"mount_table", __LINE__}, "Cannot read %s", kMountInfo);
     }
     Reload();
+    changes_ = {};
 }
 
 void MountTable::Reload() {
@@ -67,7 +68,9 @@ void MountTable::Reload() {
         }
     }
     std::set_difference(points_.begin(), points_.end(), points.begin(), points.end(),
-                        std::inserter(removed_, removed_.end()));
+                        std::inserter(changes_.removed, changes_.removed.end()));
+    std::set_difference(points.begin(), points.end(), points_.begin(), points_.end(),
+                        std::inserter(changes_.added, changes_.added.end()));
     points_ = std::move(points);
 }
 

@@ -19,8 +19,12 @@ class MountTable {
     /// Reads the table again.
     void Reload();
 
-    /// The mount points that have gone since the last call.
-    std::set<std::string> TakeRemoved() { return std::exchange(removed_, {}); }
+    /// The mount points that have come and gone since the last call.
+    struct Changes {
+        std::set<std::string> added{};
+        std::set<std::string> removed{};
+    };
+    Changes TakeChanges() { return std::exchange(changes_, {}); }
 
     bool IsMountPoint(const std::string& path) const { return points_.contains(path); }
 
@@ -34,7 +38,7 @@ class MountTable {
   private:
     quivra::base::UniqueFd fd_;
     std::set<std::string> points_;
-    std::set<std::string> removed_;
+    Changes changes_;
 };
 
 }  // namespace kestotifyd

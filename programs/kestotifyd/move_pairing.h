@@ -39,6 +39,9 @@ class MovePairing {
     /// The next event in order; none when all are handed out or the first one still waits.
     std::optional<Paired> Pop(Time now);
 
+    /// Whether so much waits that no more should be read.
+    bool IsFull() const { return waiting_.size() > kMaxWaiting; }
+
     /// When the waiting first half gives up; none when nothing waits.
     std::optional<Time> NextDue() const;
 

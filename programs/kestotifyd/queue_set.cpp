@@ -123,6 +123,14 @@ std::set<QueueSet::Queue*> QueueSet::Concerned(const Change& change) const {
     return concerned;
 }
 
+std::vector<QueueSet::State> QueueSet::States() const {
+    std::vector<State> states;
+    for (const auto& [path, queue] : queues_) {
+        states.push_back({queue.translator->GetRegistration(), queue.writer->Problem()});
+    }
+    return states;
+}
+
 bool QueueSet::Covers(const std::string& path) const {
     std::set<Queue*> concerned;
     AddConcerned(path, concerned);

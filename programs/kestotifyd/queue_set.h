@@ -33,6 +33,13 @@ class QueueSet {
     /// The registered folders that lie in no other one.
     std::set<std::string> OutermostFolders() const;
 
+    /// What can be told about a registration.
+    struct State {
+        const Registration& registration;
+        const std::string& problem;  ///< why its queue cannot be written; empty when it can
+    };
+    std::vector<State> States() const;
+
     bool Covers(const std::string& path) const;
     void Apply(const Change& change, Time now);
 

@@ -1,24 +1,26 @@
 #include "programs/kestotifyd/registration.h"
 
-#include <sys/stat.h>
+#include <dirent.h>
+#include <fcntl.h>
 
-#include <algorithm>
 #include <cerrno>
-#include <filesystem>
+#include <memory>
 #include <set>
-#include <system_error>
+#include <utility>
 
+#include "base/file.h"
 #include "base/path.h"
 #include "common/error.h"
 #include "common/json.h"
 #include "common/log.h"
+#include "programs/kestotifyd/backend.h"
 
 namespace kestotifyd {
 namespace {
 
 using quivra::Error;
 
-constexpr std::uintmax_t kMaxFileSize = 16U << 20;
+constexpr std::size_t kMaxFileSize = 16U << 20;
 
 std::string ReadPath(const Json::Value& value) {
     if (!value.isString() || !quivra::base::IsCanonicalText(value.asString())) {
@@ -41,15 +43,41 @@ std::vector<std::string> ReadNames(const Json::Value& config) {
     return names;
 }
 
-std::string ReadLimited(const std::filesystem::path& path, Json::Value& description) {
-    std::error_code error;
-    if (!std::filesystem::is_regular_file(path, error)) {
-        return "not a regular file";
+/// Why the file is no registration; empty when it is one.
+std::string ReadOne(int directory, const std::string& name, Registration& registration) {
+    const quivra::base::UniqueFd file = quivra::base::OpenRegular(directory, name, O_RDONLY);
+    std::string text;
+    if (!file.IsValid() || !quivra::base::ReadUpTo(file.Get(), kMaxFileSize + 1, text)) {
+        return quivra::SystemErrorText(errno);
     }
-    if (std::filesystem::file_size(path, error) > kMaxFileSize) {
-        return "too large";
+    errno = 0;
+    Json::Value description;
+    if (text.size() > kMaxFileSize || !quivra::fromString(description, text)) {
+        return "it is not JSON text of at most 16 MiB";
     }
-    return quivra::fromFile(description, path.string()) ? "" : "not readable as JSON";
+    try {
+        registration = ParseRegistration(description);
+    } catch (const Error& malformed) {
+        return malformed.reason;
+    }
+    return std::string();
+}
+
+/// False, with errno set, when the names are not all known.
+bool ListFiles(int directory, std::set<std::string>& names) {
+    const int fd = openat(directory, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+    const std::unique_ptr<DIR, int (*)(DIR*)> listing(fd < 0 ? nullptr : fdopendir(fd), closedir);
+    if (!listing) {
+        return false;
+    }
+    errno = 0;
+    while (const dirent* const entry = readdir(listing.get())) {
+        const std::string name = entry->d_name;
+        if (name.front() != '.' && quivra::base::Extension(name) == "json") {
+            names.insert(name);
+        }
+    }
+    return errno == 0;
 }
 
 }  // namespace
@@ -77,36 +105,30 @@ Registration ParseRegistration(const Json::Value& description) {
     return registration;
 }
 
-std::map<std::string, Registration> ReadRegistrations(const std::string& directory) {
-    std::map<std::string, Registration> found;
-    std::set<std::string> queues;
-    std::vector<std::filesystem::path> files;
-    std::error_code error;
-    for (std::filesystem::directory_iterator it(directory, error), end; !error && it != end;
-         it.increment(error)) {
-        if (it->path().extension() == ".json" && it->path().filename().string().front() != '.') {
-            files.push_back(it->path());
-        }
+Registrations ReadRegistrations(const std::string& directory) {
+    Registrations found;
+    std::set<std::string> names;
+    const quivra::base::UniqueFd fd(open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    if (!fd.IsValid() || !ListFiles(fd.Get(), names)) {
+        found.problem = "Cannot read " + directory + ": " + quivra::SystemErrorText(errno);
+        found.is_whole = false;
+        return found;
     }
-    std::sort(files.begin(), files.end());
-    for (const std::filesystem::path& file : files) {
-        Json::Value description;
-        std::string problem = ReadLimited(file, description);
-        try {
-            if (problem.empty()) {
-                Registration registration = ParseRegistration(description);
-                if (queues.insert(registration.queue).second) {
-                    found.emplace(file.filename().string(), std::move(registration));
-                    continue;
-                }
-                problem = "another file registers the queue " + registration.queue;
-            }
-        } catch (const Error& malformed) {
-            problem = malformed.reason;
+    std::set<std::string> queues;
+    for (const std::string& name : names) {
+        Registration registration;
+        std::string problem = ReadOne(fd.Get(), name, registration);
+        found.is_whole &= problem.empty() || !IsShortage(errno);
+        if (problem.empty() && !queues.insert(registration.queue).second) {
+            problem = "another file registers the queue " + registration.queue;
         }
+        if (problem.empty()) {
+            found.list.push_back(std::move(registration));
+            continue;
+        }
+        found.problem = "Registration " + directory + "/" + name + " skipped: " + problem;
         errno = 0;
-        quivra::LogError({"registration", __LINE__}, "Registration %s skipped: %s", file.c_str(),
-                         problem.c_str());
+        quivra::LogError({"registration", __LINE__}, "%s", found.problem.c_str());
     }
     return found;
 }

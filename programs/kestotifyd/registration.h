@@ -3,7 +3,6 @@
 #include <json/json.h>
 
 #include <cstdint>
-#include <map>
 #include <string>
 #include <vector>
 
@@ -24,8 +23,14 @@ struct Registration {
 /// absolute (one leading "/", no doubled or trailing one, no "." or ".." component).
 Registration ParseRegistration(const Json::Value& description);
 
-/// All registrations of the directory, by file name: every "*.json" file is one. A malformed or
-/// unreadable file is logged and left out. Of several files for one queue, the first counts.
-std::map<std::string, Registration> ReadRegistrations(const std::string& directory);
+struct Registrations {
+    std::vector<Registration> list{};
+    std::string problem{};  ///< about a file that was left out, in one sentence
+    bool is_whole = true;   ///< false: the directory or a file could not be read for now
+};
+
+/// All registrations of the directory, in the order of the file names: every "*.json" file is one.
+/// A malformed file is logged and left out. Of several files for one queue, the first counts.
+Registrations ReadRegistrations(const std::string& directory);
 
 }  // namespace kestotifyd

@@ -3,6 +3,8 @@
 #include <algorithm>
 #include <utility>
 
+#include "base/path.h"
+
 namespace kestotifyd {
 
 const WatchNode& WatchNode::Root() const {
@@ -14,6 +16,8 @@ const WatchNode& WatchNode::Root() const {
 }
 
 std::string WatchNode::Path() const {
+    // Made anew for each event: a path kept in each node would have to be renewed in every node
+    // below when a directory is renamed.
     std::vector<const WatchNode*> chain;
     for (const WatchNode* node = this; node != nullptr; node = node->parent) {
         chain.push_back(node);
@@ -29,11 +33,7 @@ std::string WatchNode::Path() const {
 }
 
 std::string WatchNode::PathOf(const std::string& entry) const {
-    std::string path = Path();
-    if (path.back() != '/') {
-        path += '/';
-    }
-    return path + entry;
+    return quivra::base::Join(Path(), entry);
 }
 
 WatchNode* WatchNode::Child(const std::string& entry) const {
@@ -66,6 +66,7 @@ void WatchTree::Register(WatchNode& node, int wd) {
     by_wd_.emplace(wd, &node);
 }
 
+/// A watch goes only with its last node: the kernel has one for all ways to a directory.
 void WatchTree::Unregister(WatchNode& subtree, std::vector<int>& unused) {
     std::vector<WatchNode*> pending{&subtree};
     while (!pending.empty()) {
@@ -95,6 +96,8 @@ std::vector<int> WatchTree::Remove(WatchNode& node) {
     return unused;
 }
 
+/// Not all that this frees lies below the new place's old node when the tree is behind the disk: it
+/// may be where the moved node came from. So the node is taken out first.
 std::vector<int> WatchTree::Move(WatchNode& node, WatchNode& new_parent,
                                  const std::string& new_entry) {
     std::vector<int> unused;
@@ -135,6 +138,25 @@ std::vector<WatchNode*> WatchTree::Find(int wd) const {
     const auto [begin, end] = by_wd_.equal_range(wd);
     std::for_each(begin, end, [&](const auto& entry) { nodes.push_back(entry.second); });
     return nodes;
+}
+
+bool WatchTree::IsAlive(const NodeRef& ref) const {
+    const auto [begin, end] = by_wd_.equal_range(ref.wd);
+    return std::any_of(begin, end, [&](const auto& entry) { return entry.second == ref.node; });
+}
+
+std::size_t WatchTree::Count(const WatchNode& node) {
+    std::size_t count = 0;
+    std::vector<const WatchNode*> pending{&node};
+    while (!pending.empty()) {  // no recursion: trees are as deep as a path is long
+        const WatchNode* const next = pending.back();
+        pending.pop_back();
+        ++count;
+        for (const auto& [name, child] : next->children) {
+            pending.push_back(child.get());
+        }
+    }
+    return count;
 }
 
 }  // namespace kestotifyd

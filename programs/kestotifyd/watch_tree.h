@@ -23,6 +23,13 @@ struct WatchNode {
     WatchNode* Child(const std::string& entry) const;
 };
 
+/// A node that may be gone by the time it is looked at: keep this instead of a pointer over
+/// whatever removes or moves nodes, which may be any event and any scan.
+struct NodeRef {
+    WatchNode* node;
+    int wd;
+};
+
 /// The watched directories of one inotify instance, by place and by watch descriptor. One watch can
 /// stand for several nodes, because the kernel has one watch per directory however many ways (bind
 /// mounts, overlapping roots) lead to it. Pure bookkeeping: no system calls.
@@ -41,7 +48,11 @@ class WatchTree {
     WatchNode* FindRoot(const std::string& path) const;
     std::vector<std::string> RootPaths() const;
     std::vector<WatchNode*> Find(int wd) const;
+    bool IsAlive(const NodeRef& ref) const;
     std::size_t WatchCount() const { return watch_count_; }
+
+    /// How many directories are watched at and below the node.
+    static std::size_t Count(const WatchNode& node);
 
   private:
     void Register(WatchNode& node, int wd);

@@ -1,4 +1,5 @@
 #include <gtest/gtest.h>
+#include <sys/fanotify.h>
 #include <sys/inotify.h>
 
 #include <algorithm>
@@ -8,6 +9,7 @@
 #include <vector>
 
 #include "common/json.h"
+#include "programs/kestotifyd/fanotify_translation.h"
 #include "programs/kestotifyd/inotify_translation.h"
 #include "programs/kestotifyd/move_pairing.h"
 #include "programs/kestotifyd/queue_translator.h"
@@ -63,7 +65,7 @@ class TranslationTest : public testing::Test {
                 translator_.Apply(change, now_);
             }
             for (const auto& appeared : outcome.appeared) {
-                appeared_.push_back(appeared.parent->PathOf(appeared.name));
+                appeared_.push_back(appeared.parent.node->PathOf(appeared.name));
             }
             unused_.insert(unused_.end(), outcome.unused_watches.begin(),
                            outcome.unused_watches.end());
@@ -210,6 +212,26 @@ TEST_F(TranslationTest, ADirectoryThatAppearsIsScannedFirst) {
     EXPECT_EQ(Advance(milliseconds(0)), Lines{"create dir /r/d/sub"});
 }
 
+/// One directory may be known at two places, the one below the other, while the tree is behind the
+/// disk. Then what is done for the one drops the other.
+TEST_F(TranslationTest, NodesThatAnEventDropsAreNotUsedForIt) {
+    WatchNode* const root = tree_.FindRoot("/r");
+    WatchNode* const e = root->Child("e");
+    tree_.AddChild(*e, "inner", 20);
+    WatchNode* const outer = tree_.AddChild(*root, "outer", 20);
+    tree_.Move(*e, *outer, "e");
+    ASSERT_EQ(tree_.Find(20).front(), outer) << "the order that does it";
+    Feed({20, IN_DELETE | kDir, 0, "e"});
+    EXPECT_EQ(Advance(milliseconds(0)), Lines{"delete dir /r/outer/e"});
+    EXPECT_EQ(WatchTree::Count(*root), 4U);
+}
+
+TEST_F(TranslationTest, AnExchangeHasBothPlacesLookedAt) {
+    Feed({1, IN_MOVED_FROM | kDir, 7, "d"});
+    Feed({1, IN_MOVED_TO | kDir, 7, "e"});
+    EXPECT_EQ(appeared_, (Lines{"/r/e", "/r/d"}));
+}
+
 TEST_F(TranslationTest, ADirectorySeenTwiceIsReportedAtBothPlaces) {
     WatchNode* const mirror = tree_.AddRoot("/q/mirror", 1);
     tree_.AddChild(*mirror, "d", 2);
@@ -234,6 +256,63 @@ TEST_F(MaskTest, LimitsChangesButNotRepairs) {
     translator_.Apply({Change::Kind::kCrashed, true, "/r"}, now_);
     translator_.Apply({Change::Kind::kReindex, true, "/r"}, now_);
     EXPECT_EQ(Advance(seconds(9)), (Lines{"create /r/f", "crash dir /r", "reindex dir /r"}));
+}
+
+/// Directories of one mount by handle; what is not in the table is gone.
+class FanotifyTest : public testing::Test {
+  protected:
+    Lines Feed(unsigned mask, const std::string& target, const FanotifyEvent::Place& from,
+               const FanotifyEvent::Place& to) {
+        FanotifyEvent event;
+        event.mask = mask;
+        event.target = target;
+        (mask == (FAN_RENAME | FAN_ONDIR) ? event.old_place : event.place) = from;
+        event.new_place = to;
+        Lines lines;
+        const auto lookup = [&](const std::string& handle) { return paths_.Find(handle); };
+        for (const Change& change : TranslateFanotify(event, paths_, lookup)) {
+            const char* const kind = change.kind == Change::Kind::kRenamed   ? "rename "
+                                     : change.kind == Change::Kind::kReindex ? "reindex "
+                                     : change.kind == Change::Kind::kCreated ? "create "
+                                                                             : "other ";
+            lines.push_back(kind + change.path +
+                            (change.path_old.empty() ? "" : " <- " + change.path_old));
+        }
+        return lines;
+    }
+    Lines Rename(const std::string& target, const FanotifyEvent::Place& from,
+                 const FanotifyEvent::Place& to) {
+        return Feed(FAN_RENAME | FAN_ONDIR, target, from, to);
+    }
+
+    HandlePaths paths_;
+};
+
+TEST_F(FanotifyTest, KnownPathsFollowRenames) {
+    paths_.Set("R", "/r");
+    EXPECT_EQ(Feed(FAN_CREATE | FAN_ONDIR, "A", {"R", "a"}, {}), Lines{"create /r/a"});
+    EXPECT_EQ(Feed(FAN_CREATE | FAN_ONDIR, "B", {"A", "b"}, {}), Lines{"create /r/a/b"});
+    EXPECT_EQ(Rename("A", {"R", "a"}, {"R", "c"}), Lines{"rename /r/c <- /r/a"});
+    EXPECT_EQ(paths_.Find("B"), "/r/c/b");
+    EXPECT_EQ(Rename("A", {"R", "c"}, {"gone", "c"}), Lines{"other /r/c"});
+    EXPECT_EQ(paths_.Find("B"), "");
+    EXPECT_FALSE(paths_.IsAhead());
+    EXPECT_GT(paths_.Size(), 0U);
+}
+
+/// Merged events can look like that. Each one made the paths below it longer, without end.
+TEST_F(FanotifyTest, NothingMovesBelowItself) {
+    paths_.Set("R", "/r");
+    paths_.Set("A", "/r/a");
+    paths_.Set("B", "/r/a/b");
+    EXPECT_EQ(Rename("A", {"R", "a"}, {"B", "x"}), Lines{"reindex /r/a"});
+    EXPECT_TRUE(paths_.IsAhead());
+    EXPECT_EQ(paths_.Size(), 0U);
+    paths_.Settle();
+    paths_.Set("R", "/r");
+    paths_.Set("A", "/r/a");
+    EXPECT_EQ(Rename("B", {"A", "b"}, {"R", "a"}), Lines{"reindex /r/a"});
+    EXPECT_TRUE(paths_.IsAhead());
 }
 
 TEST(RegistrationTest, MalformedOnesAreRefused) {
