@@ -53,31 +53,6 @@ std::string Suggestion(CLI::App& group, const std::string& typed) {
     return nearest.empty() ? "" : "; did you mean '" + nearest + "'?";
 }
 
-/// The parser would only say that an argument was not expected.
-void RequireKnownCommands(CLI::App& root, const std::vector<std::string>& arguments) {
-    constexpr std::size_t kLongestTyped = 64;  // beyond, it is no slip of the fingers
-    CLI::App* group = &root;
-    std::string call = "fileindexctl";
-    for (const std::string& argument : arguments) {
-        if (group->get_require_subcommand_min() == 0) {
-            return;
-        }
-        if (argument.empty() || argument[0] == '-') {
-            continue;
-        }
-        const auto commands = group->get_subcommands(
-            [&argument](const CLI::App* app) { return app->get_name() == argument; });
-        if (commands.empty()) {
-            const std::string suggestion =
-                argument.size() > kLongestTyped ? "" : Suggestion(*group, argument);
-            throw WrongCall("there is no command '" + argument + "'" +
-                            (suggestion.empty() ? "; see '" + call + " --help'" : suggestion));
-        }
-        group = commands.front();
-        call += " " + argument;
-    }
-}
-
 }  // namespace
 
 CommandLine::CommandLine()
@@ -126,8 +101,33 @@ void CommandLine::OnCommand(CLI::App& command, Action action, Rights rights) {
         [this, chosen = Chosen{name, std::move(action), rights}] { chosen_ = chosen; });
 }
 
+std::string CommandLine::CallOf(const std::vector<std::string>& arguments) {
+    constexpr std::size_t kLongestTyped = 64;  // beyond, it is no slip of the fingers
+    CLI::App* group = &root_;
+    std::string call = "fileindexctl";
+    for (const std::string& argument : arguments) {
+        if (group->get_require_subcommand_min() == 0) {
+            break;
+        }
+        if (argument.empty() || argument[0] == '-') {
+            continue;
+        }
+        const auto commands = group->get_subcommands(
+            [&argument](const CLI::App* app) { return app->get_name() == argument; });
+        if (commands.empty()) {
+            const std::string suggestion =
+                argument.size() > kLongestTyped ? "" : Suggestion(*group, argument);
+            throw WrongCall("there is no command '" + argument + "'" +
+                            (suggestion.empty() ? "; see '" + call + " --help'" : suggestion));
+        }
+        group = commands.front();
+        call += " " + argument;
+    }
+    return call;
+}
+
 Chosen CommandLine::Parse(const std::vector<std::string>& arguments) {
-    RequireKnownCommands(root_, arguments);
+    CallOf(arguments);  // the parser would only say that an argument was not expected
     std::vector<std::string> reversed = TakeSearchWords(*this, arguments);
     std::reverse(reversed.begin(), reversed.end());  // the form that the parser asks for
     root_.parse(reversed);

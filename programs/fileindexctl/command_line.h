@@ -44,6 +44,10 @@ class CommandLine {
     /// request for help and for a wrong call, WrongCall for a command that there is not.
     Chosen Parse(const std::vector<std::string>& arguments);
 
+    /// The command that the arguments name, "fileindexctl folder add", as far as they do. Throws
+    /// WrongCall, with the nearest command, for one that there is not.
+    std::string CallOf(const std::vector<std::string>& arguments);
+
     bool WantsJson() const { return json_; }
 
     /// The words of a search, see TakeSearchWords.

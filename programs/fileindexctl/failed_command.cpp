@@ -36,6 +36,10 @@ Json::Value AskIndexer(const std::string& question, const std::string& share) {
     Json::Value data(Json::objectValue);
     data["share"] = share;
     const DaemonState state = AskDaemon(kIndexer, question, data);
+    if (state.reach == DaemonState::Reach::kRefused) {
+        throw Failure("fileindexd does not know share " + share +
+                      ", or is of another version; 'service pkg-Quivra-fileindexd restart' helps");
+    }
     if (state.reach != DaemonState::Reach::kReplied) {
         throw Failure(DescribeProblem(kIndexer, state));
     }

@@ -14,10 +14,10 @@
 #include "fileindex/status_mgr.h"
 #include "fileindex/util.h"
 #include "programs/fileindexctl/command_line.h"
-#include "programs/fileindexctl/folder_status.h"
 #include "programs/fileindexctl/output.h"
 #include "programs/fileindexctl/paths.h"
 #include "programs/fileindexctl/shares.h"
+#include "programs/fileindexctl/status.h"
 #include "programs/fileindexctl/table.h"
 #include "programs/fileindexctl/text.h"
 #include "programs/fileindexctl/waiting.h"
@@ -137,7 +137,7 @@ int Get(const Options& options, Session& session) {
     const std::string path = FolderPath(options.path);
     Json::Value folder;
     fileindex::FolderGet(folder, path);
-    folder["additional"]["status"] = FolderStatus(fileindex::Folder(folder));
+    folder["additional"]["status"] = TakeStatus().OfFolder(path);
     if (session.json) {
         session.out << toString(folder) << "\n";
         return kSuccess;
@@ -155,8 +155,7 @@ void PrintList(const Json::Value& list, Session& session) {
     std::vector<std::vector<std::string>> rows = {{"PATH", "NAME", "CONTENT", "STATUS"}};
     for (const Json::Value& folder : list["folder"]) {
         rows.push_back({folder["path"].asString(), folder["name"].asString(), Contents(folder),
-                        StatusText(folder["additional"]["status"]) +
-                            (folder["paused"].asBool() ? " (share paused)" : "")});
+                        StatusText(folder["additional"]["status"])});
     }
     if (rows.size() > 1) {
         PrintTable(session, rows);
@@ -176,8 +175,9 @@ int List(const ListOptions& options, Session& session) {
     fileindex::FolderList(list, options.offset, options.limit,
                           options.sort.substr(descending ? 1 : 0), descending ? "desc" : "asc",
                           Json::Value(Json::arrayValue));
+    const Status status = TakeStatus();
     for (Json::Value& folder : list["folder"]) {
-        folder["additional"]["status"] = FolderStatus(fileindex::Folder(folder));
+        folder["additional"]["status"] = status.OfFolder(folder["path"].asString());
     }
     if (session.json) {
         session.out << toString(list) << "\n";

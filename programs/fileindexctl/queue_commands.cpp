@@ -17,19 +17,22 @@ namespace {
 
 using fileindex::OP;
 
+std::string DescribeErrno() {
+    return errno == EACCES ? "permission denied, run it as root" : SystemErrorText(errno);
+}
+
 /// What can be opened and is not a file would count as an empty queue, or never end.
 void RequireFile(const std::string& path) {
     struct stat status {};
     if (stat(path.c_str(), &status) != 0) {
-        throw Failure("cannot read the queue " + path + ": " + SystemErrorText(errno));
+        throw Failure("cannot read the queue " + path + ": " + DescribeErrno());
     }
     if (!S_ISREG(status.st_mode)) {
         throw Failure("cannot read the queue " + path + ": it is " +
                       (S_ISDIR(status.st_mode) ? "a directory" : "not a file"));
     }
     if (access(path.c_str(), R_OK) != 0) {
-        throw Failure("cannot read the queue " + path + ": " + SystemErrorText(errno) +
-                      (errno == EACCES ? ", run it as root" : ""));
+        throw Failure("cannot read the queue " + path + ": " + DescribeErrno());
     }
 }
 

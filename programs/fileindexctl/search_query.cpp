@@ -117,7 +117,7 @@ double ParseBound(const Field& field, const std::string& text, bool next_day) {
                                                                         : std::nullopt;
     }
     if (!value) {
-        throw WrongCall("'" + text + "' is no " +
+        throw WrongCall("'" + text + "' is not a " +
                         (field.kind == FieldKind::kDate ? "date like 2024-12-31" : "number"));
     }
     return *value;

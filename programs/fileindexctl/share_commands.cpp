@@ -35,7 +35,12 @@ struct Operation {
     std::function<void(const std::string&, const std::string&)> call;
     /// The library changes the set of folders here without the lock that guards it.
     bool under_lock = false;
+    /// The library saves the change first: after a failure to tell a daemon it stands.
+    bool saves_first = false;
 };
+
+constexpr const char* kSavedFirst =
+    " to the end (the folders are marked; do it again once all daemons run)";
 
 std::function<void(const std::string&, const std::string&)> OnFirst(
     void (*call)(const std::string&)) {
@@ -55,9 +60,15 @@ std::string LowerCase(std::string text) {
 }
 
 int RunOperation(const Operation& operation, const Arguments& arguments, Session& session) {
+    if (arguments.first.empty() || (operation.second != nullptr && arguments.second.empty())) {
+        throw WrongCall(std::string(arguments.first.empty() ? operation.first : operation.second) +
+                        " is empty");
+    }
     session.doing = std::string(operation.doing) + " " + arguments.first;
-    {
+    const std::string doing = session.doing;
+    try {
         const Silence silence;
+        session.doing += operation.saves_first ? kSavedFirst : "";
         WaitFor(session, Needs::kBothDaemons, [operation, arguments] {
             std::optional<LockFile> lock;
             if (operation.under_lock) {
@@ -65,6 +76,11 @@ int RunOperation(const Operation& operation, const Arguments& arguments, Session
             }
             operation.call(arguments.first, arguments.second);
         });
+    } catch (const Error& error) {
+        // What fails without a daemon fails before the save.
+        const bool is_saved = IsIndexerAway(error) || error.code == Error::kChannelFailed;
+        session.doing = is_saved ? session.doing : doing;
+        throw;
     }
     if (session.json) {
         Json::Value result(Json::objectValue);
@@ -174,10 +190,10 @@ const std::vector<Operation>& VolumeOperations() {
     static const std::vector<Operation> operations = {
         {"pause", "Stop indexing the shares of a volume, before it is unmounted or checked",
          "fileindexctl volume pause /volume1", "MOUNT_POINT", "Where the volume is mounted",
-         nullptr, nullptr, "pause volume", "Paused volume", OnFirst(PauseVolume), true},
+         nullptr, nullptr, "pause volume", "Paused volume", OnFirst(PauseVolume), true, true},
         {"resume", "Index the shares of a volume again", "fileindexctl volume resume /volume1",
          "MOUNT_POINT", "Where the volume is mounted", nullptr, nullptr, "resume volume",
-         "Resumed volume", OnFirst(ResumeVolume), true},
+         "Resumed volume", OnFirst(ResumeVolume), true, true},
         {"clear", "Forget the paused folders of a volume that is gone",
          "fileindexctl volume clear /volume1", "MOUNT_POINT", "Where the volume was mounted",
          nullptr, nullptr, "clear volume", "Cleared volume", OnFirst(ClearVolume), true},

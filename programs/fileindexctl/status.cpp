@@ -15,7 +15,6 @@
 #include "fileindex/folder_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "programs/fileindexctl/error_text.h"
-#include "programs/fileindexctl/folder_status.h"
 #include "programs/fileindexctl/search.h"
 #include "programs/fileindexctl/shares.h"
 #include "sdk/share.h"
@@ -63,6 +62,20 @@ Json::Value Find(const Json::Value& list, const char* member, const std::string&
         }
     }
     return Json::Value();
+}
+
+/// What the library says of the folder. A failure to tell is told as an error, so that one bad
+/// folder does not hide the others.
+Json::Value FolderStatus(const fileindex::Folder& folder) {
+    Json::Value status(Json::objectValue);
+    try {
+        folder.GetStatus(status);
+    } catch (const Error& error) {
+        status["text"] = "error";
+        status["desc"] =
+            error.code == Error::kNoSuchShare ? "its share is gone" : DescribeCause(error);
+    }
+    return status;
 }
 
 void AddProblem(ShareLine& share, const std::string& problem) {
@@ -136,13 +149,16 @@ std::string FirstProblem(const ShareLine& share, const Status& status) {
 
 /// The library sees the queue alone: an empty one is "finished" to it, whoever should fill it.
 void Correct(FolderLine& folder, const ShareLine& share, const Status& status) {
-    if (folder.status["text"] != "finished") {
+    const std::string text = folder.status["text"].asString();
+    if (folder.paused && text != "error") {
+        folder.status["text"] = "paused";
+        folder.status["desc"] = "with its share";
+    }
+    if (folder.paused || text != "finished") {
         return;
     }
     const std::string problem = FirstProblem(share, status);
-    if (folder.paused) {
-        folder.status["text"] = "paused";
-    } else if (share.made_anew) {
+    if (share.made_anew) {
         folder.status["text"] = "processing";
         folder.status["desc"] = "its index was damaged or missing and is made anew";
     } else if (!problem.empty()) {
@@ -277,6 +293,17 @@ Status TakeStatus() {
         Correct(line, status.shares[lines[folder->GetShare()]], status);
     }
     return status;
+}
+
+std::string StatusText(const Json::Value& status) {
+    const std::string description = status["desc"].asString();
+    return status["text"].asString() + (description.empty() ? "" : ": " + description);
+}
+
+Json::Value Status::OfFolder(const std::string& path) const {
+    const auto found = std::find_if(folders.begin(), folders.end(),
+                                    [&path](const FolderLine& line) { return line.path == path; });
+    return found == folders.end() ? Json::Value(Json::objectValue) : found->status;
 }
 
 Json::Value ToJson(const Status& status) {

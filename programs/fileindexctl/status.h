@@ -43,8 +43,8 @@ struct FolderLine {
     std::string path;
     std::string name;
     bool paused = false;
-    /// See FolderStatus, but never "finished" while a change could go unnoticed or lost: then
-    /// "incomplete", with the reason as "desc".
+    /// {"text": ..., "desc": ...} as of Folder::GetStatus, but never "finished" while a change
+    /// could go unnoticed or be lost: then "incomplete", with the reason as "desc".
     Json::Value status;
 };
 
@@ -62,6 +62,8 @@ struct Status {
     bool IsFinished() const;
     /// All daemons take requests.
     bool AreDaemonsUp() const { return indexer.IsUp() && search.IsUp() && monitor.IsUp(); }
+    /// The "status" of the folder with this share path.
+    Json::Value OfFolder(const std::string& path) const;
     /// Something is not as it should be. Where no folder is chosen, nothing needs to run.
     bool HasProblem() const;
 };
@@ -78,5 +80,8 @@ Status TakeStatus();
 ShareLine TakeShareLine(const std::string& share, bool is_paused, const Status& status);
 
 Json::Value ToJson(const Status& status);
+
+/// A folder's status for people: "finished", "error: invalid_path".
+std::string StatusText(const Json::Value& status);
 
 }  // namespace quivra::ctl

@@ -9,7 +9,6 @@
 #include "common/json.h"
 #include "fileindex/status_mgr.h"
 #include "programs/fileindexctl/command_line.h"
-#include "programs/fileindexctl/folder_status.h"
 #include "programs/fileindexctl/status.h"
 #include "programs/fileindexctl/table.h"
 #include "programs/fileindexctl/text.h"
@@ -75,8 +74,7 @@ void PrintShare(const ShareLine& share, Session& session) {
 void PrintFolders(const Status& status, Session& session) {
     std::vector<std::vector<std::string>> rows = {{"FOLDER", "NAME", "STATUS"}};
     for (const FolderLine& folder : status.folders) {
-        rows.push_back({folder.path, folder.name,
-                        StatusText(folder.status) + (folder.paused ? " (share paused)" : "")});
+        rows.push_back({folder.path, folder.name, StatusText(folder.status)});
     }
     PrintTable(session, rows);
 }

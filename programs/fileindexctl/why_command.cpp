@@ -53,6 +53,7 @@ struct Report {
     Place place;
     std::vector<fileindex::PathFinding> findings;
     std::shared_ptr<fileindex::Folder> folder;  ///< null: none governs the path
+    bool is_share_indexed = false;              ///< some folder lies in the share
     bool is_directory = false;
     bool needs_metadata = false;
     bool needs_reindex = false;
@@ -117,6 +118,10 @@ void AskDaemons(Report& report) {
     report.system = TakeDaemons();
     report.share = TakeShareLine(
         report.place.share, report.folder == nullptr || report.folder->GetPaused(), report.system);
+    if (!report.is_share_indexed) {
+        report.in_index = {false, ""};
+        return;
+    }
     if (!report.system.search.IsUp()) {
         report.in_index = {std::nullopt, DescribeProblem(kSearchDaemon, report.system.search)};
         return;
@@ -134,6 +139,7 @@ Report Examine(const Place& place) {
     report.is_directory = IsDirectory(place);
     const fileindex::FolderMgr folders;
     report.folder = folders.GetMostSuitableCfg(place.full_path);
+    report.is_share_indexed = folders.IsShareIndexed(place.share);
     report.needs_metadata = folders.IsFullPathNeedMeta(place.full_path);
     report.needs_reindex =
         (fileindex::StatusMgr().GetShareStatus(place.share) & fileindex::kShareNeedReindex) != 0;
@@ -163,6 +169,11 @@ std::string VerdictOfRules(const Report& report) {
     if (report.folder == nullptr) {
         return "It is not indexed: no folder covers it; 'fileindexctl folder add' with it or a "
                "folder above it.";
+    }
+    if (!report.is_share_indexed) {
+        return "It is not indexed: it lies in share " + report.place.share +
+               ", which has no folder of its own; 'fileindexctl folder add " +
+               report.place.share_path + "' indexes it.";
     }
     return std::string();
 }

@@ -105,6 +105,9 @@ TEST_F(FolderTest, PausingReachesTheDaemon) {
         EXPECT_EQ(indexer_.Requests().back()["type"], command);
     }
     std::filesystem::remove(kDaemonSocket);
+    const Result marked = Piped({"volume", "pause", "/volume1"});
+    EXPECT_NE(marked.err.find("the folders are marked"), std::string::npos) << marked.err;
+    EXPECT_TRUE(Folders()[0]["paused"].asBool());
     const Result result = Piped({"pause"});
     EXPECT_EQ(result.status, kFailure);
     EXPECT_NE(result.err.find("it is recorded"), std::string::npos) << result.err;
@@ -154,6 +157,24 @@ TEST_F(FolderTest, ClearingBringsAShareToRestFirst) {
     EXPECT_EQ(indexer_.Requests().back()["data"]["share_name"], "music");
     EXPECT_TRUE(fake::Platform()->monitor_queues.empty());
     EXPECT_EQ(Folders().size(), 0U);
+}
+
+TEST_F(FolderTest, AShareThatIsGoneIsNamedWithItsRemedy) {
+    Piped({"folder", "add", "/photo"});
+    Piped({"folder", "add", "/music"});
+    fake::Platform()->shares.erase("music");
+    const std::vector<std::string> rows[] = {{"folder", "delete", "/music"},
+                                             {"folder", "set", "/photo"},
+                                             {"share", "pause", "music"},
+                                             {"why", "/music"}};
+    for (const std::vector<std::string>& row : rows) {
+        const Result result = Piped(row);
+        EXPECT_NE(result.err.find("share music, which has indexed folders, is gone"),
+                  std::string::npos)
+            << result.err;
+        EXPECT_NE(result.err.find("fileindexctl share clear music PATH"), std::string::npos);
+    }
+    EXPECT_NE(Piped({"folder", "list"}).out.find("error: its share is gone"), std::string::npos);
 }
 
 TEST_F(FolderTest, WhatStandsInThePlaceOfTheIndexIsNamed) {

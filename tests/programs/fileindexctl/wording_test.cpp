@@ -46,12 +46,8 @@ TEST_F(WordingTest, ErrorsAreOneSentence) {
 
 TEST_F(WordingTest, WrongCallsHaveStatusTwoAndDoNothing) {
     const std::vector<std::string> rows[] = {
-        {},
-        {"frobnicate"},
         {"queue"},
         {"search"},
-        {"search", "--limit", "many", "word"},
-        {"event", "add", "/volume1/s/a", "--kind", "explode"},
         {"event", "add", "/volume1/s/a", "--kind", "rename"},
         {"event", "add", "/volume1/s/a", "--kind", "create", "--from", "/volume1/s/b"},
         {"folder", "add"},
@@ -61,6 +57,12 @@ TEST_F(WordingTest, WrongCallsHaveStatusTwoAndDoNothing) {
         {{"serch", "x"}, "did you mean 'search'?"},
         {{"--json", "folder", "lsit"}, "did you mean 'list'?"},
         {{"folder", "frobnicate"}, "see 'fileindexctl folder --help'"},
+        {{}, "a command is missing; see 'fileindexctl --help'"},
+        {{"pause", "x"}, "HOURS = x is not a number that fits; see 'fileindexctl pause --help'"},
+        {{"pause", "1", "2"}, "2 is not expected here; see 'fileindexctl pause --help'"},
+        {{"search", "--limit"}, "--limit needs a value"},
+        {{"event", "add", "x", "--kind", "y"}, "y is not one of create,"},
+        {{"share", "clear", "", ""}, "SHARE is empty"},
     };
     for (const auto& [arguments, advice] : slips) {
         const Result result = Piped(arguments);
