@@ -11,6 +11,11 @@ namespace quivra::base {
 /// A share's "@eaDir" lies in a directory that users may write to, so they may rename it and put
 /// their own in its place at any time. What was opened here is worked with through the descriptor
 /// only: opened, created, locked, renamed and unlinked relative to it, never by its path again.
+///
+/// Binding "@eaDir" onto itself, so that its renaming fails with EBUSY, was tried as a seat belt
+/// and left out: the bind of a daemon that systemd gave a namespace of its own holds nobody else, a
+/// process in an older namespace renames it all the same, and the volume cannot be unmounted, nor
+/// the share removed, while it stands.
 class PrivateDirectory {
   public:
     enum class Make {

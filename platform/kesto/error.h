@@ -4,7 +4,7 @@
 extern "C" {
 #endif
 
-/// Codes that KLIBCErrGet answers. The values are fixed: log lines carry them.
+/// Codes that KLIBCErrGet returns. The values are fixed: log lines carry them.
 #define KESTO_ERR_SYSTEM 0x0100           /* a system call failed; errno says which way */
 #define KESTO_ERR_BAD_ARGUMENT 0x0200     /* a null pointer, an empty or malformed name */
 #define KESTO_ERR_BUFFER_TOO_SMALL 0x0300 /* the result does not fit the caller's buffer */

@@ -4,7 +4,7 @@
 extern "C" {
 #endif
 
-/// Bits of the mask that KESTOACLPermGet answers.
+/// Bits of the mask that KESTOACLPermGet returns.
 #define KESTO_ACL_PERM_EXEC 0x1
 #define KESTO_ACL_PERM_WRITE 0x2
 #define KESTO_ACL_PERM_READ 0x4

@@ -19,7 +19,7 @@ struct KESTOShare {
     char szUsers[4096];  ///< rights as "NAME:rw NAME:ro"
 };
 
-/// Rights that KESTOShareUserPrivGet answers.
+/// Rights that KESTOShareUserPrivGet returns.
 enum KESTOSharePrivilege {
     KESTO_SHARE_PRIV_NONE = 0,
     KESTO_SHARE_PRIV_READ = 1,

@@ -191,6 +191,43 @@ TEST_F(FileTest, APrivateDirectoryIsOursAtEachStep) {
     fs::remove_all("/tmp/file_test_elsewhere");
 }
 
+TEST_F(FileTest, WhoRenamesAPrivateDirectoryNeverGetsWhatIsWrittenToIt) {
+    constexpr uid_t kAttacker = 1234;
+    if (!support::HasOtherUsers()) {
+        GTEST_SKIP() << "one user only";
+    }
+    const std::string ea_dir = dir_ + "/@eaDir";
+    const std::string planted = dir_ + "/planted";
+    WriteFile("/tmp/file_test_target/queue", "precious");
+    ASSERT_EQ(chown(dir_.c_str(), kAttacker, kAttacker), 0);
+    const auto plant = [&] {
+        fs::create_directory(planted);
+        fs::create_directory_symlink("/tmp/file_test_target", planted + "/fileindex");
+        return std::string();
+    };
+    support::AsUser(kAttacker, plant);
+    int opened = 0;
+    {
+        const support::UserLoop attacker(kAttacker, [&] {
+            renameat2(AT_FDCWD, ea_dir.c_str(), AT_FDCWD, planted.c_str(), RENAME_EXCHANGE);
+        });
+        const auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(200);
+        while (std::chrono::steady_clock::now() < end) {
+            const PrivateDirectory directory =
+                PrivateDirectory::Open(ea_dir + "/fileindex", PrivateDirectory::Make::kMissing);
+            if (directory.IsValid()) {
+                ++opened;
+                const UniqueFd queue =
+                    OpenRegular(directory.Fd(), "queue", O_WRONLY | O_CREAT | O_TRUNC);
+                EXPECT_TRUE(WriteAll(queue.Get(), "ours"));
+            }
+        }
+    }
+    EXPECT_GT(opened, 0);
+    EXPECT_EQ(ReadFile("/tmp/file_test_target/queue"), "precious");
+    fs::remove_all("/tmp/file_test_target");
+}
+
 }  // namespace
 
 // Kernels before 5.6 do not have every call.

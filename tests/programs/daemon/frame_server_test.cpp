@@ -17,12 +17,14 @@
 #include <vector>
 
 #include "common/error.h"
+#include "tests/support/files.h"
 
 namespace quivra::daemon {
 namespace {
 
 using namespace std::chrono_literals;
 using base::UniqueFd;
+using support::Frame;
 
 const std::string kPath = "/tmp/frame_server_test.sock";
 
@@ -35,11 +37,6 @@ UniqueFd RawSocket(decltype(connect) attach) {
     const auto* generic = reinterpret_cast<const sockaddr*>(&address);
     EXPECT_EQ(attach(fd.Get(), generic, sizeof(address)), 0) << strerror(errno);
     return fd;
-}
-
-std::string Frame(const std::string& text) {
-    const auto size = static_cast<std::uint32_t>(text.size());
-    return std::string(reinterpret_cast<const char*>(&size), sizeof(size)) + text;
 }
 
 /// Whether the server ends the connection, without a byte of reply, before the patience is over.

@@ -13,13 +13,12 @@
 #include <thread>
 
 #include "tests/fake/scripted_server.h"
+#include "tests/support/files.h"
 #include "tests/support/program.h"
 
 namespace {
 
-void WriteFile(const std::string& path, const std::string& text) {
-    std::ofstream(path) << text;
-}
+using support::WriteFile;
 
 TEST(ProgramTest, ShowsAQueueAndReportsFailures) {
     WriteFile("/tmp/queue", "{\"event\":64,\"path\":\"/v/s/a\"}\nbad line\n");

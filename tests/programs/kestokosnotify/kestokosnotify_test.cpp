@@ -6,11 +6,11 @@
 
 #include <cstdlib>
 #include <cstring>
-#include <fstream>
 
 #include "programs/kestokosnotify/message.h"
 #include "programs/kestokosnotify/notice.h"
 #include "tests/fake/fake_libc.h"
+#include "tests/support/files.h"
 #include "tests/support/program.h"
 
 namespace {
@@ -53,10 +53,11 @@ class NotifyTest : public testing::Test {
   protected:
     void SetUp() override {
         fake::ResetLibc();
-        std::ofstream("/run/utmp").flush();  // truncates
-        std::ofstream("/etc/passwd") << "root:x:0:0::/root:/bin/sh\nalice:x:1026:100::/:/bin/sh\n"
-                                        "boss:x:1027:100::/:/bin/sh\n";
-        std::ofstream("/etc/group") << "administrators:x:2002:boss\n";
+        support::WriteFile("/run/utmp", "");
+        support::WriteFile("/etc/passwd",
+                           "root:x:0:0::/root:/bin/sh\nalice:x:1026:100::/:/bin/sh\n"
+                           "boss:x:1027:100::/:/bin/sh\n");
+        support::WriteFile("/etc/group", "administrators:x:2002:boss\n");
     }
 };
 
@@ -78,7 +79,7 @@ TEST_F(NotifyTest, ReachesAdministratorsAsTheLibraryCallsIt) {
 }
 
 TEST_F(NotifyTest, OddLoginsAndStoppedTerminalsAreLeftOut) {
-    std::ofstream("/tmp/file") << "old";
+    support::WriteFile("/tmp/file", "old");
     for (const char* line : {"../tmp/file", "/tmp/file", "", "null", "pts/no-such", "pts"}) {
         LogIn("root", line);
     }
@@ -90,9 +91,7 @@ TEST_F(NotifyTest, OddLoginsAndStoppedTerminalsAreLeftOut) {
                   {"App\n", "root", "<b>title</b>", "a\x1b[2Jc\n\u00fc\xc2\x9b\x9b\xc3<open", {}}),
               1);
     EXPECT_EQ(root.Shown(), "\r\r\n\atitle: a [2Jc \u00fc ??\r\r\n");
-    std::string content;
-    std::ifstream("/tmp/file") >> content;
-    EXPECT_EQ(content, "old");
+    EXPECT_EQ(support::ReadFile("/tmp/file"), "old");
     EXPECT_EQ(fake::LogLinesWith("App  to root: <b>title</b>: a [2Jc").size(),
               1U);  // the log keeps links
 }

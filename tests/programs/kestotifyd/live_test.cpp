@@ -18,25 +18,19 @@
 #include "common/lock_file.h"
 #include "programs/kestotifyd/fanotify_backend.h"
 #include "tests/programs/kestotifyd/share_model.h"
+#include "tests/support/files.h"
 #include "tests/support/program.h"
 
 namespace fs = std::filesystem;
 using support::Eventually;
+using support::ReadFile;
+using support::WriteFile;
 
 namespace {
 
 constexpr char kShare[] = "/volume1/photo";
 constexpr char kRegistrations[] = "/var/lib/kesto/monitor";
 constexpr char kLog[] = "/var/log/kestotifyd.log";
-
-std::string ReadAll(const std::string& path) {
-    std::ifstream file(path, std::ios::binary);
-    return std::string(std::istreambuf_iterator<char>(file), {});
-}
-
-void WriteFile(const std::string& path, const std::string& content = "content") {
-    std::ofstream(path, std::ios::binary) << content;
-}
 
 /// The real program, on a real directory, with the back end that the parameter names.
 class LiveTest : public testing::TestWithParam<const char*> {
@@ -116,7 +110,7 @@ class LiveTest : public testing::TestWithParam<const char*> {
     }
 
     static bool HasLog(const std::string& text) {
-        return ReadAll(kLog).find(text) != std::string::npos;
+        return ReadFile(kLog).find(text) != std::string::npos;
     }
 
     static std::string Line(unsigned event, bool is_dir, const std::string& path,
@@ -149,8 +143,8 @@ class LiveTest : public testing::TestWithParam<const char*> {
             return testing::AssertionSuccess();
         }
         return testing::AssertionFailure() << line << "\nQueue:\n"
-                                           << ReadAll(Queue(share)) << "\nLog:\n"
-                                           << ReadAll(kLog);
+                                           << ReadFile(Queue(share)) << "\nLog:\n"
+                                           << ReadFile(kLog);
     }
     /// The lines up to the one for a file that is made now.
     std::vector<std::string> LinesUntilNow() {
@@ -178,7 +172,7 @@ TEST_P(LiveTest, ADirectoryRenameIsOneLine) {
     for (int i = 0; i < 1000; ++i) {
         WriteFile(share_ + "/many/sub/f" + std::to_string(i));
     }
-    ASSERT_TRUE(StartAndSettle()) << ReadAll(kLog);
+    ASSERT_TRUE(StartAndSettle()) << ReadFile(kLog);
     fs::rename(share_ + "/many", share_ + "/moved");
     WriteFile(share_ + "/moved/sub/f7", "new content");
     EXPECT_EQ(LinesUntilNow(),
@@ -194,7 +188,7 @@ TEST_P(LiveTest, MovesInAndOutAndBetweenShares) {
     WriteFile(share_ + "/keep/deep/f");
     fs::create_directories("/volume1/outside/in/deep");
     WriteFile("/volume1/outside/in/deep/f");
-    ASSERT_TRUE(StartAndSettle()) << ReadAll(kLog);
+    ASSERT_TRUE(StartAndSettle()) << ReadFile(kLog);
     ASSERT_TRUE(Comes(Line(0x10000, true, other), other));
     fs::rename("/volume1/outside/in", share_ + "/in");
     EXPECT_TRUE(Comes(Line(0x40, true, share_ + "/in")));
@@ -208,12 +202,12 @@ TEST_P(LiveTest, MovesInAndOutAndBetweenShares) {
     EXPECT_TRUE(Comes(Line(0x40, true, other + "/kept"), other));
     WriteFile(other + "/kept/deep/f", "changed");
     EXPECT_TRUE(Comes(Line(0x2, false, other + "/kept/deep/f"), other));
-    EXPECT_EQ(ReadAll(Queue()).find("unseen"), std::string::npos);
+    EXPECT_EQ(ReadFile(Queue()).find("unseen"), std::string::npos);
     EXPECT_TRUE(model_.Converges());
 }
 
 TEST_P(LiveTest, RegistrationsComeChangeAndGoWhileItRuns) {
-    ASSERT_TRUE(StartAndSettle()) << ReadAll(kLog);
+    ASSERT_TRUE(StartAndSettle()) << ReadFile(kLog);
     const std::string other = "/volume1/video";
     WriteFile(std::string(kRegistrations) + "/broken.json", "{\"queue\":");
     Register(other);
@@ -231,7 +225,7 @@ TEST_P(LiveTest, RegistrationsComeChangeAndGoWhileItRuns) {
         LinesUntilNow();
         return count() > before;
     };
-    ASSERT_TRUE(Eventually([&] { return reports("skip"); })) << ReadAll(kLog);
+    ASSERT_TRUE(Eventually([&] { return reports("skip"); })) << ReadFile(kLog);
     EXPECT_FALSE(Has(Line(0x10000, true, other), other)) << "new in this run";
     EXPECT_TRUE(HasLog("broken.json skipped"));
 
@@ -245,7 +239,7 @@ TEST_P(LiveTest, RegistrationsComeChangeAndGoWhileItRuns) {
 }
 
 TEST_P(LiveTest, EveryStartBeginsWithAReindex) {
-    ASSERT_TRUE(StartAndSettle()) << ReadAll(kLog);
+    ASSERT_TRUE(StartAndSettle()) << ReadFile(kLog);
     for (const int signal : {SIGKILL, SIGTERM}) {
         WriteFile(share_ + "/last");
         fs::create_directories(share_ + "/a/b/c");
@@ -261,7 +255,7 @@ TEST_P(LiveTest, EveryStartBeginsWithAReindex) {
 }
 
 TEST_P(LiveTest, OverflowBecomesACrashMarkerAndNothingStaysUnwatched) {
-    ASSERT_TRUE(StartAndSettle()) << ReadAll(kLog);
+    ASSERT_TRUE(StartAndSettle()) << ReadFile(kLog);
     kill(monitor_->Pid(), SIGSTOP);
     for (int i = 0; i < 300; ++i) {
         fs::create_directories(share_ + "/d" + std::to_string(i) + "/sub");
@@ -310,7 +304,7 @@ TEST_P(LiveTest, ARefusedWatchBecomesACrashMarker) {
 }
 
 TEST_P(LiveTest, WithoutDescriptorsNothingIsLostInSilence) {
-    ASSERT_TRUE(StartAndSettle()) << ReadAll(kLog);
+    ASSERT_TRUE(StartAndSettle()) << ReadFile(kLog);
     const rlimit none{3, 1024};
     const rlimit enough{1024, 1024};
     ASSERT_EQ(prlimit(monitor_->Pid(), RLIMIT_NOFILE, &none, nullptr), 0);
@@ -325,7 +319,7 @@ TEST_P(LiveTest, WithoutDescriptorsNothingIsLostInSilence) {
 }
 
 TEST_P(LiveTest, TellsItsState) {
-    ASSERT_TRUE(StartAndSettle()) << ReadAll(kLog);
+    ASSERT_TRUE(StartAndSettle()) << ReadFile(kLog);
     fs::create_directories(share_ + "/sub");
     LinesUntilNow();
     const Json::Value state = State();
@@ -366,7 +360,7 @@ TEST_P(LiveTest, DeepTreesHoldUpNothing) {
         ASSERT_EQ(mkdir(deep.c_str(), 0755), 0);
     }
     fs::create_directories(share_ + "/b");
-    ASSERT_TRUE(StartAndSettle()) << ReadAll(kLog);
+    ASSERT_TRUE(StartAndSettle()) << ReadFile(kLog);
     kill(monitor_->Pid(), SIGSTOP);
     const std::string a = share_ + "/a";
     const std::string b = share_ + "/b";
@@ -389,7 +383,7 @@ TEST_P(LiveTest, ExchangedDirectoriesAndFilesAreBothFollowed) {
         fs::create_directories(share_ + name + name + "/deep");
         WriteFile(share_ + name + ".txt", name);
     }
-    ASSERT_TRUE(StartAndSettle()) << ReadAll(kLog);
+    ASSERT_TRUE(StartAndSettle()) << ReadFile(kLog);
     const auto exchange = [&](const std::string& ending) {
         return renameat2(AT_FDCWD, (share_ + "/a" + ending).c_str(), AT_FDCWD,
                          (share_ + "/b" + ending).c_str(), RENAME_EXCHANGE);
@@ -407,23 +401,23 @@ TEST_P(LiveTest, WhatIsMountedBelowIsWatchedAndItsUnmountingIsNoDelete) {
     const std::string disk = share_ + "/disk";
     fs::create_directories(disk + "/covered");
     WriteFile(disk + "/covered/hidden");
-    ASSERT_TRUE(StartAndSettle()) << ReadAll(kLog);
+    ASSERT_TRUE(StartAndSettle()) << ReadFile(kLog);
     ASSERT_EQ(mount("none", disk.c_str(), "tmpfs", 0, nullptr), 0);
     EXPECT_TRUE(Comes(Line(0x10000, true, disk)));
     WriteFile(disk + "/f");
     EXPECT_TRUE(Comes(Line(0x2, false, disk + "/f")));
-    EXPECT_EQ(ReadAll(Queue()).find("\"event\":128"), std::string::npos);
+    EXPECT_EQ(ReadFile(Queue()).find("\"event\":128"), std::string::npos);
     EXPECT_TRUE(model_.Converges());
     ASSERT_EQ(umount(disk.c_str()), 0) << "the monitor keeps it busy";
     EXPECT_TRUE(Comes(Line(0x10000, true, disk))) << "what it had hidden is back";
     WriteFile(disk + "/covered/under");
     EXPECT_TRUE(Comes(Line(0x2, false, disk + "/covered/under")));
-    EXPECT_EQ(ReadAll(Queue()).find("\"event\":128"), std::string::npos);
+    EXPECT_EQ(ReadFile(Queue()).find("\"event\":128"), std::string::npos);
     EXPECT_TRUE(model_.Converges());
 }
 
 TEST_P(LiveTest, AVolumeThatIsAwayIsNotTakenForEmpty) {
-    ASSERT_TRUE(StartAndSettle()) << ReadAll(kLog);
+    ASSERT_TRUE(StartAndSettle()) << ReadFile(kLog);
     const std::string volume = "/volume2";
     const std::string queue = "/volume1/video.queue";
     fs::create_directories(volume);
@@ -434,7 +428,7 @@ TEST_P(LiveTest, AVolumeThatIsAwayIsNotTakenForEmpty) {
     json["config"]["mask"] = 65478;
     ASSERT_TRUE(quivra::toFile(json, std::string(kRegistrations) + "/volume2.json"));
     const auto queue_has = [&](const std::string& line) {
-        return ReadAll(queue).find(line) != std::string::npos;
+        return ReadFile(queue).find(line) != std::string::npos;
     };
     EXPECT_TRUE(Eventually([&] {
         WriteFile(volume + "/f");
@@ -446,10 +440,10 @@ TEST_P(LiveTest, AVolumeThatIsAwayIsNotTakenForEmpty) {
     Start();
     EXPECT_TRUE(Comes(Line(0x10000, true, kShare)));
     LinesUntilNow();
-    EXPECT_FALSE(queue_has("65536")) << ReadAll(queue);
+    EXPECT_FALSE(queue_has("65536")) << ReadFile(queue);
     ASSERT_EQ(mount("none", volume.c_str(), "tmpfs", 0, nullptr), 0);
     EXPECT_TRUE(Eventually([&] { return queue_has(Line(0x10000, true, volume)); }));
-    EXPECT_FALSE(queue_has(":128")) << ReadAll(queue);
+    EXPECT_FALSE(queue_has(":128")) << ReadFile(queue);
     umount(volume.c_str());
 }
 
@@ -484,7 +478,7 @@ void RandomOperation(std::mt19937& random) {
 }
 
 TEST_P(LiveTest, StormsEndWithTheDisk) {
-    ASSERT_TRUE(StartAndSettle()) << ReadAll(kLog);
+    ASSERT_TRUE(StartAndSettle()) << ReadFile(kLog);
     const char* const given = std::getenv("STORM_SEED");
     const unsigned seed = given != nullptr ? static_cast<unsigned>(std::atoi(given)) : 1;
     std::mt19937 random(seed);

@@ -18,6 +18,7 @@
 
 #include "common/lock_file.h"
 #include "tests/fake/fake_libc.h"
+#include "tests/support/files.h"
 
 namespace kestotifyd {
 namespace {
@@ -34,10 +35,7 @@ class QueueWriterTest : public testing::Test {
     }
     void TearDown() override { fs::remove_all(directory_); }
 
-    std::string Content() const {
-        std::ifstream file(queue_, std::ios::binary);
-        return std::string(std::istreambuf_iterator<char>(file), {});
-    }
+    std::string Content() const { return support::ReadFile(queue_); }
 
     const std::string directory_ = "/tmp/queue_writer_test";
     const std::string queue_ = directory_ + "/queue";
