@@ -36,6 +36,12 @@ void KESTOShareFree(struct KESTOShare* share);
 /// Appends the names of all shares to the list. Negative on failure.
 int KESTOShareEnum(KLIBCSzList** list);
 
+/// Appends a sentence for each mistake in the configuration of the shares, with its place
+/// ("/etc/kesto/shares.conf:12: unknown key \"pth\""), for administrators to read. What is wrong is
+/// left out of the shares; a mistake costs no other share. An addition of the stand-alone platform
+/// that the library does not call. Negative on failure.
+int KESTOShareEnumProblems(KLIBCSzList** list);
+
 /// The share that a full path lies in: the one with the longest root that is a component-wise
 /// prefix of the path. Fills its name and its root path; negative when there is none or a buffer
 /// is too small.

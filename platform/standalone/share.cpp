@@ -51,17 +51,12 @@ int ReadFlag(const KESTOShare* share, int KESTOShare::*field, int* flag) {
 
 /// The right that "NAME:rw NAME:ro" gives the user.
 KESTOSharePrivilege ListedPrivilege(std::string_view users, std::string_view user) {
-    while (!users.empty()) {
-        const std::size_t end = std::min(users.find_first_of(" \t,"), users.size());
-        const std::string_view entry = users.substr(0, end);
-        const std::size_t colon = entry.rfind(':');
-        if (colon != std::string_view::npos && entry.substr(0, colon) == user) {
-            const std::string_view right = entry.substr(colon + 1);
-            return right == "rw"   ? KESTO_SHARE_PRIV_WRITE
-                   : right == "ro" ? KESTO_SHARE_PRIV_READ
-                                   : KESTO_SHARE_PRIV_NONE;
+    while (const std::optional<UserRight> entry = NextUser(users)) {
+        if (entry->name == user) {
+            return entry->right == "rw"   ? KESTO_SHARE_PRIV_WRITE
+                   : entry->right == "ro" ? KESTO_SHARE_PRIV_READ
+                                          : KESTO_SHARE_PRIV_NONE;
         }
-        users.remove_prefix(std::min(end + 1, users.size()));
     }
     return KESTO_SHARE_PRIV_NONE;
 }

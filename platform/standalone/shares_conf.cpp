@@ -1,33 +1,19 @@
 #include "platform/standalone/shares_conf.h"
-#include "base/file.h"
-#include "base/path.h"
 
-#include <fcntl.h>
-#include <kesto/error.h>
 #include <kesto/share.h>
-#include <sys/stat.h>
-#include <syslog.h>
-#include <unistd.h>
 
 #include <algorithm>
-#include <cctype>
-#include <cerrno>
 #include <charconv>
-#include <cstring>
-#include <ctime>
-#include <mutex>
 #include <optional>
 
-#include "base/unique_fd.h"
-#include "platform/standalone/error_state.h"
+#include "base/path.h"
 
 namespace kesto {
 namespace {
 
-constexpr const char* kSharesPath = "/etc/kesto/shares.conf";
-constexpr std::size_t kMaxFileSize = 4U << 20;
 /// A file full of rubbish must not fill the system log as well.
-constexpr int kMaxReports = 20;
+constexpr std::size_t kMaxProblems = 20;
+constexpr std::size_t kMaxQuote = 60;
 
 std::string_view Trim(std::string_view text) {
     const std::size_t begin = text.find_first_not_of(" \t\r");
@@ -47,15 +33,23 @@ std::string_view WithoutComment(std::string_view line) {
     return line;
 }
 
-/// "Read Only" and "readonly" are one key.
+/// "Read Only" and "readonly" are one key, whatever the host program's locale makes of letters.
 std::string NormalizedKey(std::string_view key) {
     std::string normalized;
     for (const char c : key) {
         if (c != ' ' && c != '\t') {
-            normalized += static_cast<char>(std::tolower(static_cast<unsigned char>(c)));
+            normalized += c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c;
         }
     }
     return normalized;
+}
+
+/// A piece of the file for a message: short, and nothing that a terminal would obey.
+std::string Quote(std::string_view text) {
+    std::string quoted = "\"" + std::string(text.substr(0, kMaxQuote));
+    std::replace_if(
+        quoted.begin(), quoted.end(), [](unsigned char c) { return c < 0x20 || c == 0x7f; }, '?');
+    return quoted + (text.size() > kMaxQuote ? "...\"" : "\"");
 }
 
 std::optional<bool> ParseFlag(std::string_view value) {
@@ -78,25 +72,9 @@ bool* FlagOf(ShareConf& share, std::string_view key) {
                                      : nullptr;
 }
 
-/// Whether every component between slashes is a real name, as in the paths that the kernel reports.
-bool IsCanonical(std::string_view path) {
-    if (!path.starts_with('/')) {
-        return false;
-    }
-    for (std::size_t begin = 1; begin <= path.size();) {
-        const std::size_t end = std::min(path.find('/', begin), path.size());
-        const std::string_view component = path.substr(begin, end - begin);
-        if (component.empty() || component == "." || component == "..") {
-            return false;
-        }
-        begin = end + 1;
-    }
-    return true;
-}
-
 class Parser {
   public:
-    ShareList Parse(std::string_view text) {
+    SharesConf Parse(std::string_view text) {
         if (text.starts_with("\xef\xbb\xbf")) {
             text.remove_prefix(3);
         }
@@ -107,7 +85,11 @@ class Parser {
             text.remove_prefix(std::min(end + 1, text.size()));
         }
         FinishSection();
-        return std::move(shares_);
+        if (unreported_ > 0) {
+            conf_.problems.push_back(std::string(kSharesPath) + ": " + std::to_string(unreported_) +
+                                     " more lines are wrong");
+        }
+        return std::move(conf_);
     }
 
   private:
@@ -117,171 +99,147 @@ class Parser {
             return;
         }
         if (line.find('\0') != std::string_view::npos) {
-            Report("the line holds a NUL byte");
+            Report(line_, "the line holds a NUL byte");
         } else if (line[0] == '[') {
-            FinishSection();
-            if (line.back() == ']') {
-                section_ = ShareConf();
-                section_->name = Trim(line.substr(1, line.size() - 2));
-                section_line_ = line_;
-            } else {
-                Report("the section's closing bracket is missing");
-            }
+            BeginSection(line);
         } else if (equals == std::string_view::npos) {
-            Report("neither a section nor an assignment");
+            Report(line_, "neither a section nor an assignment: " + Quote(line));
         } else if (section_) {
-            Assign(NormalizedKey(line.substr(0, equals)), Trim(line.substr(equals + 1)));
+            Assign(Trim(line.substr(0, equals)), Trim(line.substr(equals + 1)));
+        } else if (!is_in_bad_section_) {
+            Report(line_, "the assignment stands before the first section: " + Quote(line));
         }
     }
 
-    void Assign(const std::string& key, std::string_view value) {
+    void BeginSection(std::string_view line) {
+        FinishSection();
+        section_line_ = path_line_ = line_;
+        is_in_bad_section_ = line.back() != ']';
+        if (is_in_bad_section_) {
+            Report(line_, "the section's closing bracket is missing: " + Quote(line));
+        } else {
+            section_ = ShareConf();
+            section_->name = Trim(line.substr(1, line.size() - 2));
+        }
+    }
+
+    void Assign(std::string_view written_key, std::string_view value) {
+        const std::string key = NormalizedKey(written_key);
         if (key == "path") {
             section_->path = value;
+            path_line_ = line_;
         } else if (key == "users") {
             section_->users = value;
+            CheckUsers(value);
         } else if (key == "ftpprivilege") {
             const char* end = value.data() + value.size();
             const auto [stop, error] = std::from_chars(value.data(), end, section_->ftp_privilege);
             if (error != std::errc() || stop != end) {
                 section_->ftp_privilege = 0;
-                Report("the ftp privilege is no number");
+                Report(line_, "the ftp privilege is not a number: " + Quote(value));
             }
         } else if (bool* flag = FlagOf(*section_, key)) {
             const std::optional<bool> parsed = ParseFlag(value);
             if (!parsed) {
-                Report("the value is neither yes nor no");
+                Report(line_, "the value is neither yes nor no: " + Quote(value));
             }
             *flag = parsed.value_or(*flag);
+        } else {
+            Report(line_, "unknown key " + Quote(written_key));
+        }
+    }
+
+    void CheckUsers(std::string_view users) {
+        while (const std::optional<UserRight> user = NextUser(users)) {
+            if (user->name.empty() || (user->right != "rw" && user->right != "ro")) {
+                Report(line_, "not NAME:rw or NAME:ro: " + Quote(user->entry));
+            }
         }
     }
 
     void FinishSection() {
         if (section_) {
-            const int line = line_;
-            line_ = section_line_;
-            const char* refusal = Refusal(*section_);
-            if (refusal == nullptr) {
-                shares_.push_back(std::move(*section_));
-            } else {
-                Report(refusal);
+            if (CheckPath(*section_) && CheckSection(*section_)) {
+                conf_.shares.push_back(std::move(*section_));
             }
-            line_ = line;
         }
         section_.reset();
     }
 
-    /// Why a section makes no share; null when it does.
-    const char* Refusal(const ShareConf& share) const {
-        if (share.path.empty()) {
-            return "the section has no path";
+    bool CheckPath(const ShareConf& share) {
+        const std::string_view path = share.path;
+        if (path.empty()) {
+            return Refuse(section_line_, "the section has no path: " + Quote(share.name));
         }
-        if (!IsCanonical(share.path)) {
-            return "the path is not absolute, or has empty, \".\" or \"..\" parts";
+        if (path.size() > 1 && path.ends_with('/')) {
+            return Refuse(path_line_, "the path ends with a slash; remove it: " + Quote(path));
         }
-        if (share.name != quivra::base::Name(share.path)) {
-            return "the section's name is not the last component of its path";
+        if (path == "/" || !quivra::base::IsCanonicalText(path)) {
+            return Refuse(
+                path_line_,
+                "the path is not absolute, or has empty, \".\" or \"..\" parts: " + Quote(path));
         }
+        if (share.name != quivra::base::Name(path)) {
+            return Refuse(
+                section_line_,
+                "the section's name is not the last component of its path: " + Quote(share.name));
+        }
+        return true;
+    }
+
+    bool CheckSection(const ShareConf& share) {
         if (share.name.size() >= sizeof(KESTOShare::szName) ||
             share.path.size() >= sizeof(KESTOShare::szPath) ||
             share.users.size() >= sizeof(KESTOShare::szUsers)) {
-            return "the name, the path or the list of users is too long";
+            return Refuse(section_line_, "the name, the path or the list of users is too long");
         }
-        return FindShare(shares_, share.name) == nullptr ? nullptr : "the share exists already";
+        return FindShare(conf_.shares, share.name) == nullptr ||
+               Refuse(section_line_, "the share exists already: " + Quote(share.name));
     }
 
-    void Report(const char* reason) {
-        if (++reports_ <= kMaxReports) {
-            syslog(LOG_WARNING, "%s:%d ignored: %s", kSharesPath, line_, reason);
+    /// Reports why a section makes no share.
+    bool Refuse(int line, const std::string& reason) {
+        Report(line, reason);
+        return false;
+    }
+
+    void Report(int line, const std::string& reason) {
+        if (conf_.problems.size() < kMaxProblems) {
+            conf_.problems.push_back(std::string(kSharesPath) + ":" + std::to_string(line) + ": " +
+                                     reason);
+        } else {
+            ++unreported_;
         }
     }
 
-    ShareList shares_;
+    SharesConf conf_;
     std::optional<ShareConf> section_;
+    bool is_in_bad_section_ = false;  ///< its assignments belong to no share
     int section_line_ = 0;
+    int path_line_ = 0;
     int line_ = 0;
-    int reports_ = 0;
+    int unreported_ = 0;
 };
-
-/// What tells one state of the file from another.
-struct FileState {
-    dev_t device;
-    ino_t inode;
-    off_t size;
-    timespec modified;
-
-    bool operator==(const FileState& other) const {
-        return device == other.device && inode == other.inode && size == other.size &&
-               modified.tv_sec == other.modified.tv_sec &&
-               modified.tv_nsec == other.modified.tv_nsec;
-    }
-};
-
-FileState StateOf(const struct stat& status) {
-    return {status.st_dev, status.st_ino, status.st_size, status.st_mtim};
-}
-
-/// Whether the file could change once more without a new modification time: the kernel stamps with
-/// the time of its last tick.
-bool IsTooFresh(const timespec& modified) {
-    timespec now{};
-    clock_gettime(CLOCK_REALTIME, &now);
-    return now.tv_sec - modified.tv_sec <= 1;
-}
-
-struct Cache {
-    std::mutex mutex;
-    std::optional<FileState> state;  ///< of the file that `shares` was read from
-    std::shared_ptr<const ShareList> shares;
-};
-
-/// Reads the file anew; null with errno set on failure.
-std::shared_ptr<const ShareList> ReadShares(Cache& cache) {
-    const quivra::base::UniqueFd fd(
-        open(kSharesPath, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
-    struct stat status {};
-    if (!fd.IsValid() || fstat(fd.Get(), &status) != 0) {
-        return nullptr;
-    }
-    std::string text;
-    if (!S_ISREG(status.st_mode) || !quivra::base::ReadUpTo(fd.Get(), kMaxFileSize + 1, text) ||
-        text.size() > kMaxFileSize) {
-        errno = errno == 0 ? EFBIG : errno;
-        return nullptr;
-    }
-    cache.shares = std::make_shared<const ShareList>(ParseShares(text));
-    if (!IsTooFresh(status.st_mtim)) {
-        cache.state = StateOf(status);
-    }
-    return cache.shares;
-}
 
 }  // namespace
 
-ShareList ParseShares(std::string_view text) {
+SharesConf ParseShares(std::string_view text) {
     return Parser().Parse(text);
 }
 
-std::shared_ptr<const ShareList> LoadShares() {
-    static Cache cache;
-    const std::lock_guard lock(cache.mutex);
-    struct stat status {};
-    if (stat(kSharesPath, &status) == 0 && cache.state == StateOf(status)) {
-        return cache.shares;
+std::optional<UserRight> NextUser(std::string_view& users) {
+    constexpr const char* kSeparators = " \t,";
+    users.remove_prefix(std::min(users.find_first_not_of(kSeparators), users.size()));
+    if (users.empty()) {
+        return std::nullopt;
     }
-    cache.state.reset();
-    const int saved_errno = errno;
-    errno = 0;
-    std::shared_ptr<const ShareList> shares = ReadShares(cache);
-    if (shares == nullptr && (errno == ENOENT || errno == ENOTDIR)) {
-        shares = std::make_shared<const ShareList>();
+    const std::string_view entry = users.substr(0, users.find_first_of(kSeparators));
+    users.remove_prefix(entry.size());
+    const std::size_t colon = entry.rfind(':');
+    if (colon == entry.npos) {
+        return UserRight{entry, {}, {}};
     }
-    if (shares == nullptr) {
-        syslog(LOG_ERR, "%s cannot be read: %s", kSharesPath, std::strerror(errno));
-        SetError(KESTO_ERR_SYSTEM);
-    } else {
-        errno = saved_errno;
-    }
-    return shares;
+    return UserRight{entry, entry.substr(0, colon), entry.substr(colon + 1)};
 }
 
 const ShareConf* FindShare(const ShareList& shares, std::string_view name) {

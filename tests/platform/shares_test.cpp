@@ -3,6 +3,8 @@
 #include <kesto/filesystem.h>
 #include <kesto/share.h>
 #include <kesto/user.h>
+#include <sys/syscall.h>
+#include <unistd.h>
 
 #include <ctime>
 #include <memory>
@@ -16,7 +18,12 @@ using namespace platform_test;
 
 constexpr const char* kSharesPath = "/etc/kesto/shares.conf";
 
-class SharesTest : public PlatformTest {};
+std::time_t clock_offset = 0;
+
+class SharesTest : public PlatformTest {
+  protected:
+    ~SharesTest() override { clock_offset = 0; }
+};
 
 using Record = std::unique_ptr<KESTOShare, void (*)(KESTOShare*)>;
 
@@ -34,37 +41,77 @@ TEST_F(SharesTest, HostileLinesCostNoGoodShare) {
         const char* reason = "";
     };
     const Row rows[] = {
-        {"path = /v/x\n# [a]\n; path = /a\n", ""},
+        {"# [a]\n; path = /a\n", ""},
+        {"path = /v/a\n", "",
+         ":1: the assignment stands before the first section: \"path = /v/a\""},
         {"\xef\xbb\xbf[a]\r\npath = /v/a\r\n", "/v/a"},
-        {"[a;b] ; x\npath = /v/a;b ; y ; z\nread only=no\t;no\n", "/v/a;b"},
-        {"[a]\nrecycle = yes\n", "", "no path"},
+        {"[a;b] ; x\npath = /v/a;b ; y ; z\nREAD only=no\t;no\n", "/v/a;b"},
+        {"\n[a]\npath = /v/a/\n", "", ":3: the path ends with a slash; remove it: \"/v/a/\""},
+        {"[a]\npth = /v/a\npath = /v/a\n", "/v/a", ":2: unknown key \"pth\""},
+        {"[a]\npath = /v/a\nusers = ada:rw bob\n", "/v/a", ":3: not NAME:rw or NAME:ro: \"bob\""},
+        {"[a]\npath = /v/a\nusers = ada:x\n", "/v/a", ":3: not NAME:rw or NAME:ro: \"ada:x\""},
+        {"[a]\npath = /\n", "", "not absolute"},
+        {"[a\x1b[2J]\n", "", "no path: \"a?[2J\""},
+        {"[a]\nrecycle = yes\n", "", ":1: the section has no path: \"a\""},
         {"[A]\npath = /volume1/a\n", "", "not the last component"},
         {"[a]\npath = v/a\n", "", "not absolute"},
         {"[a]\npath = /v/../a\n", "", "not absolute"},
-        {"[a\npath = /v/a\n", "", "closing bracket"},
+        {"[a\npath = /v/a\n", "", ":1: the section's closing bracket is missing: \"[a\""},
         {"[a]\nrubbish\npath = /v/a\n", "/v/a", "neither"},
         {std::string("[a]\npath = /v/a\0\npath = /v/a\n", 29), "/v/a", "NUL"},
         {"[a]\npath = /v/a\n[a]\npath = /w/a\n", "/v/a", "exists already"},
         {"[" + long_name + "]\npath = /v/" + long_name + "\n", "", "too long"},
-        {"[a]\npath = /v/a\nusers = " + std::string(5000, 'u') + "\n", "", "too long"},
+        {"[a]\npath = /v/a\nusers = " + std::string(5000, 'u') + ":rw\n", "", "too long"},
         {"[a]\npath = /v/a\nread only = maybe\n", "/v/a", "neither yes nor no"},
     };
     for (const Row& row : rows) {
         SCOPED_TRACE(row.text);
-        fake::ResetLibc();
-        const auto shares = kesto::ParseShares(row.text + "\n[photo]\npath = /volume1/photo\n");
+        const auto [shares, problems, is_readable] =
+            kesto::ParseShares(row.text + "\n[photo]\npath = /volume1/photo\n");
         ASSERT_EQ(shares.size(), row.extra.empty() ? 1U : 2U);
         EXPECT_EQ(shares.back().path, "/volume1/photo");
         EXPECT_TRUE(row.extra.empty() || shares.front().path == row.extra);
-        EXPECT_EQ(fake::LogLines().size(), *row.reason == '\0' ? 0U : 1U);
-        EXPECT_EQ(fake::LogLinesWith(row.reason).size(), fake::LogLines().size());
+        ASSERT_EQ(problems.size(), *row.reason == '\0' ? 0U : 1U);
+        EXPECT_TRUE(problems.empty() || problems[0].find(row.reason) != std::string::npos)
+            << problems[0];
     }
     std::string rubbish;
     for (int i = 0; i < 1000; ++i) {
         rubbish += "rubbish\n";
     }
-    EXPECT_TRUE(kesto::ParseShares(rubbish).empty());
-    EXPECT_LE(fake::LogLinesWith("neither a section").size(), 20U);
+    const kesto::SharesConf conf = kesto::ParseShares(rubbish);
+    EXPECT_EQ(conf.problems.size(), 21U);
+    EXPECT_EQ(conf.problems.back(), "/etc/kesto/shares.conf: 980 more lines are wrong");
+}
+
+/// What KESTOShareEnumProblems tells.
+std::string Problems() {
+    KLIBCSzList* list = KLIBCSzListAlloc(0);
+    EXPECT_EQ(KESTOShareEnumProblems(&list), 0);
+    std::string text;
+    for (int i = 0; const char* problem = KLIBCSzListGet(list, i); ++i) {
+        text += std::string(problem) + "\n";
+    }
+    KLIBCSzListFree(list);
+    return text;
+}
+
+TEST_F(SharesTest, MistakesAreToldToProgramsAndLoggedOnce) {
+    EXPECT_EQ(Problems(), "");  // no file
+    WriteFile(kSharesPath, "[a]\npath = /v/a\nrecycled = yes\n");
+    for (int i = 0; i < 3; ++i) {
+        EXPECT_TRUE(GetShare("a"));
+        EXPECT_EQ(Problems(), "/etc/kesto/shares.conf:3: unknown key \"recycled\"\n");
+    }
+    EXPECT_EQ(fake::LogLines().size(), 1U);
+    WriteFile(kSharesPath, "[a]\npath = /v/a\n");
+    EXPECT_EQ(Problems(), "");
+    std::filesystem::remove(kSharesPath);
+    std::filesystem::create_directory(kSharesPath);
+    EXPECT_FALSE(GetShare("a"));
+    EXPECT_EQ(KLIBCErrGet(), KESTO_ERR_SYSTEM);
+    EXPECT_EQ(Problems(), "/etc/kesto/shares.conf: Invalid argument\n");
+    EXPECT_EQ(fake::LogLines().size(), 2U);
 }
 
 TEST_F(SharesTest, RecordHoldsWhatTheSectionSays) {
@@ -92,22 +139,25 @@ TEST_F(SharesTest, RecordHoldsWhatTheSectionSays) {
 TEST_F(SharesTest, EveryChangeOfTheFileIsSeen) {
     const auto write = [](const char* path, const std::string& share, std::time_t modified) {
         WriteFile(path, "[" + share + "]\npath = /v/" + share + "\n");
-        const timespec times[2] = {{modified, 0}, {modified, 0}};
+        const timespec times[2] = {{modified, 0}, {modified, 7}};
         utimensat(AT_FDCWD, path, times, 0);
     };
     EXPECT_FALSE(GetShare("a"));  // no file: no shares
-    const std::time_t tick = std::time(nullptr) + 60;
-    write(kSharesPath, "a", tick);
+    write(kSharesPath, "a", 1000);
     EXPECT_TRUE(GetShare("a"));
-    write(kSharesPath, "b", tick);  // in place, of one size, within one tick of the clock
+    write(kSharesPath, "b", 1000);  // in place, of one size, perhaps within one tick of the clock
     EXPECT_FALSE(GetShare("a"));
-    write(kSharesPath, "b", 1000);
+    clock_offset = 10;  // now it counts as known, and is not read again
     EXPECT_TRUE(GetShare("b"));
-    write("/etc/kesto/new", "a", 1000);  // another file of that size and time
-    std::filesystem::rename("/etc/kesto/new", kSharesPath);
+    write(kSharesPath, "a", 1001);
     EXPECT_TRUE(GetShare("a"));
+    write("/etc/kesto/new", "b", 1001);  // another file of that size and time
+    std::filesystem::rename("/etc/kesto/new", kSharesPath);
+    EXPECT_TRUE(GetShare("b"));
+    write(kSharesPath, "longer", 1001);
+    EXPECT_TRUE(GetShare("longer"));
     std::filesystem::remove(kSharesPath);
-    EXPECT_FALSE(GetShare("a"));
+    EXPECT_FALSE(GetShare("longer"));
 }
 
 TEST_F(SharesTest, LongestRootByComponentsHoldsAPath) {
@@ -141,3 +191,9 @@ TEST_F(SharesTest, LongestRootByComponentsHoldsAPath) {
 }
 
 }  // namespace
+
+extern "C" int clock_gettime(clockid_t clock, timespec* now) noexcept {
+    const long result = syscall(SYS_clock_gettime, clock, now);
+    now->tv_sec += clock == CLOCK_REALTIME ? clock_offset : 0;
+    return static_cast<int>(result);
+}
