@@ -8,6 +8,7 @@
 #include "common/error.h"
 #include "fileindex/folder_mgr.h"
 #include "programs/fileindexctl/command_line.h"
+#include "programs/fileindexctl/completion.h"
 #include "programs/fileindexctl/error_text.h"
 #include "programs/fileindexctl/text.h"
 
@@ -94,6 +95,10 @@ int RunAction(const Action& action, Session& session) {
 
 int Run(const std::vector<std::string>& arguments, Session& session) {
     CommandLine line;
+    if (!arguments.empty() && arguments[0] == kCompleteOption) {
+        Complete(line, {arguments.begin() + 1, arguments.end()}, session);
+        return kSuccess;
+    }
     try {
         const Chosen chosen = line.Parse(arguments);
         session.json = line.WantsJson();

@@ -101,6 +101,19 @@ void CommandLine::OnCommand(CLI::App& command, Action action, Rights rights) {
         [this, chosen = Chosen{name, std::move(action), rights}] { chosen_ = chosen; });
 }
 
+void CommandLine::SetValues(CLI::Option& option, const std::vector<std::string>& values,
+                            bool only) {
+    values_[&option] = values;
+    if (only) {
+        option.check(CLI::IsMember(values).description(""));
+    }
+}
+
+std::vector<std::string> CommandLine::ValuesOf(const CLI::Option& option) const {
+    const auto found = values_.find(&option);
+    return found == values_.end() ? std::vector<std::string>() : found->second;
+}
+
 std::string CommandLine::CallOf(const std::vector<std::string>& arguments) {
     constexpr std::size_t kLongestTyped = 64;  // beyond, it is no slip of the fingers
     CLI::App* group = &root_;

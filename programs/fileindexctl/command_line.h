@@ -2,6 +2,7 @@
 
 #include <CLI/CLI.hpp>
 #include <functional>
+#include <map>
 #include <string>
 #include <vector>
 
@@ -38,6 +39,12 @@ class CommandLine {
     /// What the command does when it is the one that the command line names.
     void OnCommand(CLI::App& command, Action action, Rights rights = Rights::kRoot);
 
+    /// The words that an option's value is one of. Others are refused when `only` is set.
+    void SetValues(CLI::Option& option, const std::vector<std::string>& values, bool only);
+
+    /// The words that were set for the option; none where any value will do.
+    std::vector<std::string> ValuesOf(const CLI::Option& option) const;
+
     CLI::App& Root() { return root_; }
 
     /// Finds out what the arguments (without the program's name) ask for. Throws CLI::Error for a
@@ -56,6 +63,7 @@ class CommandLine {
   private:
     CLI::App root_;
     bool json_ = false;
+    std::map<const CLI::Option*, std::vector<std::string>> values_;
     Chosen chosen_;
 };
 

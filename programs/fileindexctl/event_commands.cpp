@@ -113,9 +113,11 @@ void AddEventCommands(CommandLine& line) {
         kinds.emplace_back(kind.name);
     }
     add.add_option("PATH", options->path, "Full path; a relative one starts here")->required();
-    add.add_option("--kind", options->kind, "What happened")
-        ->required()
-        ->check(CLI::IsMember(kinds));
+    CLI::Option* kind = add.add_option("--kind", options->kind,
+                                       "What happened: create, modify, delete, attr, rename, "
+                                       "reindex");
+    kind->required();
+    line.SetValues(*kind, kinds, true);
     add.add_option("--from", options->from, "For a rename: the old path");
     add.add_flag("--dir", options->is_dir, "It is a directory");
     line.OnCommand(add, [options](Session& session) { return Add(*options, session); });

@@ -289,9 +289,10 @@ void AddListCommand(CommandLine& line, CLI::App& group) {
     }
     app.add_option("--offset", options->offset, "Leave out that many at the front");
     app.add_option("--limit", options->limit, "The largest number of folders")->default_str("all");
-    app.add_option("--sort", options->sort,
-                   "name, path, document, audio, video or photo; with - in front in reverse")
-        ->check(CLI::IsMember(fields).description(""));
+    CLI::Option* sort =
+        app.add_option("--sort", options->sort,
+                       "name, path, document, audio, video or photo; with - in front in reverse");
+    line.SetValues(*sort, fields, true);
     line.OnCommand(app, [options](Session& session) { return List(*options, session); });
 }
 

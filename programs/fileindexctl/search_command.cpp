@@ -223,9 +223,10 @@ void AddSearchCommand(CommandLine& line) {
         command.add_option("--limit", options->page.limit,
                            "The largest number of hits (20; with --paths all); 0 stands for all");
     command.add_option("--offset", options->page.offset, "Leave out that many hits at the front");
-    command.add_option("--sort", options->sort,
-                       "Sort by a field, with - in front from the largest on; else the most "
-                       "relevant come first");
+    CLI::Option* sort = command.add_option("--sort", options->sort,
+                                           "Sort by a field, with - in front from the largest on; "
+                                           "else the most relevant come first");
+    line.SetValues(*sort, ShortFieldNames(), false);
     command.add_flag("--paths", options->paths, "Print nothing but all paths, one a line");
     command.add_flag("--null", options->null,
                      "Like --paths, each path ended by a NUL byte: safe for every name");

@@ -264,6 +264,14 @@ bool FindField(Field& field, const std::string& name) {
     return true;
 }
 
+std::vector<std::string> ShortFieldNames() {
+    std::vector<std::string> names;
+    for (const ShortName& known : kShortNames) {
+        names.emplace_back(known.name);
+    }
+    return names;
+}
+
 std::string FieldHelp() {
     std::string help;
     for (const ShortName& known : kShortNames) {

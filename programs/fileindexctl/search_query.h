@@ -30,6 +30,9 @@ struct Field {
 /// there is none.
 bool FindField(Field& field, const std::string& name);
 
+/// The short names of fields.
+std::vector<std::string> ShortFieldNames();
+
 /// The short names, with what they stand for, as lines for the help text.
 std::string FieldHelp();
 

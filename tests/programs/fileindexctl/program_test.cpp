@@ -30,6 +30,31 @@ TEST(ProgramTest, ShowsAQueueAndReportsFailures) {
     EXPECT_EQ(support::RunProgram("fileindexctl", {"queue", "show"}).status, 2);
 }
 
+TEST(ProgramTest, ShellsCompleteByAskingTheProgram) {
+    const std::string script = FILEINDEX_SOURCE_DIR "/packaging/completions/fileindexctl.";
+    const std::string path = "PATH=" FILEINDEX_BIN_DIR ":$PATH ";
+    const std::pair<const char*, std::string> shells[] = {
+        {"bash", "bash -c '. " + script +
+                     "bash; COMP_WORDS=(fileindexctl folder re); COMP_CWORD=2; "
+                     "_fileindexctl; echo ${COMPREPLY[@]}'"},
+        {"fish", "fish --no-config -c 'source " + script +
+                     "fish; complete -C \"fileindexctl folder re\" | cut -f1'"},
+        {"zsh",
+         "zsh -f -c '_describe() { print -r -- ${${(P)2}%%:*}; }; words=(fileindexctl folder re);"
+         " CURRENT=3; . " +
+             script + "zsh'"},
+    };
+    for (const auto& [shell, call] : shells) {
+        if (std::system((std::string("command -v ") + shell + " >/dev/null").c_str()) != 0) {
+            continue;  // bash is always there
+        }
+        ASSERT_EQ(std::system((path + call + " >/tmp/completed").c_str()), 0) << shell;
+        std::string completed;
+        std::ifstream("/tmp/completed") >> completed;
+        EXPECT_EQ(completed, "reindex") << shell;
+    }
+}
+
 TEST(ProgramTest, AReaderMayGoAwayButAFullDiskIsAFailure) {
     std::string queue;
     for (int i = 0; i < 20000; ++i) {

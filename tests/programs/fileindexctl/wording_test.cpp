@@ -1,7 +1,7 @@
 #include <algorithm>
 #include <fstream>
-#include <iterator>
 
+#include "programs/fileindexctl/command_line.h"
 #include "programs/fileindexctl/error_text.h"
 #include "tests/programs/fileindexctl/ctl_fixture.h"
 
@@ -79,11 +79,6 @@ TEST_F(WordingTest, WrongCallsHaveStatusTwoAndDoNothing) {
     EXPECT_EQ(indexer.Connections(), 0);
 }
 
-std::vector<std::string> WordsOf(const std::string& command) {
-    std::istringstream in(command);
-    return {std::istream_iterator<std::string>(in), {}};
-}
-
 /// The long options that a text names.
 std::vector<std::string> OptionsIn(const std::string& text) {
     std::vector<std::string> options;
@@ -95,31 +90,76 @@ std::vector<std::string> OptionsIn(const std::string& text) {
     return options;
 }
 
-TEST_F(WordingTest, ManPageAndCompletionKnowEveryCommandAndOption) {
-    const char* commands[] = {"folder add",   "folder set",    "folder get",
-                              "folder list",  "folder delete", "folder reindex",
-                              "search",       "status",        "why",
-                              "pause",        "resume",        "share list",
-                              "share pause",  "share resume",  "share clear",
-                              "share rename", "share migrate", "share check-recycle",
-                              "volume pause", "volume resume", "volume clear",
-                              "queue show",   "event add",     "services prepare"};
-    std::string page = ReadFile(FILEINDEX_SOURCE_DIR "/packaging/man/fileindexctl.1");
-    std::erase(page, '\\');  // roff escapes each "-"
-    const std::string completion =
-        ReadFile(FILEINDEX_SOURCE_DIR "/packaging/completions/fileindexctl.bash");
-    for (const std::string command : commands) {
-        const Result help = Piped(WordsOf(command + " --help"));
-        EXPECT_EQ(help.status, kSuccess) << command;
-        EXPECT_NE(help.out.find("Examples:\n  fileindexctl " + command), std::string::npos);
-        std::vector<std::string> words = OptionsIn(help.out);
-        const std::vector<std::string> names = WordsOf(command);
-        words.insert(words.end(), names.begin(), names.end());
-        for (const std::string& word : words) {
-            EXPECT_NE(page.find(word), std::string::npos) << word;
-            EXPECT_NE(completion.find(word), std::string::npos) << word;
+/// Every command below the group, by the words that call it.
+std::vector<std::vector<std::string>> CommandsBelow(CLI::App& group,
+                                                    const std::vector<std::string>& words = {}) {
+    std::vector<std::vector<std::string>> commands;
+    for (CLI::App* app : group.get_subcommands([](const CLI::App*) { return true; })) {
+        std::vector<std::string> call = words;
+        call.push_back(app->get_name());
+        const auto below = CommandsBelow(*app, call);
+        commands.insert(commands.end(), below.begin(), below.end());
+        if (below.empty()) {
+            commands.push_back(call);
         }
     }
+    return commands;
+}
+
+std::string Joined(const std::vector<std::string>& words) {
+    std::string text;
+    for (const std::string& word : words) {
+        text += (text.empty() ? "" : " ") + word;
+    }
+    return text;
+}
+
+TEST_F(WordingTest, HelpManPageAndCompletionKnowEveryCommandAndOption) {
+    std::string page = ReadFile(FILEINDEX_SOURCE_DIR "/packaging/man/fileindexctl.1");
+    std::erase(page, '\\');  // roff escapes each "-"
+    CommandLine line;
+    for (std::vector<std::string> call : CommandsBelow(line.Root())) {
+        const std::string command = Joined(call);
+        EXPECT_NE(page.find(command), std::string::npos) << command;
+        call.emplace_back("--help");
+        const Result help = Piped(call);
+        EXPECT_EQ(help.status, kSuccess) << command;
+        EXPECT_NE(help.out.find("Examples:\n  fileindexctl " + command), std::string::npos);
+        call.insert(call.begin(), "--complete");
+        call.back() = "-";
+        const std::string completed = Piped(call).out;
+        for (const std::string& option : OptionsIn(help.out)) {
+            EXPECT_NE(page.find(option), std::string::npos) << option;
+            EXPECT_NE(("\n" + completed).find("\n" + option + "\t"), std::string::npos)
+                << command << " " << option;
+        }
+    }
+}
+
+TEST_F(WordingTest, CompletionOffersWhatFits) {
+    AddShare("music");
+    AddShare("photo");
+    SetFolders({"/photo/2019"});
+    const std::pair<std::vector<std::string>, const char*> rows[] = {
+        {{"fo"}, "folder\tChoose what is indexed\n"},
+        {{"folder", "re"}, "reindex\tCompare a folder, or a part of it, with the disk again\n"},
+        {{"event", "add", "x", "--kind", "re"}, "rename\t\nreindex\t\n"},
+        {{"event", "add", "--kind=", "x", "--from", ""}, ":files\n"},
+        {{"search", "--sort=si"}, "--sort=size\t\n"},
+        {{"search", "--share", "=", "p"}, "photo\tshare\n"},
+        {{"folder", "get", "--json", "/"}, "/photo/2019\tphoto/2019\n:files\n"},
+        {{"share", "clear", "m"}, "music\tshare\n"},
+        {{"share", "clear", "music", ""}, "/photo/2019\tphoto/2019\n:files\n"},
+        {{"share", "clear", "music", "/volume1/music", ""}, ""},
+        {{"pause", ""}, ""},
+    };
+    for (const auto& [words, offered] : rows) {
+        std::vector<std::string> arguments = words;
+        arguments.insert(arguments.begin(), "--complete");
+        EXPECT_EQ(Piped(arguments).out, offered) << Joined(words);
+    }
+    WriteFile("/var/packages/Quivra/etc/fileindex.folders", "{");
+    EXPECT_EQ(Piped({"--complete", "folder", "get", ""}).out, "");
 }
 
 }  // namespace
