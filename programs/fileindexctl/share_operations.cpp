@@ -20,6 +20,9 @@
 namespace quivra::ctl {
 namespace {
 
+/// Where a share's index is, below its root.
+constexpr const char* kIndexDirectory = "/@eaDir/fileindex";
+
 /// A share without folders is passed over by the library; who names it should learn that.
 void NeedsFolders(const std::string& share) {
     if (!fileindex::FolderMgr().IsShareIndexed(share)) {
@@ -104,7 +107,7 @@ void ClearShare(const std::string& share, const std::string& path) {
     }
     if (fileindex::FolderMgr().IsShareIndexed(share)) {
         present_root.empty() ? Detach(share, root) : fileindex::SharePause(share);
-    } else if (!IsDirExist(root + "/@eaDir/fileindex", false)) {
+    } else if (!IsDirExist(root + kIndexDirectory, false)) {
         throw Failure("there is nothing to clear: no folder of share " + share +
                       " is indexed, and no index lies below " + root);
     }
@@ -133,8 +136,12 @@ void MigrateShare(const std::string& share, const std::string& path) {
         throw Failure(attempt + "its present root " + root +
                       " is not there; mount the volume or make the directory first");
     }
-    // Documents are kept by their full paths, so the index itself tells where the share was.
-    if (CountDocuments(share, old_root) == 0) {
+    // An index that was moved along with its share cannot be asked before the daemon knows where it
+    // is, and proves the old root by not being there any more. Any other can: documents are kept by
+    // their full paths.
+    const bool moved_along = !IsDirExist(old_root + kIndexDirectory, false) &&
+                             IsDirExist(root + kIndexDirectory, false);
+    if (!moved_along && CountDocuments(share, old_root) == 0) {
         throw Failure(attempt +
                       "its index holds nothing below that path; name the root that the "
                       "share had before");
