@@ -12,10 +12,10 @@
 #include "common/error.h"
 #include "common/json.h"
 #include "common/log.h"
+#include "programs/daemon/instance_lock.h"
 #include "programs/kestoelasticd/codes.h"
 #include "programs/kestoelasticd/engine_error.h"
 #include "programs/kestoelasticd/record.h"
-#include "programs/daemon/instance_lock.h"
 
 namespace elasticd {
 namespace {
