@@ -41,11 +41,14 @@ void Batch::Changed() {
     }
 }
 
-void Batch::Upsert(const std::string& path, bool is_dir) {
+void Batch::Upsert(const std::string& path, bool is_dir, bool name_only) {
     Announce(path);
-    const bool need_meta = !is_dir && scope_.NeedsMeta(path);
+    const bool need_meta = !is_dir && !name_only && scope_.NeedsMeta(path);
     try {
         UpsertAs(path, need_meta);
+        if (need_meta) {
+            extracted_.push_back(path);
+        }
     } catch (const DocumentError& error) {
         std::optional<Attributes> there;
         if (!Look(there, path)) {
@@ -53,7 +56,9 @@ void Batch::Upsert(const std::string& path, bool is_dir) {
         }
         if (!there) {
             Drop(path);
-        } else if (!need_meta || !UpsertWithoutContent(path, error.what())) {
+        } else if (need_meta && UpsertWithoutContent(path)) {
+            Fail(path, error.what(), error.can_pass);
+        } else {
             Skip(path, error.what());
         }
     }
@@ -61,20 +66,26 @@ void Batch::Upsert(const std::string& path, bool is_dir) {
 
 void Batch::UpsertAs(const std::string& path, bool need_meta) {
     index_.Upsert(path, need_meta);
-    Changed();
-    ++counts_.indexed;
+    NoteIndexed();
 }
 
 /// Better found by its name than not at all.
-bool Batch::UpsertWithoutContent(const std::string& path, const std::string& reason) {
+bool Batch::UpsertWithoutContent(const std::string& path) {
     try {
         UpsertAs(path, false);
-        quivra::LogError({kUnit, __LINE__}, "Indexed %s without content: %s", path.c_str(),
-                         reason.c_str());
         return true;
     } catch (const DocumentError&) {
         return false;
     }
+}
+
+void Batch::NoteIndexed() {
+    Changed();
+    ++counts_.indexed;
+}
+
+void Batch::Fail(const std::string& path, const std::string& reason, bool can_pass) {
+    problems_.push_back({path, reason, can_pass});
 }
 
 void Batch::Refresh(const std::string& path, bool is_dir) {
@@ -91,9 +102,11 @@ void Batch::Refresh(const std::string& path, bool is_dir) {
     Upsert(path, is_dir);
 }
 
+/// A directory's own document goes last: as long as it is there, what is left below it is found.
 void Batch::Drop(const std::string& path) {
-    DropOne(path);
+    Announce(path);
     index_.DeleteBelow(path);
+    DropOne(path);
 }
 
 void Batch::DropOne(const std::string& path) {
@@ -136,6 +149,7 @@ bool Batch::Look(std::optional<Attributes>& there, const std::string& path) {
 
 void Batch::Skip(const std::string& path, const std::string& reason) {
     ++counts_.skipped;
+    Fail(path, reason, true);
     quivra::LogError({kUnit, __LINE__}, "Skipped %s: %s", path.c_str(), reason.c_str());
 }
 

@@ -5,6 +5,8 @@
 #include <functional>
 #include <stdexcept>
 #include <string>
+#include <utility>
+#include <vector>
 
 #include "programs/fileindexd/index.h"
 #include "programs/fileindexd/scope.h"
@@ -49,8 +51,8 @@ class Batch {
     void Announce(const std::string& path);
 
     /// A file that is gone meanwhile is dropped. One that is refused is tried without its content,
-    /// then skipped; both are logged.
-    void Upsert(const std::string& path, bool is_dir);
+    /// then skipped; both are failures. With `name_only` the content is not read.
+    void Upsert(const std::string& path, bool is_dir, bool name_only = false);
     /// Sets the attributes of a document, which is added when there is none.
     void Refresh(const std::string& path, bool is_dir);
     /// Removes the documents at and below the path; only one of both.
@@ -61,8 +63,12 @@ class Batch {
 
     /// What stands at the path; an object that cannot be examined is logged and skipped: false.
     bool Look(std::optional<Attributes>& there, const std::string& path);
-    /// Counts and logs an object that is left as it is.
+    /// Counts, logs and notes as a failure an object that is left as it is.
     void Skip(const std::string& path, const std::string& reason);
+    /// Notes that an object lacks what was to be read of it.
+    void Fail(const std::string& path, const std::string& reason, bool can_pass);
+    /// Counts what somebody else has done to the index.
+    void NoteIndexed();
 
     /// Commits what there is to commit. Throws Error 502 instead when the share's volume is no
     /// longer the one that the pass began with.
@@ -75,10 +81,14 @@ class Batch {
     void Finish() { ++state_.done; }
 
     const Counts& GetCounts() const { return counts_; }
+    /// What could not be read so far, to be tried again.
+    std::vector<Problem> TakeProblems() { return std::exchange(problems_, {}); }
+    /// The files that were sent with their content.
+    const std::vector<std::string>& Extracted() const { return extracted_; }
 
   private:
     void UpsertAs(const std::string& path, bool need_meta);
-    bool UpsertWithoutContent(const std::string& path, const std::string& reason);
+    bool UpsertWithoutContent(const std::string& path);
     void Changed();
 
     Index& index_;
@@ -87,6 +97,8 @@ class Batch {
     PassListener listener_;
     PassState state_;
     Counts counts_;
+    std::vector<Problem> problems_;
+    std::vector<std::string> extracted_;
     std::uint64_t uncommitted_ = 0;
     std::chrono::steady_clock::time_point first_uncommitted_{};
 };

@@ -1,5 +1,7 @@
 #pragma once
 
+#include <json/json.h>
+
 #include <cstdint>
 #include <string>
 
@@ -7,10 +9,19 @@ namespace fileindexd {
 
 /// A request to the resident daemon: {"type": NAME, "data": ...}.
 struct Command {
-    enum class Type { kPause, kResume, kSettingChanged, kWorkerCreate, kWorkerDelete };
+    enum class Type {
+        kPause,
+        kResume,
+        kSettingChanged,
+        kWorkerCreate,
+        kWorkerDelete,
+        kState,   ///< how the shares are
+        kFailed,  ///< what could not be read
+        kRetry,   ///< try that again
+    };
 
     Type type = Type::kResume;
-    std::string share;             ///< of all but kPause and kResume
+    std::string share;             ///< of all but kPause, kResume and kState
     std::int64_t resume_time = 0;  ///< of kPause; see quivra::fileindex::StatusMgr
 };
 
@@ -19,6 +30,8 @@ Command ParseCommand(const std::string& request);
 
 /// {"success": true}
 std::string SuccessReply();
+/// {"success": true, "data": DATA}
+std::string DataReply(const Json::Value& data);
 /// {"success": false, "error": {"code": CODE, "msg": MESSAGE}}
 std::string ErrorReply(int code, const std::string& message);
 

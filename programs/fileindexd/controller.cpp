@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <chrono>
 #include <climits>
+#include <csignal>
 #include <ctime>
 #include <memory>
 #include <utility>
@@ -13,6 +14,7 @@
 #include "fileindex/folder_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "programs/fileindexd/state_file.h"
+#include "programs/fileindexd/worker.h"
 
 namespace fileindexd {
 
@@ -22,6 +24,9 @@ namespace {
 
 /// The system clock may be set: the end of a pause is looked at this often.
 constexpr std::chrono::seconds kPauseCheck{30};
+
+/// A killed worker ends, unless the kernel itself waits for a disk on its behalf.
+constexpr std::chrono::seconds kLongestStop{10};
 
 }  // namespace
 
@@ -89,6 +94,12 @@ void Controller::ShowStopped(const std::string& share) const {
 
 void Controller::Execute(const Command& command, Reply reply, Clock::time_point now) {
     switch (command.type) {
+        case Command::Type::kState:
+            return reply(DataReply(DescribeShares()));
+        case Command::Type::kRetry:
+            return reply(Retry(command.share));
+        case Command::Type::kFailed:
+            return reply(ErrorReply(quivra::Error::kBadArgument, "Not answered here"));
         case Command::Type::kPause:
             resume_time_ = command.resume_time;
             break;
@@ -112,11 +123,48 @@ void Controller::Execute(const Command& command, Reply reply, Clock::time_point 
                            command.type == Command::Type::kSettingChanged;
     if (must_stop && !supervisor_.IsWanted(command.share)) {
         // Its queue and its index may be taken away next.
-        waiting_.push_back({command.share, std::move(reply)});
-        AnswerWaiting();
+        waiting_.push_back({command.share, std::move(reply), now + kLongestStop});
+        AnswerWaiting(now);
     } else {
         reply(SuccessReply());
     }
+}
+
+/// What the workers say of themselves; of one that says nothing, why.
+Json::Value Controller::DescribeShares() const {
+    std::set<std::string> shares = indexed_;
+    shares.insert(paused_.begin(), paused_.end());
+    for (const auto& [share, created] : commanded_) {
+        created ? void(shares.insert(share)) : void(shares.erase(share));
+    }
+    Json::Value data;
+    data["shares"] = Json::Value(Json::arrayValue);
+    for (const std::string& share : shares) {
+        Json::Value state = StateFile::Read(share);
+        if (state.isNull()) {
+            state["share"] = share;
+            state["state"] = "waiting";
+            state["problem"] = supervisor_.IsRunning(share)
+                                   ? ""
+                                   : "the worker of share " + share + " has ended; see the log";
+            for (const char* member : {"waiting", "waiting_bytes", "failed"}) {
+                state[member] = 0;
+            }
+            state["phase"] = "";
+            state["eta"] = -1;
+        }
+        data["shares"].append(state);
+    }
+    return data;
+}
+
+std::string Controller::Retry(const std::string& share) const {
+    const pid_t pid = supervisor_.PidOf(share);
+    if (pid <= 0 || kill(pid, kRetrySignal) != 0) {
+        return ErrorReply(quivra::Error::kBadArgument,
+                          "Share " + share + " has no worker: it is paused, or not indexed");
+    }
+    return SuccessReply();
 }
 
 void Controller::Reload(Clock::time_point now) {
@@ -126,10 +174,15 @@ void Controller::Reload(Clock::time_point now) {
     Reconcile(now);
 }
 
-void Controller::AnswerWaiting() {
+void Controller::AnswerWaiting(Clock::time_point now) {
     for (auto it = waiting_.begin(); it != waiting_.end();) {
-        if (supervisor_.IsRunning(it->share)) {
+        if (supervisor_.IsRunning(it->share) && now < it->until) {
             ++it;
+        } else if (supervisor_.IsRunning(it->share)) {
+            it->reply(ErrorReply(quivra::Error::kSystemCallFailed,
+                                 "The worker of share " + it->share +
+                                     " does not end: it waits for a disk, perhaps"));
+            it = waiting_.erase(it);
         } else {
             it->reply(SuccessReply());
             it = waiting_.erase(it);
@@ -142,11 +195,14 @@ void Controller::Update(Clock::time_point now) {
         Reconcile(now);
     }
     supervisor_.Update(now);
-    AnswerWaiting();
+    AnswerWaiting(now);
 }
 
 std::optional<Controller::Clock::time_point> Controller::Due(Clock::time_point now) const {
     std::optional<Clock::time_point> due = supervisor_.NextUpdate();
+    for (const Waiting& waiting : waiting_) {
+        due = std::min(due.value_or(waiting.until), waiting.until);
+    }
     if (was_paused_ && resume_time_ != kPausedWithoutEnd) {
         const std::chrono::seconds left(std::max<std::int64_t>(resume_time_ - time(nullptr), 0));
         const Clock::time_point check = now + std::min(left, kPauseCheck);
@@ -158,7 +214,7 @@ std::optional<Controller::Clock::time_point> Controller::Due(Clock::time_point n
 void Controller::ShutDown(Clock::time_point now) {
     shut_down_ = true;
     Reconcile(now);
-    AnswerWaiting();
+    AnswerWaiting(now);
 }
 
 }  // namespace fileindexd

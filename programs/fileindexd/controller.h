@@ -1,5 +1,7 @@
 #pragma once
 
+#include <json/json.h>
+
 #include <cstdint>
 #include <functional>
 #include <list>
@@ -25,8 +27,8 @@ class Controller {
     /// Reads the pause state and the folder set; throws what these do.
     explicit Controller(Supervisor& supervisor);
 
-    /// Carries a command out and answers it: at once, or, when a worker has to stop first, in an
-    /// Update to come.
+    /// Carries a command out and replies: at once, or, when a worker has to stop first, in an
+    /// Update to come. kFailed is not this class's matter.
     void Execute(const Command& command, Reply reply, Clock::time_point now);
 
     /// Reads the pause state and the folder set again; throws what these do.
@@ -44,6 +46,7 @@ class Controller {
     struct Waiting {
         std::string share;
         Reply reply;
+        Clock::time_point until;
     };
 
     bool IsPaused() const;
@@ -51,7 +54,9 @@ class Controller {
     void Reconcile(Clock::time_point now);
     /// Brings the state file of a share without a worker up to date.
     void ShowStopped(const std::string& share) const;
-    void AnswerWaiting();
+    void AnswerWaiting(Clock::time_point now);
+    Json::Value DescribeShares() const;
+    std::string Retry(const std::string& share) const;
 
     Supervisor& supervisor_;
     std::int64_t resume_time_;

@@ -28,6 +28,7 @@ void ProcessShare(const std::string& share) {
     Counts counts;
     ShareWorker worker(share);
     quivra::fileindex::elastic::ShareIndexCreate(share);
+    worker.CheckIndex();
     for (;;) {
         const PassResult result = worker.RunPass();
         if (!result.had_work) {
@@ -35,6 +36,9 @@ void ProcessShare(const std::string& share) {
         }
         consumed += result.consumed;
         counts += result.counts;
+    }
+    for (auto next = worker.NextSlice(); next && next->count() == 0; next = worker.NextSlice()) {
+        counts += worker.RunSlice().counts;
     }
     worker.State().Remove();
     Print(share, consumed, counts, std::chrono::steady_clock::now() - begin);

@@ -2,12 +2,14 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <limits>
+#include <ctime>
 
+#include "base/path.h"
+#include "base/queue_file.h"
 #include "common/json.h"
 #include "common/log.h"
 #include "fileindex/queue_mgr.h"
-#include "programs/fileindexd/paths.h"
+#include "programs/fileindexd/failures.h"
 #include "programs/fileindexd/renames.h"
 
 namespace fileindexd {
@@ -19,11 +21,12 @@ namespace {
 
 constexpr const char* kUnit = "pass";
 
-/// How much older than its event, in seconds, a change may be: the monitor may lag behind.
-constexpr std::int64_t kMonitorLag = 2;
-
 /// With more changes than this at once, none is the one of a file that is too busy.
 constexpr std::size_t kMaxChanged = 1000;
+
+/// How long a pass extracts content itself: a person who saves a file is served at once, and nobody
+/// waits for the ten thousand that are being copied.
+constexpr std::chrono::milliseconds kContentTime{300};
 
 constexpr ContentClasses kAllClasses{true, true, true, true};
 
@@ -36,65 +39,85 @@ ContentClasses ClassesOf(const Json::Value& settings) {
     return classes;
 }
 
-/// Files that may have changed since their last indexing: all, where the beginning of the working
-/// copy is not known.
-std::int64_t FreshSince(const WorkingCopy& copy) {
-    return copy.created ? *copy.created - kMonitorLag : std::numeric_limits<std::int64_t>::min();
+bool IsUpsert(const OP& op) {
+    return op.op == quivra::fileindex::OP_UPSERT;
 }
 
 }  // namespace
 
-Pass::Pass(std::string queue_path, std::string root, Index& index, const Scope& scope,
-           PassListener listener)
-    : queue_path_(std::move(queue_path)),
-      root_(std::move(root)),
+Pass::Pass(Share share, Index& index, const Scope& scope, PassListener listener)
+    : share_(std::move(share)),
       index_(index),
       scope_(scope),
       listener_(std::move(listener)),
-      rules_(scope_.Describe(root_)),
-      applied_rules_(queue_path_ + ".rules") {}
+      rules_(scope_.Describe(share_.root)),
+      content_until_(std::chrono::steady_clock::now() + kContentTime) {}
 
 PassResult Pass::Run() {
     PassResult result;
-    const ShareTree tree(root_);
-    quivra::fileindex::QueueMgr queue(queue_path_);
+    const ShareTree tree(share_.root);
+    quivra::fileindex::QueueMgr queue(share_.queue_path);
+    const std::string copy_path = quivra::base::WorkingCopy(share_.queue_path);
     std::vector<std::shared_ptr<OP>> ops;
     result.consumed =
         queue.ProcessOP([&](std::shared_ptr<OP> op) { ops.push_back(std::move(op)); }, true);
-    const std::optional<WorkingCopy> copy = WorkingCopy::At(queue_path_ + ".tmp");
+    const std::optional<WorkingCopy> copy =
+        WorkingCopy::At(share_.directory.Fd(), std::string(quivra::base::Name(copy_path)));
     if (!copy) {
         return result;
     }
     result.had_work = true;
-    CheckShare(tree);
+    copy_ = *copy;
+    if (!share_.backlog.IsMerged(copy_)) {
+        CheckShare(tree);
+        CarryOut(tree, ops);
+        result.changed = ChangedFiles();
+        result.counts = batch_->GetCounts();
+        result.left = std::move(addition_);
+    }
+    if (queue.DeleteTmp() != 0 && errno != ENOENT) {
+        quivra::Fail(
+            {kUnit, __LINE__}, "queue.DeleteTmp() != 0",
+            Error(Error::kSystemCallFailed, "The working copy cannot be deleted: " + copy_path));
+    }
+    return result;
+}
 
+void Pass::CarryOut(const ShareTree& tree, const std::vector<std::shared_ptr<OP>>& ops) {
     batch_ = std::make_unique<Batch>(index_, tree, scope_, listener_);
-    settler_ = std::make_unique<Settler>(*batch_, index_, tree, scope_, FreshSince(*copy));
-    progress_ = std::make_unique<Progress>(queue_path_ + ".progress", *copy);
+    settler_ = std::make_unique<Settler>(*batch_, index_, tree, scope_);
+    steps_ = share_.backlog.Steps(copy_);
     Sort(ops);
     RunRenames(tree);
     RunSingles();
     RunRoots();
     batch_->Commit();
     tree.CheckMounted();
-    applied_rules_.Store(rules_);
+    Leave();
+}
 
-    result.changed = ChangedFiles();
-    result.counts = batch_->GetCounts();
-    if (queue.DeleteTmp() != 0 && errno != ENOENT) {
-        const std::string reason = "The working copy cannot be deleted: " + queue_path_ + ".tmp";
-        quivra::Fail({kUnit, __LINE__}, "queue.DeleteTmp() != 0",
-                     Error(Error::kSystemCallFailed, reason));
+/// The index holds what the pass did: what it has left to do must not be lost any more.
+void Pass::Leave() {
+    addition_.failures = ReadProblems(index_, batch_->Extracted());
+    for (const std::string& path : batch_->Extracted()) {
+        const bool failed =
+            std::any_of(addition_.failures.begin(), addition_.failures.end(),
+                        [&](const Problem& problem) { return problem.path == path; });
+        if (!failed) {
+            addition_.done.push_back(path);
+        }
     }
-    progress_->Remove();
-    return result;
+    for (Problem& problem : batch_->TakeProblems()) {
+        addition_.failures.push_back(std::move(problem));
+    }
+    share_.backlog.Merge(addition_, copy_, rules_, time(nullptr));
 }
 
 std::vector<std::string> Pass::ChangedFiles() const {
     std::vector<std::string> changed;
     if (singles_.size() <= kMaxChanged) {
         for (const auto& op : singles_) {
-            if (op->op == quivra::fileindex::OP_UPSERT) {
+            if (IsUpsert(*op)) {
                 changed.push_back(op->node->GetPath());
             }
         }
@@ -103,29 +126,40 @@ std::vector<std::string> Pass::ChangedFiles() const {
 }
 
 void Pass::CheckShare(const ShareTree& tree) const {
-    if (tree.IsEmpty() && !index_.ListBelow(root_, 0, 1).empty()) {
+    if (tree.IsEmpty() && !index_.ListBelow(share_.root, "", 1).empty()) {
         quivra::Fail({kUnit, __LINE__}, "tree.IsEmpty()",
                      Error(Error::kSystemCallFailed,
                            "The share's root is empty, but its index is not; is the volume "
                            "mounted? path=" +
-                               root_));
+                               share_.root));
     }
+}
+
+/// Anybody may write lines: what concerns another place must not make us drop documents.
+bool Pass::IsOurs(const std::string& path) const {
+    return quivra::base::IsAtOrBelow(path, share_.root) && quivra::base::IsCanonicalText(path);
 }
 
 void Pass::Sort(const std::vector<std::shared_ptr<OP>>& ops) {
     using namespace quivra::fileindex;
     const ContentClasses reindexed =
-        applied_rules_.AreEqualTo(rules_) ? ContentClasses{} : kAllClasses;
+        share_.backlog.Rules() == rules_ ? ContentClasses{} : kAllClasses;
     for (const auto& op : ops) {
-        const std::string path = op->op == OP_REINDEX_ALL ? root_ : op->node->GetPath();
+        const std::string path = op->op == OP_REINDEX_ALL ? share_.root : op->node->GetPath();
+        if (op->op == OP_RENAME) {
+            SortRename(op->path, path);
+            continue;
+        }
+        if (!IsOurs(path)) {
+            quivra::LogError({kUnit, __LINE__}, "Queue %s: %s does not lie in the share",
+                             share_.queue_path.c_str(), path.c_str());
+            continue;
+        }
         switch (op->op) {
             case OP_DELETE:
             case OP_UPSERT:
             case OP_ATTR:
                 singles_.push_back(op);
-                break;
-            case OP_RENAME:
-                renames_.push_back({op->path, path, Rename::Plan::kMove});
                 break;
             case OP_UPDATE_CFG:
                 roots_.push_back({path, ClassesOf(op->data), false});
@@ -134,15 +168,29 @@ void Pass::Sort(const std::vector<std::shared_ptr<OP>>& ops) {
             case OP_REINDEX_ALL:
                 roots_.push_back({path, reindexed, false});
                 break;
-            case OP_NONE:
+            default:
                 break;
         }
     }
     batch_->Expect(singles_.size() + renames_.size());
 }
 
+/// The old place may lie outside: the whole share may have been renamed.
+void Pass::SortRename(const std::string& from, const std::string& to) {
+    const bool is_from_above = quivra::base::IsBelow(share_.root, from);
+    if (IsOurs(to) && quivra::base::IsCanonicalText(from) && !is_from_above) {
+        renames_.push_back({from, to, Rename::Plan::kMove});
+        return;
+    }
+    for (const std::string& path : {from, to}) {
+        if (IsOurs(path)) {
+            roots_.push_back({path, {}, false});
+        }
+    }
+}
+
 bool Pass::HasDocuments(const std::string& path) const {
-    return !index_.Find({path}).empty() || !index_.ListBelow(path, 0, 1).empty();
+    return !index_.Find({path}).empty() || !index_.ListBelow(path, "", 1).empty();
 }
 
 void Pass::RunRenames(const ShareTree& tree) {
@@ -151,7 +199,7 @@ void Pass::RunRenames(const ShareTree& tree) {
     }
     // What an interrupted pass has sent may still be waiting in the search daemon.
     index_.Commit();
-    const bool again = progress_->Steps() > 0;
+    const bool again = steps_ > 0;
     if (!again) {
         PlanRenames(renames_, [this](const std::string& path) { return HasDocuments(path); });
     }
@@ -159,8 +207,12 @@ void Pass::RunRenames(const ShareTree& tree) {
                                         ? std::vector<bool>(renames_.size(), false)
                                         : CarryOutRenames(renames_, *batch_, index_, tree, scope_);
     for (std::size_t i = 0; i < renames_.size(); ++i) {
-        roots_.push_back({renames_[i].from, {}, false});
-        roots_.push_back({renames_[i].to, {}, moved[i]});
+        const Rename& rename = renames_[i];
+        roots_.push_back({rename.from, {}, false});
+        roots_.push_back({rename.to, share_.backlog.AgainAt(rename.from), moved[i]});
+        if (rename.from != rename.to) {
+            addition_.moves.push_back({rename.from, rename.to, !moved[i]});
+        }
         batch_->Finish();
     }
     if (!again && !renames_.empty()) {
@@ -171,9 +223,12 @@ void Pass::RunRenames(const ShareTree& tree) {
 void Pass::RunSingles() {
     for (std::size_t i = 0; i < singles_.size(); ++i) {
         const std::size_t step = 2 + i;
-        if (step > progress_->Steps()) {
+        if (step > steps_) {
             RunSingle(*singles_[i]);
             StepDone(step);
+        } else if (IsUpsert(*singles_[i])) {
+            // The interrupted pass may have left the content for later.
+            addition_.files.push_back({singles_[i]->node->GetPath(), 0});
         }
         batch_->Finish();
     }
@@ -189,15 +244,29 @@ void Pass::RunSingle(const OP& op) {
     const bool only_attributes = op.op == quivra::fileindex::OP_ATTR;
     if (there && there->is_dir && !only_attributes) {
         // A file was to come or go here, and now it is a directory of unknown content.
-        batch_->Commit();
-        settler_->Settle(path);
+        roots_.push_back({path, {}, false});
+        if (covered) {
+            batch_->Upsert(path, true);
+        }
     } else if (!covered) {
         batch_->Drop(path);
+        addition_.dropped.push_back(path);
     } else if (only_attributes) {
         batch_->Refresh(path, there->is_dir);
     } else {
+        UpsertFile(path, there->size);
+    }
+}
+
+/// The content of a few files now, that of many by and by, so that a pass stays short.
+void Pass::UpsertFile(const std::string& path, std::int64_t size) {
+    if (std::chrono::steady_clock::now() < content_until_ || !scope_.NeedsMeta(path)) {
         batch_->Upsert(path, false);
-        settler_->NoteIndexed(path);
+        return;
+    }
+    addition_.files.push_back({path, size});
+    if (index_.Find({path}).empty()) {
+        batch_->Upsert(path, false, true);
     }
 }
 
@@ -208,7 +277,7 @@ void Pass::MergeRoots() {
     std::vector<Root> merged;
     std::vector<std::size_t> above;  // the roots in `merged` that the present one lies below
     for (Root& root : roots_) {
-        while (!above.empty() && !IsAtOrBelow(root.path, merged[above.back()].path)) {
+        while (!above.empty() && !quivra::base::IsAtOrBelow(root.path, merged[above.back()].path)) {
             above.pop_back();
         }
         if (!above.empty() && merged[above.back()].path == root.path) {
@@ -231,20 +300,37 @@ void Pass::MergeRoots() {
 void Pass::RunRoots() {
     MergeRoots();
     const std::size_t steps_before = 1 + singles_.size();
-    if (!roots_.empty() && progress_->Steps() <= steps_before) {
+    if (!roots_.empty() && steps_ <= steps_before) {
         Commit(steps_before);  // settling looks at what is committed
     }
-    for (std::size_t i = 0; i < roots_.size(); ++i) {
-        const std::size_t step = steps_before + 1 + i;
-        if (step <= progress_->Steps()) {
-            continue;
-        }
-        if (roots_[i].moved) {
-            settler_->SettleMoved(roots_[i].path);
-        } else {
-            settler_->Settle(roots_[i].path, roots_[i].again);
-        }
-        StepDone(step);
+    for (const Root& root : roots_) {
+        RunRoot(root);
+    }
+}
+
+void Pass::RunRoot(const Root& root) {
+    if (!IsOurs(root.path)) {
+        // The old place of a share that was renamed: its documents have moved, or are nobody's.
+        batch_->Drop(root.path);
+        addition_.dropped.push_back(root.path);
+        return;
+    }
+    const Settler::Found found =
+        root.moved ? settler_->SettleMoved(root.path) : settler_->Settle(root.path, root.again);
+    switch (found) {
+        case Settler::Found::kNothing:
+            addition_.dropped.push_back(root.path);
+            break;
+        case Settler::Found::kDirectory:
+            addition_.trees.push_back({0, root.path, root.again});
+            break;
+        case Settler::Found::kFile:
+            if (root.moved && root.again.Any()) {
+                addition_.files.push_back({root.path, 0});
+            }
+            break;
+        case Settler::Found::kUnknown:
+            break;
     }
 }
 
@@ -256,8 +342,9 @@ void Pass::StepDone(std::size_t step) {
 
 void Pass::Commit(std::size_t steps) {
     batch_->Commit();
-    if (steps > progress_->Steps()) {
-        progress_->Store(steps);
+    if (steps > steps_) {
+        share_.backlog.StoreSteps(copy_, steps);
+        steps_ = steps;
     }
 }
 

@@ -10,11 +10,13 @@
 #include <cstring>
 #include <string_view>
 
+#include "base/file.h"
 #include "common/error.h"
 #include "common/log.h"
 #include "common/util.h"
 #include "fileindex/event.h"
 #include "fileindex/status_mgr.h"
+#include "programs/fileindexd/backlog.h"
 
 namespace fileindexd {
 
@@ -50,17 +52,20 @@ Clock::time_point NotBefore(const std::string& line, const ChangeRates& rates,
 
 }  // namespace
 
-QueueWatch::QueueWatch(const std::string& queue_path)
-    : queue_path_(queue_path), inotify_(inotify_init1(IN_CLOEXEC | IN_NONBLOCK)) {
-    const std::string directory = quivra::Dirname(queue_path_);
-    queue_watch_ = inotify_add_watch(
-        inotify_.Get(), directory.c_str(),
-        IN_MODIFY | IN_MOVED_TO | IN_CREATE | IN_DELETE_SELF | IN_MOVE_SELF | IN_ONLYDIR);
+QueueWatch::QueueWatch(const quivra::base::PrivateDirectory& directory, std::string queue)
+    : directory_(directory),
+      queue_(std::move(queue)),
+      inotify_(inotify_init1(IN_CLOEXEC | IN_NONBLOCK)) {
+    // By the descriptor: another directory may stand at the path by now.
+    const std::string opened = "/proc/self/fd/" + std::to_string(directory_.Fd());
+    queue_watch_ = inotify_add_watch(inotify_.Get(), opened.c_str(),
+                                     IN_MODIFY | IN_MOVED_TO | IN_CREATE | IN_DELETE |
+                                         IN_MOVED_FROM | IN_MOVE_SELF | IN_ONLYDIR);
     if (queue_watch_ < 0) {
-        quivra::Fail(
-            {kUnit, __LINE__}, "queue_watch_ < 0",
-            quivra::Error(quivra::Error::kSystemCallFailed,
-                          "Cannot watch " + directory + ": " + quivra::SystemErrorText(errno)));
+        quivra::Fail({kUnit, __LINE__}, "queue_watch_ < 0",
+                     quivra::Error(quivra::Error::kSystemCallFailed,
+                                   "Cannot watch " + directory_.Path() + ": " +
+                                       quivra::SystemErrorText(errno)));
     }
     const std::string status = quivra::Dirname(quivra::fileindex::kFileIndexStatusCfgPath);
     status_watch_ = inotify_add_watch(inotify_.Get(), status.c_str(), IN_MOVED_TO | IN_CLOSE_WRITE);
@@ -95,15 +100,18 @@ void QueueWatch::HandleEvent(News& news, int watch, unsigned int mask, const cha
     if ((mask & IN_Q_OVERFLOW) != 0) {
         news.queue = news.status = true;
     } else if (watch == queue_watch_) {
-        news.gone |= (mask & (IN_DELETE_SELF | IN_MOVE_SELF | IN_UNMOUNT | IN_IGNORED)) != 0;
-        news.queue |= quivra::Basename(queue_path_) == name;
+        // While it is held open, no event tells that the directory itself was removed.
+        const bool is_lost = (mask & (IN_DELETE | IN_MOVED_FROM)) != 0;
+        news.gone |= (mask & (IN_MOVE_SELF | IN_UNMOUNT | IN_IGNORED)) != 0 ||
+                     (is_lost && std::strcmp(name, Backlog::kFileName) == 0);
+        news.queue |= !is_lost && queue_ == name;
     } else if (watch == status_watch_) {
         news.status |= quivra::Basename(quivra::fileindex::kFileIndexStatusCfgPath) == name;
     }
 }
 
 void QueueWatch::ReadNewLines(Schedule& schedule, const ChangeRates& rates, Clock::time_point now) {
-    const quivra::base::UniqueFd fd(open(queue_path_.c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
+    const quivra::base::UniqueFd fd = quivra::base::OpenRegular(directory_.Fd(), queue_, O_RDONLY);
     struct stat info {};
     if (!fd.IsValid() || fstat(fd.Get(), &info) != 0) {
         return;  // a pass, perhaps of another process, has taken it

@@ -5,6 +5,7 @@
 #include <string>
 #include <vector>
 
+#include "base/private_directory.h"
 #include "base/unique_fd.h"
 #include "programs/fileindexd/schedule.h"
 
@@ -16,11 +17,12 @@ class QueueWatch {
     struct News {
         bool queue = false;   ///< lines were added
         bool status = false;  ///< the status file was replaced
-        bool gone = false;    ///< the queue's directory was removed or unmounted
+        bool gone = false;    ///< the directory, or what we keep there, was removed
     };
 
-    /// Throws Error 502 when the queue's directory cannot be watched.
-    explicit QueueWatch(const std::string& queue_path);
+    /// `directory`, in which the queue of that name lies, must outlive the object. Throws Error 502
+    /// when it cannot be watched.
+    QueueWatch(const quivra::base::PrivateDirectory& directory, std::string queue);
 
     /// Readable when there is news.
     int Fd() const { return inotify_.Get(); }
@@ -36,7 +38,8 @@ class QueueWatch {
   private:
     void HandleEvent(News& news, int watch, unsigned int mask, const char* name) const;
 
-    const std::string queue_path_;
+    const quivra::base::PrivateDirectory& directory_;
+    const std::string queue_;
     quivra::base::UniqueFd inotify_;
     int queue_watch_ = -1;
     int status_watch_ = -1;

@@ -5,8 +5,8 @@
 #include <string_view>
 #include <utility>
 
+#include "base/path.h"
 #include "common/util.h"
-#include "programs/fileindexd/paths.h"
 
 namespace fileindexd {
 
@@ -72,23 +72,25 @@ void RemoveRepeats(std::vector<Rename>& renames) {
 bool RenameBelow(const Rename& rename, Batch& batch, Index& index) {
     bool moved = false;
     std::string top;
-    for (std::size_t offset = 0;; offset += kListPage) {
-        const std::vector<Document> page = index.ListBelow(rename.from, offset, kListPage);
+    std::string last;
+    for (;;) {
+        const std::vector<Document> page = index.ListBelow(rename.from, last, kListPage);
         for (const Document& document : page) {
-            if (top.empty() || !IsBelow(document.path, top)) {
+            if (top.empty() || !quivra::base::IsBelow(document.path, top)) {
                 top = document.path;
-                moved |= batch.Rename(Moved(top, rename.from, rename.to), top);
+                moved |= batch.Rename(quivra::base::Moved(top, rename.from, rename.to), top);
             }
         }
         if (page.size() < kListPage) {
             return moved;
         }
+        last = page.back().path;
     }
 }
 
 /// Whether the documents say the same at the new place as they did at the old one.
 bool StayValid(const Rename& rename, bool is_dir, const ShareTree& tree, const Scope& scope) {
-    if (!IsAtOrBelow(rename.from, tree.Root())) {
+    if (!quivra::base::IsAtOrBelow(rename.from, tree.Root())) {
         return true;  // the whole share has moved, and its folders with it
     }
     if (is_dir) {

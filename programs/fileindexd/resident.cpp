@@ -15,6 +15,8 @@
 #include <thread>
 #include <utility>
 
+#include "base/path.h"
+#include "base/private_directory.h"
 #include "base/unique_fd.h"
 #include "common/error.h"
 #include "common/log.h"
@@ -22,8 +24,10 @@
 #include "programs/daemon/program.h"
 #include "programs/daemon/service_manager.h"
 #include "programs/daemon/signals.h"
+#include "programs/fileindexd/backlog.h"
 #include "programs/fileindexd/controller.h"
 #include "programs/fileindexd/state_file.h"
+#include "sdk/share.h"
 
 namespace fileindexd {
 
@@ -36,6 +40,9 @@ constexpr const char* kUnit = "fileindexd";
 
 /// No command is long.
 constexpr std::size_t kMaxRequest = 1024 * 1024;
+
+/// So many are read by nobody.
+constexpr std::size_t kMaxFailures = 10000;
 
 /// Hands commands from the server's threads over to the one that supervises.
 class CommandQueue {
@@ -84,11 +91,39 @@ class CommandQueue {
     bool closed_ = false;
 };
 
+/// Read from the share's disk, which may be slow: not by the thread that supervises.
+std::string ListFailures(const std::string& share) {
+    const std::string queue = quivra::sdk::SDKShare(share).GetQueuePath();
+    const auto directory =
+        quivra::base::PrivateDirectory::Open(std::string(quivra::base::Directory(queue)));
+    if (!directory.IsValid()) {
+        return ErrorReply(Error::kSystemCallFailed, directory.Problem().empty()
+                                                        ? "Cannot open " + directory.Path() + ": " +
+                                                              quivra::SystemErrorText(errno)
+                                                        : directory.Problem());
+    }
+    Json::Value list(Json::arrayValue);
+    for (const Backlog::Failure& failure : Backlog::ReadFailures(directory, kMaxFailures)) {
+        Json::Value entry;
+        entry["path"] = failure.path;
+        entry["reason"] = failure.reason;
+        entry["since"] = Json::Int64(failure.since);
+        entry["next_try"] = Json::Int64(failure.next_try);
+        list.append(entry);
+    }
+    return DataReply(list);
+}
+
+/// Every request gets a reply: its client may hold a lock.
 std::string Answer(CommandQueue& queue, const std::string& request) {
     try {
-        return queue.Run(ParseCommand(request));
+        const Command command = ParseCommand(request);
+        return command.type == Command::Type::kFailed ? ListFailures(command.share)
+                                                      : queue.Run(command);
     } catch (const Error& error) {
         return ErrorReply(error.code, error.reason);
+    } catch (const std::exception& error) {
+        return ErrorReply(Error::kSystemCallFailed, error.what());
     }
 }
 
@@ -164,6 +199,9 @@ class Resident {
         } catch (const Error& error) {
             quivra::LogError({kUnit, __LINE__}, "A command failed: %s", error.what());
             reply->set_value(ErrorReply(error.code, error.reason));
+        } catch (const std::exception& error) {
+            quivra::LogError({kUnit, __LINE__}, "A command failed: %s", error.what());
+            reply->set_value(ErrorReply(Error::kSystemCallFailed, error.what()));
         }
     }
 

@@ -6,7 +6,8 @@ namespace fileindexd {
 
 void Schedule::QueueChanged(Clock::time_point now) {
     if (!burst_) {
-        burst_ = Burst{now, now};
+        const bool is_calm = !last_pass_ || now - *last_pass_ >= kQuiet;
+        burst_ = Burst{now, now, is_calm};
     }
     burst_->last = now;
 }
@@ -20,11 +21,19 @@ void Schedule::PassBegins() {
     later_.reset();
 }
 
+void Schedule::PassSucceeded(Clock::time_point now) {
+    failures_ = 0;
+    last_pass_ = now;
+}
+
 void Schedule::PassFailed(Clock::time_point now) {
-    // 2^9 seconds are more than kLastRetry.
-    const std::chrono::seconds wait = kFirstRetry * (1 << std::min(failures_, 9));
+    retry_ = now + RetryAfter(failures_);
     ++failures_;
-    retry_ = now + std::min(wait, kLastRetry);
+}
+
+std::chrono::seconds Schedule::RetryAfter(int failures) {
+    // 2^9 seconds are more than kLastRetry.
+    return std::min(kFirstRetry * (1 << std::min(failures, 9)), kLastRetry);
 }
 
 std::optional<Clock::time_point> Schedule::Due() const {
@@ -33,7 +42,8 @@ std::optional<Clock::time_point> Schedule::Due() const {
     }
     if (burst_) {
         const Clock::time_point due =
-            std::min(burst_->last + kQuiet, burst_->first + kLongestBurst);
+            burst_->is_first ? burst_->first
+                             : std::min(burst_->last + kQuiet, burst_->first + kLongestBurst);
         return std::min(due, later_.value_or(due));
     }
     return later_;

@@ -9,7 +9,8 @@ namespace fileindexd {
 
 using Clock = std::chrono::steady_clock;
 
-/// When the next pass over a share's queue is due. Keeps no clock of its own.
+/// When the next pass over a share's queue is due: at once for the first change of a calm share,
+/// after the burst for what follows it. Keeps no clock of its own.
 class Schedule {
   public:
     /// A burst is over after this time without a change, or this long after it began.
@@ -26,9 +27,12 @@ class Schedule {
 
     /// What was queued until now is about to be processed.
     void PassBegins();
-    void PassSucceeded() { failures_ = 0; }
+    void PassSucceeded(Clock::time_point now);
     /// What was being processed still has to be.
     void PassFailed(Clock::time_point now);
+
+    /// How long to wait after that many failures in a row, and one more.
+    static std::chrono::seconds RetryAfter(int failures);
 
     /// None while there is nothing to do.
     std::optional<Clock::time_point> Due() const;
@@ -38,12 +42,14 @@ class Schedule {
     struct Burst {
         Clock::time_point first;
         Clock::time_point last;
+        bool is_first;  ///< of a calm share
     };
 
     std::optional<Burst> burst_;
     std::optional<Clock::time_point> later_;
     int failures_ = 0;
     Clock::time_point retry_{};
+    std::optional<Clock::time_point> last_pass_;
 };
 
 /// Remembers which files change again and again, a log or a download for instance: each indexing

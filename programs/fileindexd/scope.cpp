@@ -2,12 +2,13 @@
 
 #include <algorithm>
 #include <climits>
+#include <unordered_map>
 
+#include "base/path.h"
 #include "common/json.h"
 #include "common/util.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/util.h"
-#include "programs/fileindexd/paths.h"
 
 namespace fileindexd {
 
@@ -32,6 +33,26 @@ ContentClasses ClassesOf(const Folder& folder) {
     return {folder.GetDocument(), folder.GetAudio(), folder.GetVideo(), folder.GetPhoto()};
 }
 
+/// Answers of the platform that are kept, because files come directory by directory.
+constexpr std::size_t kMaxKnown = 4096;
+
+/// A volume, a share and what lies near its root: the recycle bins of homes do.
+constexpr int kDecidingDepth = 6;
+
+/// The beginning of the path that decides whether the directory may hold what is indexed: its
+/// first components, and all up to the last that may be the name of a recycle bin or of snapshots
+/// (these begin with "#").
+std::string DecidingPart(const std::string& directory) {
+    std::size_t end = 0;
+    for (int depth = 0; depth < kDecidingDepth && end < directory.size(); ++depth) {
+        end = std::min(directory.find('/', end + 1), directory.size());
+    }
+    if (const std::size_t marked = directory.rfind("/#"); marked != std::string::npos) {
+        end = std::max(end, std::min(directory.find('/', marked + 1), directory.size()));
+    }
+    return directory.substr(0, end);
+}
+
 class FolderScope : public Scope {
   public:
     FolderScope() {
@@ -54,7 +75,7 @@ class FolderScope : public Scope {
         }
         std::vector<std::string> roots;
         for (const auto& folder : list_) {
-            if (IsBelow(folder->GetFullPath(), path)) {
+            if (quivra::base::IsBelow(folder->GetFullPath(), path)) {
                 roots.push_back(folder->GetFullPath());
             }
         }
@@ -67,15 +88,15 @@ class FolderScope : public Scope {
         return rule_one != nullptr && rule_other != nullptr &&
                ClassesOf(*rule_one) == ClassesOf(*rule_other) &&
                std::none_of(list_.begin(), list_.end(), [&](const auto& folder) {
-                   return IsBelow(folder->GetFullPath(), one) ||
-                          IsBelow(folder->GetFullPath(), other);
+                   return quivra::base::IsBelow(folder->GetFullPath(), one) ||
+                          quivra::base::IsBelow(folder->GetFullPath(), other);
                });
     }
 
     std::string Describe(const std::string& root) const override {
         Json::Value rules(Json::arrayValue);
         for (const auto& folder : list_) {
-            if (IsAtOrBelow(folder->GetFullPath(), root)) {
+            if (quivra::base::IsAtOrBelow(folder->GetFullPath(), root)) {
                 Json::Value rule = folder->GetIndexCfg();
                 rule["path"] = folder->GetFullPath().substr(root.size());  // the share may move
                 rules.append(rule);
@@ -85,22 +106,26 @@ class FolderScope : public Scope {
     }
 
   private:
-    /// Whether files in the directory may be indexed. The platform's answer is kept for the last
-    /// directory, because files come directory by directory. A folder's own root was checked when
-    /// it was chosen.
+    /// Whether files in the directory may be indexed. A folder's own root was checked when it was
+    /// chosen. The question resolves the path, so it costs more with every level, and is asked of
+    /// the part only that can make a difference: below it ShareTree leads past no mount, no link
+    /// and no name of the system's own.
     bool MayHold(const std::string& directory) const {
-        if (directory != last_directory_) {
-            last_answer_ = folders_.IsFullPathHasOwnCfg(directory) ||
-                           quivra::fileindex::CanFullPathBeIndexed(directory);
-            last_directory_ = directory;
+        const std::string asked = DecidingPart(directory);
+        if (const auto known = may_hold_.find(asked); known != may_hold_.end()) {
+            return known->second;
         }
-        return last_answer_;
+        if (may_hold_.size() >= kMaxKnown) {
+            may_hold_.clear();
+        }
+        const bool may_hold =
+            folders_.IsFullPathHasOwnCfg(asked) || quivra::fileindex::CanFullPathBeIndexed(asked);
+        return may_hold_.emplace(asked, may_hold).first->second;
     }
 
     FolderMgr folders_;
     std::vector<std::shared_ptr<Folder>> list_;
-    mutable std::string last_directory_;
-    mutable bool last_answer_ = false;
+    mutable std::unordered_map<std::string, bool> may_hold_;
 };
 
 }  // namespace

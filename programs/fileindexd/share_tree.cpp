@@ -1,6 +1,5 @@
 #include "programs/fileindexd/share_tree.h"
 
-#include <dirent.h>
 #include <fcntl.h>
 #include <linux/openat2.h>
 #include <sys/stat.h>
@@ -12,6 +11,7 @@
 #include <string_view>
 #include <system_error>
 
+#include "base/path.h"
 #include "common/error.h"
 #include "common/log.h"
 #include "fileindex/util.h"
@@ -53,10 +53,16 @@ quivra::base::UniqueFd OpenBelow(int directory, const std::string& path, unsigne
     return quivra::base::UniqueFd(fd);
 }
 
+/// As documents hold it: a time that 64 bits cannot count wraps around.
+std::int64_t Nanoseconds(const statx_timestamp& time) {
+    return static_cast<std::int64_t>(static_cast<std::uint64_t>(time.tv_sec) * 1'000'000'000 +
+                                     time.tv_nsec);
+}
+
 std::optional<Attributes> Stat(int directory, const char* name, int flags) {
     struct statx info {};
     if (statx(directory, name, flags | AT_SYMLINK_NOFOLLOW | AT_NO_AUTOMOUNT,
-              STATX_TYPE | STATX_SIZE | STATX_MTIME | STATX_CTIME, &info) != 0) {
+              STATX_TYPE | STATX_SIZE | STATX_MTIME | STATX_CTIME | STATX_INO, &info) != 0) {
         if (MeansAbsent(errno)) {
             return std::nullopt;
         }
@@ -70,8 +76,8 @@ std::optional<Attributes> Stat(int directory, const char* name, int flags) {
     if ((info.stx_attributes & STATX_ATTR_MOUNT_ROOT) != 0 && (flags & AT_EMPTY_PATH) == 0) {
         return std::nullopt;
     }
-    return Attributes{is_dir, static_cast<std::int64_t>(info.stx_size), info.stx_mtime.tv_sec,
-                      info.stx_ctime.tv_sec};
+    return Attributes{is_dir, static_cast<std::int64_t>(info.stx_size), Nanoseconds(info.stx_mtime),
+                      Nanoseconds(info.stx_ctime), info.stx_ino};
 }
 
 bool HasPreservedName(std::string_view relative) {
@@ -85,21 +91,23 @@ bool HasPreservedName(std::string_view relative) {
     return false;
 }
 
-struct CloseDirectory {
-    void operator()(DIR* directory) const { closedir(directory); }
-};
-using Directory = std::unique_ptr<DIR, CloseDirectory>;
-
 /// Null, with errno set, on failure.
-Directory OpenDirectory(quivra::base::UniqueFd fd) {
+DirectoryReader::Stream OpenStream(quivra::base::UniqueFd fd) {
     if (!fd.IsValid()) {
         return nullptr;
     }
-    Directory directory(fdopendir(fd.Get()));
-    if (directory != nullptr) {
+    DirectoryReader::Stream stream(fdopendir(fd.Get()));
+    if (stream != nullptr) {
         fd.Release();
     }
-    return directory;
+    return stream;
+}
+
+bool CanBeIndexed(const dirent& entry) {
+    const std::string_view name = entry.d_name;
+    return name != "." && name != ".." &&
+           (entry.d_type == DT_DIR || entry.d_type == DT_REG || entry.d_type == DT_UNKNOWN) &&
+           !quivra::fileindex::IsSystemPreservedFileName(entry.d_name);
 }
 
 }  // namespace
@@ -118,12 +126,11 @@ std::optional<std::string> ShareTree::Relative(const std::string& full_path) con
     if (full_path == root_) {
         return ".";
     }
-    if (full_path.size() <= root_.size() + 1 || full_path.compare(0, root_.size(), root_) != 0 ||
-        full_path[root_.size()] != '/') {
+    if (!quivra::base::IsBelow(full_path, root_) || !quivra::base::IsCanonicalText(full_path)) {
         return std::nullopt;
     }
     std::string relative = full_path.substr(root_.size() + 1);
-    if (relative.find('\0') != std::string::npos || HasPreservedName(relative)) {
+    if (HasPreservedName(relative)) {
         return std::nullopt;
     }
     return relative;
@@ -144,39 +151,36 @@ std::optional<Attributes> ShareTree::Look(const std::string& full_path) const {
     return Stat(fd.Get(), "", AT_EMPTY_PATH);
 }
 
-void ShareTree::ReadDirectory(const std::string& full_path, const Visitor& visit) const {
+DirectoryReader ShareTree::Read(const std::string& full_path) const {
+    DirectoryReader reader;
+    reader.path_ = full_path;
     const std::optional<std::string> relative = Relative(full_path);
-    if (!relative) {
-        return;
-    }
-    const Directory directory =
-        OpenDirectory(OpenBelow(fd_.Get(), *relative, O_RDONLY | O_DIRECTORY));
-    if (directory == nullptr) {
-        if (MeansAbsent(errno)) {
-            return;
+    if (relative) {
+        reader.stream_ = OpenStream(OpenBelow(fd_.Get(), *relative, O_RDONLY | O_DIRECTORY));
+        if (reader.stream_ == nullptr && !MeansAbsent(errno)) {
+            Throw(errno, full_path);
         }
-        Throw(errno, full_path);
     }
-    for (;;) {
+    return reader;
+}
+
+std::optional<DirectoryReader::Entry> DirectoryReader::Next() {
+    while (stream_ != nullptr) {
         errno = 0;
-        const dirent* entry = readdir(directory.get());
+        const dirent* entry = readdir(stream_.get());
         if (entry == nullptr) {
-            break;
-        }
-        const std::string name = entry->d_name;
-        const bool can_be_indexed =
-            entry->d_type == DT_DIR || entry->d_type == DT_REG || entry->d_type == DT_UNKNOWN;
-        if (name == "." || name == ".." || !can_be_indexed ||
-            quivra::fileindex::IsSystemPreservedFileName(name)) {
-            continue;
-        }
-        if (const auto attributes = Stat(dirfd(directory.get()), name.c_str(), 0)) {
-            visit(name, *attributes);
+            const int error = errno;
+            stream_.reset();
+            if (error != 0) {
+                Throw(error, path_);
+            }
+        } else if (CanBeIndexed(*entry)) {
+            if (const auto attributes = Stat(dirfd(stream_.get()), entry->d_name, 0)) {
+                return Entry{path_ + "/" + entry->d_name, *attributes};
+            }
         }
     }
-    if (errno != 0) {
-        Throw(errno, full_path);
-    }
+    return std::nullopt;
 }
 
 void ShareTree::CheckMounted() const {
@@ -194,7 +198,8 @@ void ShareTree::CheckMounted() const {
 }
 
 bool ShareTree::IsEmpty() const {
-    const Directory directory = OpenDirectory(OpenBelow(fd_.Get(), ".", O_RDONLY | O_DIRECTORY));
+    const DirectoryReader::Stream directory =
+        OpenStream(OpenBelow(fd_.Get(), ".", O_RDONLY | O_DIRECTORY));
     if (directory == nullptr) {
         return false;
     }

@@ -1,6 +1,8 @@
 #pragma once
 
-#include <functional>
+#include <dirent.h>
+
+#include <memory>
 #include <optional>
 #include <string>
 
@@ -8,6 +10,31 @@
 #include "programs/fileindexd/index.h"
 
 namespace fileindexd {
+
+/// The entries of one directory that can be indexed, one after the other: no directory is too large
+/// for the memory, and reading may pause. It stays the directory that was opened, whatever is
+/// renamed meanwhile.
+class DirectoryReader {
+  public:
+    struct CloseStream {
+        void operator()(DIR* stream) const { closedir(stream); }
+    };
+    using Stream = std::unique_ptr<DIR, CloseStream>;
+    struct Entry {
+        std::string path;  ///< below the path by which the directory was opened
+        Attributes attributes;
+    };
+
+    const std::string& Path() const { return path_; }
+    /// None at the end. Throws std::system_error when reading fails; the end is reached then.
+    std::optional<Entry> Next();
+
+  private:
+    friend class ShareTree;
+
+    std::string path_;
+    Stream stream_;
+};
 
 /// What stands below a share's root, as far as it can be indexed: regular files and directories
 /// that are reached without symbolic links and without leaving the root's file system (a mount
@@ -26,10 +53,9 @@ class ShareTree {
     /// indexed. Throws std::system_error when that cannot be told.
     std::optional<Attributes> Look(const std::string& full_path) const;
 
-    /// Calls `visit` with the name of every entry of a directory that can be indexed. A directory
-    /// that is gone has no entries. Throws std::system_error when it cannot be read.
-    using Visitor = std::function<void(const std::string& name, const Attributes& attributes)>;
-    void ReadDirectory(const std::string& full_path, const Visitor& visit) const;
+    /// Opens a directory to read its entries. A directory that is gone has none. Throws
+    /// std::system_error when it cannot be read.
+    DirectoryReader Read(const std::string& full_path) const;
 
     /// Throws Error 502 unless the root's path still leads to the directory that was opened.
     void CheckMounted() const;

@@ -1,5 +1,7 @@
 #pragma once
 
+#include <json/json.h>
+
 #include <chrono>
 #include <cstdint>
 #include <string>
@@ -19,7 +21,18 @@ void MakeRunDirectory();
 /// no reason to stop work, so nothing is thrown.
 class StateFile {
   public:
-    enum class State { kIdle, kSettling, kProcessing, kWaiting, kPaused };
+    enum class State { kIdle, kSettling, kProcessing, kWaiting, kProblem, kPaused };
+
+    /// What the backlog holds.
+    struct Waiting {
+        std::uint64_t files = 0;  ///< whose content is to be extracted
+        std::uint64_t bytes = 0;
+        std::uint64_t failed = 0;  ///< files that could not be read
+        std::string phase;         ///< "names", "contents" or empty
+        std::int64_t eta = -1;     ///< seconds; -1: not known
+
+        bool operator==(const Waiting&) const = default;
+    };
 
     explicit StateFile(std::string share);
     StateFile(const StateFile&) = delete;
@@ -29,12 +42,19 @@ class StateFile {
     void SetLastPass(std::int64_t seconds_since_epoch);
     /// Empty when the last pass succeeded.
     void SetLastError(const std::string& error);
+    void SetWaiting(const Waiting& waiting);
+    /// State kProblem, with a sentence for the user: what is in the way, and what to do.
+    void SetProblem(const std::string& sentence);
 
     /// Writes at once, unless the file says so already.
     void Set(State state);
     /// State kProcessing; writes at most once a second.
     void SetProgress(const PassState& progress);
     void Remove();
+
+    /// What the share's file says, for another process: null where there is none, or not of a
+    /// process that still runs.
+    static Json::Value Read(const std::string& share);
 
   private:
     void Write();
@@ -43,6 +63,8 @@ class StateFile {
     State state_ = State::kIdle;
     bool is_new_ = true;  ///< there is more to tell than the file does
     PassState progress_;
+    Waiting waiting_;
+    std::string problem_;
     std::int64_t last_pass_ = 0;
     std::string last_error_;
     std::chrono::steady_clock::time_point written_{};

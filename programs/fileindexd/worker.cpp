@@ -11,13 +11,14 @@
 #include <chrono>
 #include <csignal>
 #include <cstdint>
+#include <functional>
+#include <memory>
 
 #include "common/log.h"
 #include "programs/daemon/program.h"
 #include "programs/fileindexd/queue_watch.h"
 #include "programs/fileindexd/repair.h"
 #include "programs/fileindexd/share_worker.h"
-#include "sdk/share.h"
 
 namespace fileindexd {
 
@@ -31,25 +32,42 @@ constexpr const char* kUnit = "worker";
 constexpr int kIoPriorityWhoProcess = 1;
 constexpr int kIoPriorityIdle = 3 << 13;
 
-volatile std::sig_atomic_t stop_requested = 0;
-int stop_event = -1;
+/// How often a worker without anything to do looks whether its place is still right, and the index
+/// still the one it knows. The search daemon is asked less often.
+constexpr std::chrono::seconds kPlaceCheck{5};
+constexpr std::chrono::seconds kIndexCheck{15};
+/// How often one whose place is not right looks again.
+constexpr std::chrono::seconds kPlaceRetry{2};
 
-extern "C" void RequestStop(int) {
+volatile std::sig_atomic_t stop_requested = 0;
+volatile std::sig_atomic_t retry_requested = 0;
+int wake_event = -1;
+
+void Wake() {
     const int error = errno;
-    stop_requested = 1;
-    quivra::daemon::EndAtLatest(quivra::daemon::kStopGrace);
     const std::uint64_t one = 1;
-    if (write(stop_event, &one, sizeof(one)) < 0) {
+    if (write(wake_event, &one, sizeof(one)) < 0) {
         // It is readable already.
     }
     errno = error;
 }
 
+extern "C" void RequestStop(int) {
+    stop_requested = 1;
+    quivra::daemon::EndAtLatest(quivra::daemon::kStopGrace);
+    Wake();
+}
+
+extern "C" void RequestRetry(int) {
+    retry_requested = 1;
+    Wake();
+}
+
 /// SIGTERM and SIGINT are noticed between two operations and end a wait. Where neither comes soon,
 /// in a read from a disk that does not answer or in the search client's sleep of a quarter of an
 /// hour, the process ends in the middle: a pass may be carried out twice.
-void CatchStopSignals() {
-    stop_event = eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK);
+void CatchSignals() {
+    wake_event = eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK);
     struct sigaction action {};
     action.sa_handler = RequestStop;
     sigset_t signals;
@@ -58,6 +76,9 @@ void CatchStopSignals() {
         sigaddset(&signals, signal);
         sigaction(signal, &action, nullptr);
     }
+    action.sa_handler = RequestRetry;
+    sigaddset(&signals, kRetrySignal);
+    sigaction(kRetrySignal, &action, nullptr);
     sigprocmask(SIG_UNBLOCK, &signals, nullptr);
     // The daemon reads the settings again, and tells whom they concern.
     std::signal(SIGHUP, SIG_IGN);
@@ -69,38 +90,70 @@ void LowerPriority() {
     syscall(SYS_ioprio_set, kIoPriorityWhoProcess, 0, kIoPriorityIdle);
 }
 
+/// For poll(2).
+int Milliseconds(Clock::duration left) {
+    const auto wait = std::chrono::ceil<std::chrono::milliseconds>(left).count();
+    return static_cast<int>(std::clamp<std::int64_t>(wait, 0, 3'600'000));
+}
+
 class Worker {
   public:
-    explicit Worker(const std::string& share)
-        : share_(share), watch_(quivra::sdk::SDKShare(share).GetQueuePath()), work_(share) {}
+    explicit Worker(const std::string& share) : share_(share), work_(share) {}
 
     int Run() {
-        Repair();
-        schedule_.QueueChanged(Clock::now());  // what was queued, or left, before
         while (stop_requested == 0) {
+            if (!EnsurePlace()) {
+                WaitFor(kPlaceRetry, false);
+                continue;
+            }
             ShowState();
             Wait();
-            const QueueWatch::News news = watch_.Read();
-            if (news.gone) {
-                quivra::LogError({kUnit, __LINE__}, "The queue's directory of share %s has gone",
-                                 share_.c_str());
-                return 1;
-            }
-            if (news.status) {
-                Repair();
-            }
-            if (news.queue) {
-                watch_.ReadNewLines(schedule_, rates_, Clock::now());
-            }
-            const auto due = schedule_.Due();
-            if (due && *due <= Clock::now() && stop_requested == 0) {
-                RunPass();
+            ReadNews();
+            if (watch_ && stop_requested == 0) {
+                DoSomething();
             }
         }
         return 0;
     }
 
   private:
+    /// Opens the share's place, and whatever depends on it.
+    bool EnsurePlace() {
+        if (watch_) {
+            return true;
+        }
+        try {
+            work_.Open();
+            watch_ = std::make_unique<QueueWatch>(work_.Directory(), work_.QueueName());
+            Repair();
+            schedule_.QueueChanged(Clock::now());  // what was queued, or left, before
+            was_told_.clear();
+            return true;
+        } catch (const PlaceProblem& problem) {
+            work_.State().SetProblem(problem.what());
+            Tell(problem.what());
+        } catch (const std::exception& error) {
+            work_.State().SetLastError(error.what());
+            work_.State().Set(StateFile::State::kWaiting);
+            Tell(error.what());
+        }
+        return false;
+    }
+
+    /// Once, not every two seconds.
+    void Tell(const std::string& sentence) {
+        if (was_told_ != sentence) {
+            was_told_ = sentence;
+            quivra::LogError({kUnit, __LINE__}, "Share %s waits: %s", share_.c_str(),
+                             sentence.c_str());
+        }
+    }
+
+    void LeavePlace() {
+        watch_.reset();
+        work_.Close();
+    }
+
     void ShowState() {
         if (!schedule_.HasFailed()) {
             work_.State().Set(schedule_.Due() ? StateFile::State::kSettling
@@ -110,43 +163,131 @@ class Worker {
 
     /// While something is pending, news are not waited for but looked at a few times a second, so
     /// that a storm of changes does not wake the worker for each.
-    void Wait() const {
-        pollfd descriptors[] = {{stop_event, POLLIN, 0}, {watch_.Fd(), POLLIN, 0}};
-        const auto due = schedule_.Due();
-        if (!due) {
-            poll(descriptors, 2, -1);
+    void Wait() {
+        if (const auto due = schedule_.Due()) {
+            const auto longest = schedule_.HasFailed() ? Clock::duration(Schedule::kLastRetry)
+                                                       : Clock::duration(Schedule::kQuiet);
+            // What is settling leaves time for a slice of older work.
+            const bool has_slice = !schedule_.HasFailed() && IsSliceDue();
+            WaitFor(has_slice ? Clock::duration(0) : std::min(*due - Clock::now(), longest), false);
+        } else if (const auto slice = work_.NextSlice()) {
+            WaitFor(
+                std::min<Clock::duration>(
+                    std::max<Clock::duration>(*slice, slices_again_ - Clock::now()), kPlaceCheck),
+                true);
+        } else {
+            WaitFor(kPlaceCheck, true);
+        }
+    }
+
+    void WaitFor(Clock::duration longest, bool for_news) const {
+        pollfd descriptors[] = {{wake_event, POLLIN, 0}, {watch_ ? watch_->Fd() : -1, POLLIN, 0}};
+        poll(descriptors, for_news ? 2 : 1, Milliseconds(longest));
+        std::uint64_t count = 0;
+        if (read(wake_event, &count, sizeof(count)) < 0) {
+            errno = 0;  // nobody has woken us
+        }
+    }
+
+    void ReadNews() {
+        const QueueWatch::News news = watch_->Read();
+        if (news.gone) {
+            LeavePlace();
             return;
         }
-        const auto left = std::chrono::ceil<std::chrono::milliseconds>(*due - Clock::now());
-        const auto longest = schedule_.HasFailed() ? std::chrono::milliseconds(Schedule::kLastRetry)
-                                                   : Schedule::kQuiet;
-        const auto timeout = std::clamp(left, std::chrono::milliseconds(0), longest);
-        poll(descriptors, 1, static_cast<int>(timeout.count()));
+        if (news.status) {
+            Repair();
+        }
+        if (news.queue) {
+            watch_->ReadNewLines(schedule_, rates_, Clock::now());
+        }
+        if (retry_requested != 0) {
+            retry_requested = 0;
+            Try([this] { work_.RetryFailures(); });
+        }
+    }
+
+    bool IsSliceDue() {
+        const auto slice = work_.NextSlice();
+        return slice && slice->count() == 0 && Clock::now() >= slices_again_;
+    }
+
+    /// One that failed waits as a pass does; fresh changes need not wait for it.
+    void RunSlice() {
+        if (Try([this] { work_.RunSlice(StopWhenAsked); })) {
+            slice_failures_ = 0;
+        } else {
+            slices_again_ = Clock::now() + Schedule::RetryAfter(slice_failures_++);
+        }
+    }
+
+    /// One thing, by its rank: a pass that is due, a slice of the backlog, a look around.
+    void DoSomething() {
+        const auto due = schedule_.Due();
+        if (due && *due <= Clock::now()) {
+            RunPass();
+        } else if (!schedule_.HasFailed() && IsSliceDue()) {
+            RunSlice();
+        } else if (!due) {
+            LookAround();
+        }
+    }
+
+    /// Whether everything is still where it was.
+    void LookAround() {
+        const auto now = Clock::now();
+        if (now < next_place_check_) {
+            return;
+        }
+        next_place_check_ = now + kPlaceCheck;
+        Try([this] { work_.Open(); });
+        if (watch_ && now >= next_index_check_) {
+            next_index_check_ = now + kIndexCheck;
+            Try([this] { work_.CheckIndex(); });
+        }
+    }
+
+    static void StopWhenAsked() {
+        if (stop_requested != 0) {
+            throw Stopped();
+        }
     }
 
     void RunPass() {
         schedule_.PassBegins();
-        watch_.Forget();
-        try {
-            const PassResult result = work_.RunPass([] {
-                if (stop_requested != 0) {
-                    throw Stopped();
-                }
-            });
-            schedule_.PassSucceeded();
+        watch_->Forget();
+        const bool has_succeeded = Try([this] {
+            const PassResult result = work_.RunPass(StopWhenAsked);
+            schedule_.PassSucceeded(Clock::now());
             for (const std::string& path : result.changed) {
                 rates_.Indexed(path, Clock::now());
             }
             Repair();
-        } catch (const Stopped&) {
-            return;  // the working copy is carried on by the next worker
-        } catch (const std::exception& error) {
+        });
+        if (!has_succeeded) {
             schedule_.PassFailed(Clock::now());
-            quivra::LogError({kUnit, __LINE__}, "The pass over share %s failed: %s", share_.c_str(),
-                             error.what());
         }
         // What came during the pass, or stood behind the copy of an interrupted one.
-        watch_.ReadNewLines(schedule_, rates_, Clock::now());
+        if (watch_) {
+            watch_->ReadNewLines(schedule_, rates_, Clock::now());
+        }
+    }
+
+    /// Whether it could be done.
+    bool Try(const std::function<void()>& work) {
+        try {
+            work();
+            was_told_.clear();
+            return true;
+        } catch (const Stopped&) {
+            return true;  // the next worker carries on
+        } catch (const std::exception& error) {
+            Tell(error.what());
+        }
+        if (watch_ && !work_.IsOpen()) {
+            LeavePlace();
+        }
+        return false;
     }
 
     void Repair() {
@@ -159,16 +300,21 @@ class Worker {
     }
 
     const std::string share_;
-    QueueWatch watch_;
     ShareWorker work_;
+    std::unique_ptr<QueueWatch> watch_;  ///< set while the place is open
     Schedule schedule_;
     ChangeRates rates_;
+    std::string was_told_;
+    int slice_failures_ = 0;
+    Clock::time_point slices_again_{};
+    Clock::time_point next_place_check_{};
+    Clock::time_point next_index_check_{};
 };
 
 }  // namespace
 
 int RunWorker(const std::string& share) {
-    CatchStopSignals();
+    CatchSignals();
     LowerPriority();
     try {
         return Worker(share).Run();

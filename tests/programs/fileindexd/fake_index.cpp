@@ -5,17 +5,21 @@
 #include <fstream>
 #include <sstream>
 
-#include "programs/fileindexd/paths.h"
+#include "base/path.h"
 
 namespace fileindexd {
 
 FakeIndex::Content Extract(const std::string& path, bool need_meta) {
     struct stat info {};
     if (lstat(path.c_str(), &info) != 0) {
-        throw DocumentError("Parse failed, path=" + path);
+        throw DocumentError("Parse failed, path=" + path, true);
     }
+    const auto nanoseconds = [](const timespec& time) {
+        return time.tv_sec * std::int64_t{1'000'000'000} + time.tv_nsec;
+    };
     FakeIndex::Content content;
-    content.attributes = {S_ISDIR(info.st_mode), info.st_size, info.st_mtime, info.st_ctime};
+    content.attributes = {S_ISDIR(info.st_mode), info.st_size, nanoseconds(info.st_mtim),
+                          nanoseconds(info.st_ctim), info.st_ino};
     if (need_meta && !content.attributes.is_dir) {
         std::ostringstream text;
         text << std::ifstream(path).rdbuf();
@@ -31,9 +35,16 @@ void FakeIndex::Call() {
 }
 
 void FakeIndex::Upsert(const std::string& path, bool need_meta) {
+    const std::lock_guard lock(mutex_);
     Call();
-    pending_[path] = Extract(path, need_meta);
-    extracted += !pending_[path].attributes.is_dir;
+    Content content = Extract(path, need_meta);
+    if (const auto bad = unreadable.find(path); need_meta && bad != unreadable.end()) {
+        content.text.clear();
+        content.error = "it cannot be read";
+        content.error_can_pass = bad->second;
+    }
+    extracted += need_meta && !content.attributes.is_dir;
+    pending_[path] = content;
 }
 
 bool FakeIndex::SetAttributes(const std::string& path) {
@@ -59,8 +70,8 @@ bool FakeIndex::Rename(const std::string& to, const std::string& from) {
     move(to, from);
     Call();  // the command is several requests
     for (const auto& [path, content] : committed_) {
-        if (IsBelow(path, from)) {
-            move(Moved(path, from, to), path);
+        if (quivra::base::IsBelow(path, from)) {
+            move(quivra::base::Moved(path, from, to), path);
         }
     }
     return true;
@@ -73,7 +84,8 @@ void FakeIndex::Delete(const std::string& path) {
 
 void FakeIndex::DeleteBelow(const std::string& directory) {
     Call();
-    std::erase_if(pending_, [&](const auto& entry) { return IsBelow(entry.first, directory); });
+    std::erase_if(pending_,
+                  [&](const auto& entry) { return quivra::base::IsBelow(entry.first, directory); });
 }
 
 void FakeIndex::Commit() {
@@ -82,13 +94,21 @@ void FakeIndex::Commit() {
     Call();  // killed before the answer came
 }
 
-std::vector<Document> FakeIndex::ListBelow(const std::string& directory, std::size_t offset,
+namespace {
+
+Document MakeDocument(const std::string& path, const FakeIndex::Content& content) {
+    return {path, content.attributes, content.error, content.error_can_pass};
+}
+
+}  // namespace
+
+std::vector<Document> FakeIndex::ListBelow(const std::string& directory, const std::string& after,
                                            std::size_t limit) {
     Call();
     std::vector<Document> page;
     for (const auto& [path, content] : committed_) {
-        if (IsBelow(path, directory) && (offset == 0 || offset-- == 0) && page.size() < limit) {
-            page.push_back({path, content.attributes});
+        if (quivra::base::IsBelow(path, directory) && path > after && page.size() < limit) {
+            page.push_back(MakeDocument(path, content));
         }
     }
     return page;
@@ -99,7 +119,7 @@ std::vector<Document> FakeIndex::Find(const std::vector<std::string>& paths) {
     std::vector<Document> found;
     for (const std::string& path : paths) {
         if (const auto it = committed_.find(path); it != committed_.end()) {
-            found.push_back({path, it->second.attributes});
+            found.push_back(MakeDocument(path, it->second));
         }
     }
     return found;

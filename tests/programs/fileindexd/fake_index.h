@@ -1,6 +1,7 @@
 #pragma once
 
 #include <map>
+#include <mutex>
 #include <stdexcept>
 #include <string>
 #include <vector>
@@ -18,7 +19,9 @@ class FakeIndex : public Index {
   public:
     struct Content {
         Attributes attributes;
-        std::string text;  ///< of a file whose metadata was wanted
+        std::string text;   ///< of a file whose metadata was wanted
+        std::string error;  ///< why there is none
+        bool error_can_pass = false;
         /// The times of a directory change without an event.
         bool operator==(const Content& other) const {
             return text == other.text && attributes.is_dir == other.attributes.is_dir &&
@@ -33,7 +36,7 @@ class FakeIndex : public Index {
     void Delete(const std::string& path) override;
     void DeleteBelow(const std::string& directory) override;
     void Commit() override;
-    std::vector<Document> ListBelow(const std::string& directory, std::size_t offset,
+    std::vector<Document> ListBelow(const std::string& directory, const std::string& after,
                                     std::size_t limit) override;
     std::vector<Document> Find(const std::vector<std::string>& paths) override;
 
@@ -43,13 +46,16 @@ class FakeIndex : public Index {
     void LoseBatch() { pending_ = committed_; }
 
     const Documents& Committed() const { return committed_; }
-    int extracted = 0;  ///< files read by Upsert
+    int extracted = 0;  ///< files sent with their content
+    /// Files whose content cannot be read, and whether that can pass.
+    std::map<std::string, bool> unreadable;
 
   private:
     void Call();
 
     Documents committed_;
     Documents pending_;
+    std::mutex mutex_;  ///< held by Upsert, which comes from several threads
     int kill_in_ = 0;
 };
 

@@ -12,34 +12,22 @@
 #include <random>
 #include <set>
 
+#include "base/path.h"
 #include "common/error.h"
 #include "common/json.h"
 #include "fileindex/event.h"
-#include "programs/fileindexd/paths.h"
+#include "programs/fileindexd/catch_up.h"
 #include "tests/fake/fake_libc.h"
 #include "tests/programs/fileindexd/fake_index.h"
 
 namespace fs = std::filesystem;
 
-namespace {
-/// Lets every queue look as if it had been begun that much later than the files were changed.
-std::int64_t age_of_files = 0;
-}  // namespace
-
-// In the place of the C library's.
-extern "C" int statx(int directory, const char* path, int flags, unsigned int mask,
-                     struct statx* info) {
-    const long result = syscall(SYS_statx, directory, path, flags, mask, info);
-    if (result == 0) {
-        info->stx_btime.tv_sec += age_of_files;
-    }
-    return static_cast<int>(result);
-}
-
 namespace fileindexd {
 namespace {
 
 using quivra::Error;
+using quivra::base::IsAtOrBelow;
+using quivra::base::IsBelow;
 using namespace quivra::fileindex;
 
 /// The rules of a test: what lies below one of `excluded`, or not below `only`, is not indexed,
@@ -78,10 +66,27 @@ class TestScope : public Scope {
 /// A share on disk, its queue and its index. Paths are given without the share's root.
 class PassTest : public testing::Test {
   protected:
-    PassTest() {
-        age_of_files = 0;
+    PassTest() { StartAgain(); }
+
+    void StartAgain() {
+        catch_up_.reset();
+        backlog_.reset();
         fs::remove_all(root_);
         fs::create_directories(root_ + "/@eaDir/fileindex");
+        index_ = std::make_unique<FakeIndex>();
+        Open(root_);
+    }
+
+    /// As a worker that starts.
+    void Open(const std::string& root) {
+        catch_up_.reset();
+        backlog_.reset();
+        directory_ = quivra::base::PrivateDirectory::Open(root + "/@eaDir/fileindex");
+        backlog_ = std::make_unique<Backlog>(directory_);
+        catch_up_ = std::make_unique<CatchUp>(*backlog_);
+        if (backlog_->IsNew()) {
+            backlog_->BeginEmpty(scope_.Describe(root));
+        }
     }
 
     std::string Full(const std::string& path) const { return root_ + path; }
@@ -129,9 +134,26 @@ class PassTest : public testing::Test {
         return true;
     }
 
-    PassResult Run(PassListener listener = {}) {
-        Pass pass(queue_, root_, index_, scope_, std::move(listener));
-        return pass.Run();
+    PassResult RunPass(PassListener listener = {}) {
+        Pass pass({directory_, directory_.Path() + "/queue", Root(), *backlog_}, *index_, scope_,
+                  std::move(listener));
+        const PassResult result = pass.Run();
+        catch_up_->Forget(result.left);
+        return result;
+    }
+    /// As short a slice as there is.
+    void RunSlice(PassListener listener = {}, std::int64_t now = 1000) {
+        const ShareTree tree(Root());
+        catch_up_->Run({*index_, tree, scope_}, listener, {}, now);
+    }
+    void Run(const PassListener& listener = {}) {
+        RunPass(listener);
+        while (backlog_->NextDue() == 0) {
+            RunSlice(listener);
+        }
+    }
+    std::string Root() const {
+        return directory_.Path().substr(0, directory_.Path().find("/@eaDir"));
     }
 
     /// What the index should hold: the disk, walked in the simplest way.
@@ -156,13 +178,16 @@ class PassTest : public testing::Test {
     void IndexAll() {
         Queue(EVENT_REINDEX, "");
         Run();
-        index_.extracted = 0;
-        ASSERT_EQ(index_.Committed(), Expected());
+        index_->extracted = 0;
+        ASSERT_EQ(index_->Committed(), Expected());
     }
 
     const std::string root_ = "/volume1/share";
     const std::string queue_ = root_ + "/@eaDir/fileindex/queue";
-    FakeIndex index_;
+    quivra::base::PrivateDirectory directory_;
+    std::unique_ptr<Backlog> backlog_;
+    std::unique_ptr<CatchUp> catch_up_;
+    std::unique_ptr<FakeIndex> index_;
     TestScope scope_;
 };
 
@@ -171,13 +196,12 @@ TEST_F(PassTest, ARenamedDirectoryIsNotExtractedAgain) {
         Put("/old/" + std::to_string(i) + ".txt", "text");
     }
     Put("/file.txt", "file");
-    age_of_files = 1000;
     IndexAll();
     Move("/old", "/new");
     Move("/file.txt", "/moved.txt");
     Run();
-    EXPECT_EQ(index_.Committed(), Expected());
-    EXPECT_EQ(index_.extracted, 0);
+    EXPECT_EQ(index_->Committed(), Expected());
+    EXPECT_EQ(index_->extracted, 0);
 }
 
 // All files are of the same size and age here: only the right order of things keeps them apart.
@@ -204,14 +228,12 @@ TEST_F(PassTest, RenamesThatCrossEachOther) {
         for (const char* path : {"/a", "/b", "/c", "/d/x", "/d/y", "/e/x", "/e/y"}) {
             Put(path, path + std::string(4 - std::string(path).size(), '_'));
         }
-        age_of_files = 0;
         IndexAll();
-        age_of_files = 1000;
         for (const auto& [from, to] : moves) {
             EXPECT_TRUE(Move(from, to));
         }
         Run();
-        EXPECT_EQ(index_.Committed(), Expected());
+        EXPECT_EQ(index_->Committed(), Expected());
     }
 }
 
@@ -219,14 +241,13 @@ TEST_F(PassTest, AFileThatIsIndexedForItselfIsNotExtractedTwice) {
     Mkdir("/d");
     Write("/d/f.txt", "text");
     Run();
-    EXPECT_EQ(index_.extracted, 1);
+    EXPECT_EQ(index_->extracted, 1);
 }
 
 // The folding lets a reindex take changed settings along.
 TEST_F(PassTest, ChangedSettingsExtractTheirClassesAgainAlsoBeforeAReindex) {
     Put("/a.txt", "text");
     Put("/b.mp3", "sound");
-    age_of_files = 1000;
     scope_.without_meta = {Full("")};
     IndexAll();
     scope_.without_meta.clear();
@@ -235,8 +256,8 @@ TEST_F(PassTest, ChangedSettingsExtractTheirClassesAgainAlsoBeforeAReindex) {
     settings["audio"] = false;
     Queue(EVENT_UPDATE_CFG, "", "", true, settings);
     Run();
-    EXPECT_EQ(index_.Committed().at(Full("/a.txt")).text, "text");
-    EXPECT_EQ(index_.Committed().at(Full("/b.mp3")).text, "");
+    EXPECT_EQ(index_->Committed().at(Full("/a.txt")).text, "text");
+    EXPECT_EQ(index_->Committed().at(Full("/b.mp3")).text, "");
 
     scope_.without_meta = {Full("")};
     IndexAll();
@@ -244,17 +265,16 @@ TEST_F(PassTest, ChangedSettingsExtractTheirClassesAgainAlsoBeforeAReindex) {
     Queue(EVENT_UPDATE_CFG, "", "", true, settings);
     Queue(EVENT_REINDEX, "");
     Run();
-    EXPECT_EQ(index_.Committed().at(Full("/a.txt")).text, "text");
-    const int extracted = index_.extracted;
+    EXPECT_EQ(index_->Committed().at(Full("/a.txt")).text, "text");
+    const int extracted = index_->extracted;
     Queue(EVENT_REINDEX, "");
     Run();
-    EXPECT_EQ(index_.extracted, extracted);
+    EXPECT_EQ(index_->extracted, extracted);
 }
 
 TEST_F(PassTest, ARenamedShareTakesItsDocumentsAlong) {
     Put("/in/d/f.txt", "text");
     Put("/out/g.txt", "text");
-    age_of_files = 1000;
     scope_.only = Full("/in");
     IndexAll();
     const std::string renamed = "/volume1/renamed";
@@ -265,13 +285,14 @@ TEST_F(PassTest, ARenamedShareTakesItsDocumentsAlong) {
     std::ofstream(queue) << R"({"event":256,"is_dir":true,"path":"/volume1/renamed",)"
                          << R"("path_old":"/volume1/share"})"
                          << "\n";
-    Pass(queue, renamed, index_, scope_, {}).Run();
+    Open(renamed);
+    Run();
     FakeIndex::Documents expected;
     for (const char* path : {"/in", "/in/d", "/in/d/f.txt"}) {
         expected[renamed + path] = Extract(renamed + path, true);
     }
-    EXPECT_EQ(index_.Committed(), expected);
-    EXPECT_EQ(index_.extracted, 0);
+    EXPECT_EQ(index_->Committed(), expected);
+    EXPECT_EQ(index_->extracted, 0);
     fs::remove_all(renamed);
 }
 
@@ -293,14 +314,14 @@ TEST_F(PassTest, LinksMountsAndPreservedNamesAreNoFiles) {
         expected[Full(path)] = Extract(Full(path), true);
     }
     EXPECT_EQ(umount(Full("/mount").c_str()), 0);
-    EXPECT_EQ(index_.Committed(), expected);
+    EXPECT_EQ(index_->Committed(), expected);
 }
 
 TEST_F(PassTest, AVolumeThatVanishesInTheMiddleCommitsNothing) {
     Put("/f.txt", "text");
     Put("/g.txt", "text");
     IndexAll();
-    const FakeIndex::Documents before = index_.Committed();
+    const FakeIndex::Documents before = index_->Committed();
     Queue(EVENT_REINDEX, "");
     const std::string aside = root_ + ".aside";
     const auto unmount = [&](const PassState&) {
@@ -312,19 +333,20 @@ TEST_F(PassTest, AVolumeThatVanishesInTheMiddleCommitsNothing) {
     fake::ResetLibc();
     EXPECT_THROW(Run(unmount), Error);
     EXPECT_FALSE(fake::LogLinesWith("is its volume mounted?").empty());
-    EXPECT_EQ(index_.Committed(), before);
+    EXPECT_EQ(index_->Committed(), before);
 
-    const std::string outside = "/var/queue";
-    std::ofstream(outside) << R"({"event":512,"path":"/"})"
-                           << "\n";
-    EXPECT_THROW(Pass(outside, root_, index_, scope_, {}).Run(), Error)
-        << "an empty mount point is no share without files";
-    EXPECT_EQ(index_.Committed(), before);
+    fs::create_directories("/var/outside");
+    std::ofstream("/var/outside/queue") << R"({"event":512,"path":"/"})"
+                                        << "\n";
+    const auto outside = quivra::base::PrivateDirectory::Open("/var/outside");
+    Pass pass({outside, "/var/outside/queue", root_, *backlog_}, *index_, scope_, {});
+    EXPECT_THROW(pass.Run(), Error) << "an empty mount point is not a share without files";
+    EXPECT_EQ(index_->Committed(), before);
 
     fs::remove_all(root_);
     fs::rename(aside, root_);
     Run();
-    EXPECT_EQ(index_.Committed(), Expected());
+    EXPECT_EQ(index_->Committed(), Expected());
 }
 
 /// Random changes with their events. Few names, so that they collide.
@@ -332,9 +354,7 @@ class RandomPassTest : public PassTest {
   protected:
     void StartAgain(unsigned int seed) {
         random_.seed(seed);
-        fs::remove_all(root_);
-        fs::create_directories(root_ + "/@eaDir/fileindex");
-        index_ = FakeIndex();
+        PassTest::StartAgain();
         scope_.excluded = {Full("/c/a")};
         scope_.without_meta = {Full("/b")};
         IndexAll();
@@ -368,12 +388,7 @@ class RandomPassTest : public PassTest {
                 }
         }
     }
-    /// Old files are told apart by their size, young ones need not be.
-    std::string Text() {
-        ++number_;
-        return age_of_files > 0 ? std::string(static_cast<std::size_t>(number_ % 500), 'x')
-                                : std::to_string(10000 + number_);
-    }
+    std::string Text() { return std::to_string(10000 + ++number_); }
     std::string RandomPath() {
         std::string path;
         for (auto depth = 1 + random_() % 3; depth > 0; --depth) {
@@ -393,7 +408,6 @@ TEST_F(RandomPassTest, TheIndexEqualsTheDiskAfterEveryPass) {
     for (unsigned int seed = 0; seed < 150; ++seed) {
         SCOPED_TRACE(seed);
         StartAgain(seed);
-        age_of_files = seed % 2 == 0 ? 0 : 1000;
         for (int pass = 0; pass < 8; ++pass) {
             Change(12);
             if (pass == 4) {
@@ -401,7 +415,7 @@ TEST_F(RandomPassTest, TheIndexEqualsTheDiskAfterEveryPass) {
                 Queue(EVENT_UPDATE_CFG, "");
             }
             Run();
-            ASSERT_EQ(index_.Committed(), Expected());
+            ASSERT_EQ(index_->Committed(), Expected());
         }
     }
 }
@@ -415,21 +429,21 @@ TEST_F(RandomPassTest, APassThatWasKilledAnywhereEndsTheSame) {
             Change(15);
             Run();
             Change(15);
-            index_.KillAt(kill);
+            index_->KillAt(kill);
             killed = false;
             try {
                 Run();
             } catch (const Killed&) {
                 killed = true;
             }
-            index_.KillAt(0);
+            index_->KillAt(0);
             if (kill % 2 == 0) {
-                index_.LoseBatch();
+                index_->LoseBatch();
             }
             Change(4);
             Run();
             Run();
-            ASSERT_EQ(index_.Committed(), Expected());
+            ASSERT_EQ(index_->Committed(), Expected());
         }
     }
 }

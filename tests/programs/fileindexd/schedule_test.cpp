@@ -31,6 +31,10 @@ TEST(ScheduleTest, ABurstIsWaitedOutButNotForever) {
     for (const Case& test : cases) {
         SCOPED_TRACE(test.name);
         Schedule schedule;
+        schedule.QueueChanged(kStart - seconds(1));
+        EXPECT_EQ(schedule.Due(), kStart - seconds(1)) << "nobody waits for the first change";
+        schedule.PassBegins();
+        schedule.PassSucceeded(kStart);
         EXPECT_FALSE(schedule.Due());
         for (const int change : test.changes) {
             schedule.QueueChanged(kStart + milliseconds(change));
@@ -38,6 +42,10 @@ TEST(ScheduleTest, ABurstIsWaitedOutButNotForever) {
         EXPECT_EQ(schedule.Due(), kStart + milliseconds(test.due));
         schedule.PassBegins();
         EXPECT_FALSE(schedule.Due());
+        const Clock::time_point later = kStart + seconds(9);
+        schedule.PassSucceeded(later);
+        schedule.QueueChanged(later + Schedule::kQuiet);
+        EXPECT_EQ(schedule.Due(), later + Schedule::kQuiet) << "it has been calm";
     }
     Schedule busy;
     busy.QueueChangedLater(kStart + seconds(20));
@@ -56,7 +64,7 @@ TEST(ScheduleTest, AFailedPassIsRepeatedLaterEachTime) {
         now += seconds(expected);
     }
     schedule.PassBegins();
-    schedule.PassSucceeded();
+    schedule.PassSucceeded(now);
     EXPECT_FALSE(schedule.Due());
 }
 
@@ -79,7 +87,9 @@ TEST(ChangeRatesTest, AFileThatKeepsChangingWaitsLongerEachTime) {
 TEST(QueueWatchTest, NewLinesAboutBusyFilesWait) {
     const std::string directory = "/var/queue_test";
     std::filesystem::create_directories(directory);
-    QueueWatch watch(directory + "/queue");
+    const auto place = quivra::base::PrivateDirectory::Open(directory);
+    ASSERT_TRUE(place.IsValid()) << place.Problem();
+    QueueWatch watch(place, "queue");
     ChangeRates rates;
     rates.Indexed("/busy", kStart);
     rates.Indexed("/busy", kStart);
@@ -94,7 +104,9 @@ TEST(QueueWatchTest, NewLinesAboutBusyFilesWait) {
     append("th\":\"/busy\"}\n");
     EXPECT_EQ(schedule.Due(), kStart + ChangeRates::kShortestWait);
     append("garbage\n");
-    EXPECT_EQ(schedule.Due(), kStart + Schedule::kQuiet);
+    EXPECT_EQ(schedule.Due(), kStart);
+    std::ofstream(directory + "/queue.backlog");
+    EXPECT_FALSE(watch.Read().gone);
     std::filesystem::remove_all(directory);
     EXPECT_TRUE(watch.Read().gone);
 }
