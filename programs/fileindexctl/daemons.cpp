@@ -1,11 +1,7 @@
 #include "programs/fileindexctl/daemons.h"
 
-#include <fcntl.h>
-#include <unistd.h>
-
 #include <cerrno>
 
-#include "base/file.h"
 #include "base/frame.h"
 #include "common/json.h"
 #include "fileindex/communication.h"
@@ -40,12 +36,12 @@ Reach ReachAfterFailure() {
     }
 }
 
-/// A monitor of a version that has no socket yet.
-bool IsOldMonitorUp() {
-    constexpr const char* kLock = "/var/lib/kesto/monitor-state/lock";
-    base::UniqueFd fd;
-    return access(kLock, F_OK) == 0 &&
-           base::TryLock(AT_FDCWD, kLock, true, 0600, fd) == base::LockAttempt::kBusy;
+DaemonState Refused(const Json::Value& error) {
+    const bool has_reason = error.isObject() && error["msg"].isString();
+    DaemonState state;
+    state.reach = Reach::kRefused;
+    state.refusal = has_reason ? error["msg"].asString() : "its reply makes no sense";
+    return state;
 }
 
 }  // namespace
@@ -67,8 +63,7 @@ DaemonState AskDaemon(const Daemon& daemon, const std::string& request, const Js
     }
     Json::Value parsed;
     if (!fromString(parsed, reply) || !parsed.isObject() || parsed["success"] != true) {
-        state.reach = Reach::kRefused;
-        return state;
+        return Refused(parsed.isObject() ? parsed["error"] : Json::Value());
     }
     state.reach = Reach::kReplied;
     state.data = parsed["data"];
@@ -77,11 +72,8 @@ DaemonState AskDaemon(const Daemon& daemon, const std::string& request, const Js
 
 DaemonState AskState(const Daemon& daemon) {
     DaemonState state = AskDaemon(daemon, "state");
-    if (state.reach == Reach::kNotRunning && daemon.name == kMonitor.name && IsOldMonitorUp()) {
-        state.reach = Reach::kRefused;
-    }
     if (state.reach == Reach::kReplied && !state.data.isObject()) {
-        state = {Reach::kRefused, Json::Value(Json::objectValue)};
+        return Refused(Json::Value());
     }
     return state;
 }
@@ -99,6 +91,8 @@ std::string DescribeProblem(const Daemon& daemon, const DaemonState& state) {
         case Reach::kDenied:
             return name + " serves root only: permission denied, run this as root.";
         case Reach::kRefused:
+            return name + " does not tell how it is (" + state.refusal + "); " + service +
+                   " restart' helps.";
         case Reach::kReplied:
             break;
     }

@@ -27,7 +27,7 @@ inline constexpr std::chrono::seconds kReplyLimit{2};
 struct DaemonState {
     enum class Reach {
         kReplied,     ///< `data` is what it says
-        kRefused,     ///< it runs, but does not know the question: of another version
+        kRefused,     ///< it runs, but refuses the question, or its reply makes no sense
         kSilent,      ///< it runs, and does not reply in time
         kNotRunning,  ///< nobody listens at its socket
         kDenied,      ///< it serves root only
@@ -35,6 +35,7 @@ struct DaemonState {
 
     Reach reach = Reach::kNotRunning;
     Json::Value data{Json::objectValue};
+    std::string refusal{};  ///< of kRefused: its reason
 
     /// It takes requests.
     bool IsUp() const { return reach == Reach::kReplied || reach == Reach::kRefused; }

@@ -37,8 +37,7 @@ Json::Value AskIndexer(const std::string& question, const std::string& share) {
     data["share"] = share;
     const DaemonState state = AskDaemon(kIndexer, question, data);
     if (state.reach == DaemonState::Reach::kRefused) {
-        throw Failure("fileindexd does not know share " + share +
-                      ", or is of another version; 'service pkg-Quivra-fileindexd restart' helps");
+        throw Failure("fileindexd cannot do that for share " + share + ": " + state.refusal);
     }
     if (state.reach != DaemonState::Reach::kReplied) {
         throw Failure(DescribeProblem(kIndexer, state));

@@ -102,8 +102,9 @@ std::string Detail(const Daemon& daemon, const DaemonState& state) {
                (data["overflows"].isUInt64()
                     ? Number(data["overflows"].asUInt64(), "overflow", "overflows")
                     : "overflows unknown") +
-               (last.isInt64() && last.asInt64() > 0 ? ", last event " + LocalTime(last.asInt64())
-                                                     : ", no event yet");
+               (last.isInt64() && last.asInt64() >= 0
+                    ? ", last event " + Duration(last.asInt64()) + " ago"
+                    : ", no event yet");
     }
     return data["indexes"].isArray() ? Number(data["indexes"].size(), "index", "indexes")
                                      : Number(data["shares"].size(), "share", "shares");

@@ -148,16 +148,25 @@ int ListShares(Session& session) {
         rows.push_back({name, share["path"].asString(), share["folders"].asString(), state});
         list.append(share);
     }
+    const std::vector<std::string> problems = ProblemsOfShares();
     if (session.json) {
         Json::Value result(Json::objectValue);
         result["share"] = list;
+        result["problems"] = Json::Value(Json::arrayValue);
+        for (const std::string& problem : problems) {
+            result["problems"].append(problem);
+        }
         session.out << toString(result) << "\n";
     } else if (list.empty()) {
         session.err << "There are no shares; describe them in /etc/kesto/shares.conf.\n";
     } else {
         PrintTable(session, rows);
     }
-    return kSuccess;
+    session.out.flush();
+    for (const std::string& problem : problems) {
+        session.err << Shown(problem) << "\n";
+    }
+    return problems.empty() ? kSuccess : kFailure;
 }
 
 const std::vector<Operation>& ShareOperations() {

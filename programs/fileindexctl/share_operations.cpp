@@ -139,8 +139,8 @@ void MigrateShare(const std::string& share, const std::string& path) {
     // An index that was moved along with its share cannot be asked before the daemon knows where it
     // is, and proves the old root by not being there any more. Any other can: documents are kept by
     // their full paths.
-    const bool moved_along = !IsDirExist(old_root + kIndexDirectory, false) &&
-                             IsDirExist(root + kIndexDirectory, false);
+    const bool moved_along =
+        !IsDirExist(old_root + kIndexDirectory, false) && IsDirExist(root + kIndexDirectory, false);
     if (!moved_along && CountDocuments(share, old_root) == 0) {
         throw Failure(attempt +
                       "its index holds nothing below that path; name the root that the "

@@ -17,19 +17,33 @@
 
 namespace quivra::ctl {
 
-std::vector<std::string> AllShares() {
+namespace {
+
+/// What the platform's call puts into a list. Throws Error 502 when it fails.
+std::vector<std::string> Listed(int (*call)(KLIBCSzList**), const char* name) {
     KLIBCSzList* list = KLIBCSzListAlloc(1024);
-    const int result = list == nullptr ? -1 : KESTOShareEnum(&list);
+    const int result = list == nullptr ? -1 : call(&list);
     const std::unique_ptr<KLIBCSzList, decltype(&KLIBCSzListFree)> owner(list, KLIBCSzListFree);
     if (result < 0) {
-        throw Error(Error::kSystemCallFailed, "KESTOShareEnum failed");
+        throw Error(Error::kSystemCallFailed, std::string(name) + " failed");
     }
-    std::vector<std::string> names;
-    for (int i = 0; const char* name = KLIBCSzListGet(list, i); ++i) {
-        names.emplace_back(name);
+    std::vector<std::string> texts;
+    for (int i = 0; const char* text = KLIBCSzListGet(list, i); ++i) {
+        texts.emplace_back(text);
     }
+    return texts;
+}
+
+}  // namespace
+
+std::vector<std::string> AllShares() {
+    std::vector<std::string> names = Listed(KESTOShareEnum, "KESTOShareEnum");
     std::sort(names.begin(), names.end());
     return names;
+}
+
+std::vector<std::string> ProblemsOfShares() {
+    return Listed(KESTOShareEnumProblems, "KESTOShareEnumProblems");
 }
 
 std::string RootOf(const std::string& share) {

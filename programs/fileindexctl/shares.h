@@ -9,6 +9,9 @@ namespace quivra::ctl {
 /// them.
 std::vector<std::string> AllShares();
 
+/// What is wrong in the configuration of the shares: a sentence each, with file and line.
+std::vector<std::string> ProblemsOfShares();
+
 /// The full path of the share's root; empty when the platform does not know the share.
 std::string RootOf(const std::string& share);
 

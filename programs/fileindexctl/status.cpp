@@ -164,7 +164,7 @@ void Correct(FolderLine& folder, const ShareLine& share, const Status& status) {
     } else if (!problem.empty()) {
         folder.status["text"] = "incomplete";
         folder.status["desc"] = problem;
-    } else if (share.waiting > 0) {
+    } else if (share.waiting > 0 || !share.phase.empty()) {
         folder.status["text"] = "processing";
     }
 }
@@ -175,7 +175,9 @@ void TakeProblems(Status& status) {
          {&kIndexer, &status.indexer},
          {&kMonitor, &status.monitor}}};
     for (const auto& [daemon, state] : daemons) {
-        std::string problem = DescribeProblem(*daemon, *state);
+        const bool is_old =
+            daemon == &kSearchDaemon && state->reach == DaemonState::Reach::kRefused;
+        std::string problem = is_old ? "" : DescribeProblem(*daemon, *state);
         if (problem.empty()) {
             problem = Text(state->data, "problem");
         }
@@ -183,6 +185,14 @@ void TakeProblems(Status& status) {
             status.problems.push_back(problem);
         }
     }
+}
+
+Json::Value ListOf(const std::vector<std::string>& texts) {
+    Json::Value list(Json::arrayValue);
+    for (const std::string& text : texts) {
+        list.append(text);
+    }
+    return list;
 }
 
 Json::Value ToJson(const ShareLine& share) {
@@ -202,10 +212,7 @@ Json::Value ToJson(const ShareLine& share) {
     json["watched"] = share.watched < 0 ? Json::Value() : Json::Value(Json::Int64{share.watched});
     json["unwatched"] =
         share.unwatched < 0 ? Json::Value() : Json::Value(Json::Int64{share.unwatched});
-    json["problems"] = Json::Value(Json::arrayValue);
-    for (const std::string& problem : share.problems) {
-        json["problems"].append(problem);
-    }
+    json["problems"] = ListOf(share.problems);
     Json::Value& worker = json["worker"];
     worker["running"] = share.has_worker;
     worker["state"] = share.state;
@@ -277,6 +284,7 @@ Status TakeStatus() {
     const fileindex::FolderMgr folders;
     Status status = TakeDaemons();
     status.resume_time = fileindex::StatusMgr().GetPauseInfo();
+    status.share_problems = ProblemsOfShares();
     std::map<std::string, bool> paused;  // a share is when all of its folders are
     for (const auto& folder : folders.GetFolders()) {
         const auto entry = paused.emplace(folder->GetShare(), true).first;
@@ -311,10 +319,8 @@ Json::Value ToJson(const Status& status) {
     json["daemons"][kSearchDaemon.name] = status.search.IsUp();
     json["daemons"][kIndexer.name] = status.indexer.IsUp();
     json["daemons"][kMonitor.name] = status.monitor.IsUp();
-    json["problems"] = Json::Value(Json::arrayValue);
-    for (const std::string& problem : status.problems) {
-        json["problems"].append(problem);
-    }
+    json["problems"] = ListOf(status.problems);
+    json["share_problems"] = ListOf(status.share_problems);
     json["resume_time"] = Json::Int64{status.resume_time};
     json["finished"] = status.IsFinished() && !status.HasProblem();
     json["folder"] = Json::Value(Json::arrayValue);

@@ -57,6 +57,8 @@ struct Status {
     std::vector<FolderLine> folders;
     std::vector<ShareLine> shares;
     std::vector<std::string> problems;  ///< of the whole system: sentences with their full stop
+    /// See ProblemsOfShares: to be shown; they stop no other share.
+    std::vector<std::string> share_problems;
 
     /// Nothing is left to do in any folder, though some may have a problem that stays.
     bool IsFinished() const;

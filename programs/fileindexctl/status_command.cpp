@@ -34,10 +34,10 @@ std::string Progress(const ShareLine& share, const Session& session) {
     return ProgressBar(part, kBarWidth) + " " + counts;
 }
 
-/// "120 files of 3.2 MB waiting for content, about 2 minutes left"; empty when none wait.
+/// "120 files of 3.2 MB waiting (contents), about 2 minutes left"; empty when nothing waits.
 std::string Backlog(const ShareLine& share) {
     if (share.waiting == 0) {
-        return "";
+        return share.phase.empty() ? "" : "working through " + Shown(share.phase);
     }
     std::string text = Number(share.waiting, "file", "files");
     text += share.waiting_bytes == 0 ? "" : " of " + Bytes(share.waiting_bytes);
@@ -56,8 +56,9 @@ void PrintShare(const ShareLine& share, Session& session) {
     if (share.has_worker && share.state == "processing") {
         session.out << "    " << Progress(share, session) << "  " << Shown(share.current) << "\n";
     }
-    if (share.waiting > 0) {
-        session.out << "    " << Backlog(share) << "\n";
+    const std::string backlog = Backlog(share);
+    if (!backlog.empty()) {
+        session.out << "    " << backlog << "\n";
     }
     if (share.failed > 0) {
         session.out << "    " << Number(share.failed, "file", "files")
@@ -96,6 +97,9 @@ void PrintDaemons(const Status& status, Session& session) {
 }
 
 void PrintStatus(const Status& status, Session& session) {
+    for (const std::string& problem : status.share_problems) {
+        session.out << Shown(problem) << "\n";
+    }
     if (status.folders.empty()) {
         session.out << "Nothing is indexed; choose a folder with 'fileindexctl folder add PATH'.\n";
         return;

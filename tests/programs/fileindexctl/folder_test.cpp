@@ -4,6 +4,7 @@
 #include "fileindex/folder_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "tests/programs/fileindexctl/ctl_fixture.h"
+#include "tests/support/files.h"
 
 namespace quivra::ctl {
 namespace {
@@ -220,6 +221,12 @@ TEST_F(FolderTest, ShareListTellsHowEachStands) {
               "locked  /volume1/locked  0        not possible\n"
               "music   /volume1/music   0        off\n"
               "photo   /volume1/photo   1        on\n");
+    support::WriteFile("/etc/kesto/shares.conf", "[s]\npath = /volume1/s/\n[t\n");
+    const Result wrong = Piped({"share", "list"});
+    EXPECT_EQ(wrong.status, kFailure);
+    EXPECT_NE(wrong.err.find("/etc/kesto/shares.conf:2: "), std::string::npos) << wrong.err;
+    EXPECT_NE(Piped({"status"}).out.find("/etc/kesto/shares.conf:3: "), std::string::npos);
+    std::filesystem::remove("/etc/kesto/shares.conf");
 }
 
 }  // namespace

@@ -39,6 +39,7 @@ TEST_F(StatusTest, FinishedIsSaidOnlyWhenEverythingWorks) {
         {&monitor_,
          R"({"problem":"no descriptors left.","folders":[{"queue":")" + queue + R"("}]})",
          "no descriptors left."},
+        {&monitor_, "7", "kestotifyd does not tell how it is (its reply makes no sense)"},
         {&indexer_, R"({"shares":[{"share":"s","problem":"its store is damaged"}]})",
          "its store is damaged"},
         {&search_, R"({"indexes":[{"id":"fileindex_s","documents":3,"problem":"disk on fire"}]})",
@@ -89,6 +90,8 @@ TEST_F(StatusTest, WorkThatIsLeftIsNotFinished) {
     }
     std::filesystem::remove(QueueOf("s"));
     std::filesystem::remove(QueueOf("s") + ".tmp");
+    EXPECT_EQ(PipedJson({"status", "--json"})["folder"][0]["status"]["text"], "processing");
+    Tell(indexer_, R"({"shares":[{"share":"s","waiting":0,"phase":"names"}]})");
     EXPECT_EQ(PipedJson({"status", "--json"})["folder"][0]["status"]["text"], "processing");
 }
 
@@ -175,6 +178,10 @@ TEST_F(StatusTest, FailedListsAndTriesAgain) {
     EXPECT_EQ(Piped({"failed", "s", "--retry"}).status, kSuccess);
     EXPECT_EQ(asked.back(), "retry s");
     EXPECT_EQ(Piped({"failed", "unknown"}).status, kFailure);
+    indexer_->SetHandler([](const Json::Value&) {
+        return fake::Frame(R"({"success":false,"error":{"code":120,"msg":"it is paused"}})");
+    });
+    EXPECT_NE(Piped({"failed", "--retry"}).err.find("share s: it is paused"), std::string::npos);
     indexer_.reset();
     EXPECT_NE(Piped({"failed"}).err.find("fileindexd is not running"), std::string::npos);
 }
