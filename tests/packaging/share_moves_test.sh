@@ -13,9 +13,13 @@ trap 'kill "${daemons[@]}" 2>/dev/null || true' EXIT
 mkdir -p /etc/kesto /var/packages/Quivra/etc /var/lib/kesto /volume1/photo /volume2
 printf '[photo]\npath = /volume1/photo\n' >/etc/kesto/shares.conf
 echo tomatoes >/volume1/photo/old.txt
-for daemon in kestoelasticd kestotifyd fileindexd; do
+for daemon in kestoelasticd fileindexd kestotifyd; do
     "$daemon" &
     daemons+=($!)
+    for ((i = 0; i < 600; i++)); do
+        [ -S "/var/run/$daemon.sock" ] && break
+        sleep 0.05
+    done
 done
 
 expect_found() {
@@ -29,10 +33,7 @@ expect_found() {
     exit 1
 }
 
-for ((i = 0; i < 100; i++)); do
-    fileindexctl folder add /photo >/dev/null 2>&1 && break
-    sleep 0.1
-done
+fileindexctl folder add /photo
 expect_found /volume1/photo/old.txt
 
 steps=$(sed -n '/^## A new name/,/^## /{/^```sh$/,/^```$/{/^```/!p}}' "$source/docs/operating.md")
