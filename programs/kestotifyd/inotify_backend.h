@@ -62,6 +62,8 @@ class InotifyBackend : public Backend {
     void HandleOverflow();
     void StartRescans();
     bool IsRoomFree();
+    /// Whether the error says that a directory is there and cannot be watched.
+    static bool IsRefusal(int error_number);
 
     int Watch(const std::string& path, bool follow);
     void Release(const std::vector<int>& watches);

@@ -11,17 +11,11 @@
 #include <cerrno>
 #include <filesystem>
 #include <system_error>
-#include <utility>
-#include <vector>
 
-#include "base/path.h"
 #include "common/error.h"
 #include "common/log.h"
-
 #include "programs/daemon/instance_lock.h"
 #include "programs/daemon/program.h"
-#include "programs/kestotifyd/fanotify_backend.h"
-#include "programs/kestotifyd/inotify_backend.h"
 #include "programs/kestotifyd/registration.h"
 
 #include <kesto/filesystem.h>
@@ -29,13 +23,8 @@
 namespace kestotifyd {
 namespace {
 
-/// A folder's return, or a registration that could be read again, is noticed this late at most.
-constexpr std::chrono::seconds kCheckInterval{3};
-/// The same for a disappearance that no event tells of, as when a directory above is renamed while
-/// inotify watches. Nothing else turns the loop of an idle monitor.
-constexpr std::chrono::minutes kIdleCheckInterval{1};
 constexpr char kStateSocket[] = "/var/run/kestotifyd.sock";
-constexpr std::chrono::milliseconds kStopTime = quivra::daemon::kStopGrace;
+constexpr std::chrono::milliseconds kLongestStop{950};
 
 [[noreturn]] void FailSystemCall(int line, const char* call) {
     const std::string reason =
@@ -51,14 +40,6 @@ std::string MakeDirectory(const std::string& path) {
     }
     errno = 0;
     return path;
-}
-
-/// A directory that cannot be read counts as empty: to take an absent volume for one that is there
-/// would drop its documents.
-bool IsEmptyDirectory(const std::string& path) {
-    std::error_code error;
-    const bool is_empty = std::filesystem::is_empty(path, error);
-    return is_empty || error;
 }
 
 void Drain(int fd) {
@@ -120,7 +101,9 @@ void Monitor::Run() {
         std::array<epoll_event, 8> events;
         const int count =
             epoll_wait(epoll_.Get(), events.data(), events.size(), WaitMilliseconds(Clock::now()));
-        bool has_registrations = are_registrations_due_ && Clock::now() >= next_check_;
+        const bool is_check_due = Clock::now() >= next_check_;
+        bool has_registrations = is_check_due && are_registrations_due_;
+        bool has_mounts = is_check_due && are_mounts_due_;
         bool is_asked = false;
         for (int i = 0; i < count; ++i) {
             const int fd = events.at(static_cast<std::size_t>(i)).data.fd;
@@ -132,11 +115,12 @@ void Monitor::Run() {
                 }
                 has_registrations |= news.reload;
             }
-            if (fd == mounts_.Fd()) {
-                HandleMountChange();
-            }
+            has_mounts |= fd == mounts_.Fd();
             has_registrations |= fd == registration_events_.Get();
             is_asked |= state_server_ && fd == state_server_->Fd();
+        }
+        if (has_mounts) {
+            HandleMountChange();
         }
         // Changes come before the registrations that were made after them.
         WorkBackends(false);
@@ -164,10 +148,13 @@ int Monitor::WaitMilliseconds(Time now) const {
     return service_manager_.PollTimeout(due, now);
 }
 
+/// What is not written by then is found by the reindex that every start brings.
 void Monitor::Stop() {
+    const Time deadline = Clock::now() + quivra::daemon::kStopGrace;
+    quivra::daemon::EndAtLatest(kLongestStop);  // a file system may not answer
     service_manager_.Stopping();
     WorkBackends(true);
-    queues_.FlushAll(Clock::now() + kStopTime);
+    queues_.FlushAll(deadline);
 }
 
 void Monitor::WorkBackends(bool is_last) {
@@ -196,175 +183,6 @@ void Monitor::LoadRegistrations(bool is_start) {
     }
 }
 
-/// A mount hides what its directory holds: for as long as it lasts, the index shows what can be
-/// found at the path, and afterwards what was hidden, each by a reindex. The directory around it is
-/// scanned again in both cases, for watches that are hidden and for directories without one.
-void Monitor::HandleMountChange() {
-    mounts_.Reload();
-    UpdateRoots();
-    CheckRoots();
-    const MountTable::Changes changes = mounts_.TakeChanges();
-    std::set<std::string> around;
-    for (const std::set<std::string>* const some : {&changes.added, &changes.removed}) {
-        for (const std::string& point : *some) {
-            const auto root = InnermostRoot(std::string(quivra::base::Directory(point)));
-            if (root == roots_.end()) {
-                continue;
-            }
-            around.insert(root->first);
-            if (some == &changes.removed) {
-                root->second.uncovered.insert(point);
-            }
-        }
-    }
-    for (const std::string& path : around) {
-        roots_.at(path).backend->Rescan(path);
-    }
-}
-
-/// The watched root that the path lies in; end() when there is none.
-Monitor::Roots::iterator Monitor::InnermostRoot(const std::string& path) {
-    auto innermost = roots_.end();
-    for (auto it = roots_.begin(); it != roots_.end(); ++it) {
-        // Sorted by path: of two that the path lies in, the later one is the longer one.
-        if (it->second.backend != nullptr && quivra::base::IsAtOrBelow(path, it->first)) {
-            innermost = it;
-        }
-    }
-    return innermost;
-}
-
-/// The registered folders, and what is mounted below them.
-void Monitor::UpdateRoots() {
-    wanted_roots_ = queues_.OutermostFolders();
-    for (const std::string& folder : std::set<std::string>(wanted_roots_)) {
-        for (const std::string& mounted : mounts_.Below(folder)) {
-            if (queues_.Covers(mounted)) {
-                wanted_roots_.insert(mounted);
-            }
-        }
-    }
-    for (const std::string& path : wanted_roots_) {
-        roots_.try_emplace(path);
-    }
-}
-
-/// A root that another one is to replace goes only when that one is complete, so that no moment
-/// passes unwatched.
-void Monitor::DropObsoleteRoots() {
-    if (std::any_of(roots_.begin(), roots_.end(), [](const auto& entry) {
-            return entry.second.backend != nullptr && !entry.second.is_complete;
-        })) {
-        return;
-    }
-    std::erase_if(roots_, [&](const auto& entry) {
-        const auto& [path, root] = entry;
-        if (wanted_roots_.contains(path)) {
-            return false;
-        }
-        if (root.backend != nullptr) {
-            root.backend->RemoveRoot(path);
-        }
-        return true;
-    });
-}
-
-void Monitor::CheckRoots() {
-    are_roots_stale_ = false;
-    std::vector<std::string> lost;
-    for (auto& [path, root] : roots_) {
-        struct stat status {};
-        const bool exists = stat(path.c_str(), &status) == 0 && S_ISDIR(status.st_mode);
-        if (root.backend != nullptr &&
-            (!exists || status.st_dev != root.device || status.st_ino != root.inode)) {
-            lost.push_back(path);
-        }
-    }
-    for (const std::string& path : lost) {
-        roots_.at(path).backend->RemoveRoot(path);
-        OnRootLost(path);
-    }
-    bool is_complete = !are_registrations_due_;
-    for (auto& [path, root] : roots_) {
-        if (root.backend == nullptr && wanted_roots_.contains(path)) {
-            StartRoot(path, root);
-            is_complete &= root.backend != nullptr;
-        }
-    }
-    next_check_ = Clock::now() + (is_complete ? kIdleCheckInterval : kCheckInterval);
-    DropObsoleteRoots();
-}
-
-/// An empty folder whose file system was mounted elsewhere when it was last watched is the place
-/// where a volume is missing: taking it for the folder would drop everything from the index.
-/// Empty when the folder is there.
-std::string Monitor::WhyAbsent(const std::string& path) const {
-    struct stat status {};
-    if (stat(path.c_str(), &status) != 0) {
-        return path + " cannot be watched: " + quivra::SystemErrorText(errno);
-    }
-    if (!S_ISDIR(status.st_mode)) {
-        return path + " cannot be watched: it is not a directory";
-    }
-    const std::string expected = watched_.MountPoint(path);
-    if (expected.empty() || mounts_.Covering(path) == expected || !IsEmptyDirectory(path)) {
-        return std::string();
-    }
-    return path + " is empty, and nothing is mounted at " + expected +
-           ", where its file system was";
-}
-
-void Monitor::StartRoot(const std::string& path, Root& root) {
-    const std::string absence = WhyAbsent(path);
-    if (!absence.empty()) {
-        root.problem = absence;
-        return;
-    }
-    struct stat status {};
-    Backend* const backend = stat(path.c_str(), &status) == 0 ? AddToBackend(path) : nullptr;
-    if (backend == nullptr) {
-        const std::string problem =
-            path + " cannot be watched: " + quivra::SystemErrorText(errno) +
-            (errno == ENOSPC ? ". Raise the limit: sysctl fs.inotify.max_user_watches" : "");
-        if (root.problem != problem) {
-            root.problem = problem;
-            errno = 0;
-            quivra::LogError({"monitor", __LINE__}, "%s", problem.c_str());
-        }
-        return;
-    }
-    root = {backend, false, status.st_dev, status.st_ino, mounts_.Covering(path)};
-    if (options_.common.is_verbose) {
-        quivra::LogTrace({"monitor", __LINE__}, "Watching %s with %s", path.c_str(),
-                         backend == fanotify_.get() ? "fanotify" : "inotify");
-    }
-}
-
-/// The back end that took the folder; null when none could.
-Backend* Monitor::AddToBackend(const std::string& path) {
-    BackendSink& sink = *this;
-    if (options_.backend != BackendChoice::kInotify) {
-        if (!fanotify_ && (fanotify_ = FanotifyBackend::Create(sink))) {
-            WatchDescriptor(fanotify_->Fd(), EPOLLIN);
-        }
-        if (fanotify_ && fanotify_->AddRoot(path)) {
-            return fanotify_.get();
-        }
-        // Descriptors come free again; the other back end would be kept for good.
-        if (options_.backend == BackendChoice::kFanotify || (fanotify_ && IsShortage(errno))) {
-            return nullptr;
-        }
-    }
-    if (!inotify_) {
-        inotify_ = InotifyBackend::Create(sink, options_.max_watches);
-        if (!inotify_) {
-            return nullptr;
-        }
-        WatchDescriptor(inotify_->Fd(), EPOLLIN);
-    }
-    return inotify_->AddRoot(path) ? inotify_.get() : nullptr;
-}
-
 void Monitor::OnChange(const Change& change) {
     const Time now = Clock::now();
     last_event_ = now;
@@ -377,50 +195,12 @@ void Monitor::OnChange(const Change& change) {
         is_move && change.is_dir && (HoldsRoot(change.path) || HoldsRoot(change.path_old));
 }
 
-/// Whether a root is at or below the path.
-bool Monitor::HoldsRoot(const std::string& path) const {
-    if (path.empty()) {
-        return false;
-    }
-    const auto below = quivra::base::Subtree(roots_, path);
-    return roots_.contains(path) || below.first != below.second;
-}
-
-void Monitor::OnRootComplete(const std::string& path) {
-    Root& root = roots_.at(path);
-    root.is_complete = true;
-    are_roots_stale_ = true;  // one that it replaces may go now
-    watched_.SetMountPoint(path, root.mount_point);
-    watched_.Save();
-    queues_.OnRootComplete(path, Clock::now());
-    for (const std::string& uncovered : std::exchange(root.uncovered, {})) {
-        OnChange({Change::Kind::kReindex, true, uncovered});
-    }
-}
-
 void Monitor::OnGaps(const std::string& root) {
     queues_.OweCrashMarker(root);
 }
 
 void Monitor::OnOverflow(const std::string& root) {
     queues_.OweCrashMarker(root);
-}
-
-void Monitor::OnRootLost(const std::string& path) {
-    Root& root = roots_.at(path);
-    const bool was_mounted_here = mounts_.Covering(path) == root.mount_point;
-    struct stat status {};
-    const bool is_gone = stat(path.c_str(), &status) != 0 || status.st_dev == root.device;
-    mounts_.Reload();
-    const bool is_deleted =
-        is_gone && was_mounted_here && mounts_.Covering(path) == root.mount_point;
-    root = Root{};
-    queues_.OnRootLost(path, is_deleted, Clock::now());
-    are_roots_stale_ = true;
-}
-
-bool Monitor::ShouldWatch(const std::string& directory) const {
-    return !mounts_.IsMountPoint(directory) && queues_.Covers(directory);
 }
 
 }  // namespace kestotifyd

@@ -35,6 +35,9 @@ class Monitor : private BackendSink {
     void Run();
 
   private:
+    /// What is missing, or could not be read, is noticed this late at most when it is there.
+    static constexpr std::chrono::seconds kCheckInterval{3};
+
     /// A directory tree to be watched: a registered folder that lies in no other one, or a file
     /// system mounted below one.
     struct Root {
@@ -90,6 +93,7 @@ class Monitor : private BackendSink {
     std::set<std::string> wanted_roots_;  ///< roots_ holds others until they are replaced
     std::string registration_problem_;
     bool are_registrations_due_ = false;  ///< some could not be read
+    bool are_mounts_due_ = false;         ///< the table could not be read
     std::optional<Time> last_event_;
     Time next_check_{};
     bool are_roots_stale_ = false;  ///< CheckRoots has something to do before next_check_

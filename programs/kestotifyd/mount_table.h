@@ -16,8 +16,9 @@ class MountTable {
     /// Polls as exceptional (EPOLLPRI) when the table has changed since the last Reload.
     int Fd() const { return fd_.Get(); }
 
-    /// Reads the table again.
-    void Reload();
+    /// Reads the table again. False when that is not possible; what was known is kept then, for
+    /// without its mount point a volume would look empty.
+    bool Reload();
 
     /// The mount points that have come and gone since the last call.
     struct Changes {
