@@ -248,7 +248,12 @@ std::string FanotifyBackend::Lookup(View& view, const std::string& handle) const
     }
     errno = 0;
     const std::string path = LookUpOnDisk(view, handle);
-    view.is_blind |= path.empty() && IsShortage(errno);
+    if (path.empty() && IsShortage(errno) && !std::exchange(view.is_blind, true)) {
+        quivra::LogError({"fanotify", __LINE__},
+                         "Changes below %s are missed. Raise LimitNOFILE of the service, or give "
+                         "the machine more memory",
+                         view.roots.begin()->first.c_str());
+    }
     return path;
 }
 
