@@ -144,7 +144,7 @@ void QueueSet::Apply(const Change& change, Time now) {
         if (queue->translator->LineCount() > 0 || MovesQueue(change, *queue)) {
             Schedule(*queue, now + kBatchTime);
         } else if (const std::optional<Time> due = queue->translator->NextDue()) {
-            Schedule(*queue, *due);
+            Schedule(*queue, std::max(*due, now + kBatchTime));
         }
         if (queue->translator->LineCount() > kMaxBatchLines) {
             FlushQueue(*queue, now, now);

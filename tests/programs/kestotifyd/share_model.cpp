@@ -35,6 +35,9 @@ void ShareModel::Pass() {
     for (const auto& [path, unused] : std::exchange(marked_, {})) {
         DropBelow(entries_, path);
         Walk(path, entries_);
+        if (!entries_.contains(path)) {
+            missed_[path];
+        }
     }
 }
 
@@ -50,7 +53,10 @@ void ShareModel::Carry(const std::string& line) {
             DropBelow(entries_, event.path);
             DropBelow(marked_, event.path);
             MoveBelow(marked_, event.path_old, event.path);
-            if (!MoveBelow(entries_, event.path_old, event.path)) {
+            const bool is_known = MoveBelow(entries_, event.path_old, event.path);
+            if (!is_known || missed_.contains(event.path_old) ||
+                quivra::base::Subtree(missed_, event.path_old).first !=
+                    quivra::base::Subtree(missed_, event.path_old).second) {
                 Mark(event.path);
             }
             break;
@@ -116,6 +122,7 @@ bool ShareModel::Converges() {
         std::chrono::seconds(15));
     if (is_equal) {
         consumed_.clear();
+        missed_.clear();
     } else {
         PrintDifference();
     }

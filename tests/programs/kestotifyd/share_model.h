@@ -38,6 +38,9 @@ class ShareModel {
     std::string queue_;
     Entries entries_;
     Entries marked_;  ///< paths to look at, with everything below them
+    /// Looked at and not found. When a line of a later pass moves what is above, this is why: as
+    /// every consumer must, the model checks the moved directory then.
+    Entries missed_;
     std::size_t crashes_ = 0;
     std::string consumed_;  ///< lines since the model last equalled the disk
 };
