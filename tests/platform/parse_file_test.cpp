@@ -178,6 +178,8 @@ TEST_F(ParseFileTest, TextIsRecognisedAndLeavesAsValidUtf8) {
         {std::string(20, 'x') + "\x01", Json::Value()},
         {std::string(50, 'x') + "\x01", std::string(50, 'x') + " "},
         {"\xef\xbb\xbfgr\xc3\xbc\xc3\x9f \xf0\x9f\x98\x80", "gr\xc3\xbc\xc3\x9f \xf0\x9f\x98\x80"},
+        {"\xf4\x8f\xbf\xbf", "\xf4\x8f\xbf\xbf"},  // the last character that there is
+        {"\u00fc\u00fc\u00fc\xed\xa0\x80", "\u00fc\u00fc\u00fc\ufffd\ufffd\ufffd"},  // a surrogate
         {"\xc3\xbc\xe2\x82", "\xc3\xbc"},  // a character is cut off
         {"\xc3\xbc\xc3\xbc\xc0\xed", "\xc3\xbc\xc3\xbc\xef\xbf\xbd"},
         {"\x80 caf\xe9 \x81", "\xe2\x82\xac caf\xc3\xa9 \xef\xbf\xbd"},  // Windows-1252

@@ -63,6 +63,7 @@ TEST_F(SharesTest, HostileLinesCostNoGoodShare) {
         {"[" + long_name + "]\npath = /v/" + long_name + "\n", "", "too long"},
         {"[a]\npath = /v/a\nusers = " + std::string(5000, 'u') + ":rw\n", "", "too long"},
         {"[a]\npath = /v/a\nread only = maybe\n", "/v/a", "neither yes nor no"},
+        {"[a]\npath = /v/a\nftp privilege = 7x\n", "/v/a", "not a number: \"7x\""},
     };
     for (const Row& row : rows) {
         SCOPED_TRACE(row.text);
