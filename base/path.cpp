@@ -12,6 +12,7 @@ bool IsBelow(std::string_view path, std::string_view top) {
 }
 
 bool IsAtOrBelow(std::string_view path, std::string_view top) {
+    // Without this "/" would be above nothing: what lies below it does not begin with "//".
     if (top.empty() || top == "/") {
         return path.empty() || path.front() == '/';
     }

@@ -49,6 +49,7 @@ PrivateDirectory PrivateDirectory::Open(const std::string& path, Make make) {
 bool PrivateDirectory::Step(UniqueFd& at, const std::string& name, const std::string& path,
                             Make make) {
     const mode_t mode = name == kSystemDirectory ? kSystemDirectoryMode : kPrivateMode;
+    // Made and then opened like any other: somebody may exchange it in between.
     const bool made = make == Make::kMissing && mkdirat(at.Get(), name.c_str(), mode) == 0;
     UniqueFd next(openat(at.Get(), name.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
     if (!next.IsValid()) {
@@ -60,6 +61,7 @@ bool PrivateDirectory::Step(UniqueFd& at, const std::string& name, const std::st
     if (!CheckOurs(next.Get(), path)) {
         return false;
     }
+    // By the descriptor that was checked, never by the name.
     if (made && fchmod(next.Get(), mode) != 0) {
         return false;
     }
@@ -72,6 +74,7 @@ bool PrivateDirectory::CheckOurs(int fd, const std::string& path) {
     if (fstat(fd, &status) != 0) {
         return false;
     }
+    // Root's is good for everybody: only the daemons' own tools run as somebody else.
     if (status.st_uid != 0 && status.st_uid != geteuid()) {
         problem_ =
             path + " belongs to user " + std::to_string(status.st_uid) + ", not to root; remove it";

@@ -13,10 +13,13 @@ class SockConnection {
     SockConnection(const SockConnection&) = delete;
     SockConnection& operator=(const SockConnection&) = delete;
 
-    /// Each is false on failure, with errno telling why; the connection is of no more use then.
+    /// Connects, once more where it was connected before. This and the calls below are false on
+    /// failure, with errno telling why; the connection is of no more use then.
     virtual bool Connect() = 0;
+    /// Sends a whole message; never raises SIGPIPE.
     bool Send(const std::string& message);
-    /// `message` is unspecified after a failure.
+    /// Waits for a whole message, however long that takes. `message` is unspecified after a
+    /// failure.
     bool Recv(std::string& message);
 
   protected:
@@ -28,7 +31,9 @@ class SockConnection {
 /// A connection to a Unix stream socket. The destructor closes it.
 class DomainSockConnection : public SockConnection {
   public:
+    /// Only keeps the path of the server's socket.
     explicit DomainSockConnection(const std::string& path);
+    /// Waits while the server's backlog is full. ENAMETOOLONG for a path that no socket can have.
     bool Connect() override;
 
   private:

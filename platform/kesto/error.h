@@ -17,11 +17,15 @@ extern "C" {
 #define KESTO_ERR_VOLUME_FULL 0x2400      /* no room on the volume */
 #define KESTO_ERR_QUOTA_EXCEEDED 0x2900   /* no room within the user's quota */
 
-/// Details of the last failed platform call of the calling thread: its code, and the source file
-/// and line that reported it. 0, "" and 0 while none has failed. The text lives as long as the
-/// process.
+/// The code of the last failed platform call of the calling thread; 0 while none has failed. A call
+/// that succeeds leaves it as it is.
 int KLIBCErrGet(void);
+
+/// The source file that reported that failure, "" while there was none. The text lives as long as
+/// the process.
 const char* KLIBCErrorGetFile(void);
+
+/// The line in that file; 0 while there was no failure.
 int KLIBCErrorGetLine(void);
 
 #ifdef __cplusplus

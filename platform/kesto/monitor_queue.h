@@ -22,7 +22,9 @@ namespace KESTOTIFYD {
 /// "ignore": ["@eaDir"]}}.
 class MonitorQueue {
   public:
+    /// Takes any value; Upsert says whether it is a description.
     explicit MonitorQueue(const Json::Value& description);
+    /// The description as it was given.
     const Json::Value& Description() const;
 
     /// Adds the registration or replaces the one of the same queue and application. It is on
@@ -30,7 +32,8 @@ class MonitorQueue {
     /// "queue" or "config".
     static bool Upsert(const MonitorQueue& queue, const std::string& app, MonitorQueueType type);
 
-    /// Removes a registration; one that does not exist is removed successfully.
+    /// Removes a registration; one that does not exist is removed successfully. False on failure,
+    /// with errno telling why.
     static bool Delete(const std::string& queue_path, const std::string& app,
                        MonitorQueueType type);
 

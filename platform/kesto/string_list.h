@@ -10,6 +10,8 @@ typedef struct KLIBCSzList KLIBCSzList;
 /// An empty list with room for `size` texts (it grows); null on failure. Freed with
 /// KLIBCSzListFree, which allows null.
 KLIBCSzList* KLIBCSzListAlloc(int size);
+
+/// Frees the list and its texts.
 void KLIBCSzListFree(KLIBCSzList* list);
 
 /// Appends a copy of the text. Negative on failure.

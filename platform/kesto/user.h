@@ -16,6 +16,8 @@ struct KESTOUser {
 /// Looks a user up by id. 0 and a record that the caller frees with KESTOUserFree; negative, and
 /// *user null, when there is none.
 int KESTOUserGetByUID(unsigned int uid, struct KESTOUser** user);
+
+/// Frees a record; null is allowed.
 void KESTOUserFree(struct KESTOUser* user);
 
 /// Makes the process act as the user: supplementary groups, effective group, effective user, in an

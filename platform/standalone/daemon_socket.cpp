@@ -6,6 +6,9 @@
 
 namespace kestodaemon {
 
+// The classes keep a plain descriptor: their layout is the platform's, which others replace, and
+// knows nothing of our own types.
+
 SockConnection::~SockConnection() {
     if (fd_ >= 0) {
         close(fd_);

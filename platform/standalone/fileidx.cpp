@@ -62,6 +62,7 @@ int Compose(const char* share_path, const char* name, char* out, int out_size) {
         return SetError(KESTO_ERR_BAD_ARGUMENT);
     }
     const std::string path = DirectoryPath(share_path);
+    // Before the directory is made: a call that fails leaves nothing behind.
     if (CopyOut(path + "/" + name, out, out_size) < 0) {
         return -1;
     }

@@ -16,6 +16,7 @@ int KESTOGetFSType(const char* path, int /*flags*/) {
         return kesto::SetError(KESTO_ERR_SYSTEM);
     }
     const auto magic = static_cast<unsigned long>(status.f_type);
+    // One number for all of FUSE: a USB disk with NTFS is local, sshfs is not.
     if (magic == kesto::kFuseMagic) {
         return kesto::FuseTypeCode(kesto::FileSystemNameOf(path));
     }

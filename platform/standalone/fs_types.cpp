@@ -38,6 +38,8 @@ constexpr unsigned long kVirtual[] = {
     kConfigFsMagic,     kRpcPipeFsMagic,
 };
 
+// A FUSE file system that is in neither list counts as local: a wrong "remote" would take a disk
+// out of the index without a word.
 constexpr std::string_view kRemoteFuse[] = {
     "sshfs",
     "glusterfs",

@@ -4,6 +4,8 @@
 
 #include "platform/standalone/run_program.h"
 
+// The flags choose the platform's own execution environment (identity, log), which an ordinary
+// machine does not have; the library always gives 187.
 int KLIBCExecl(const char* program, int flags, ...) {
     std::vector<std::string> arguments;
     va_list list;

@@ -37,6 +37,7 @@ int IsInShareDirectory(const char* path, const char* name) {
     if (shares == nullptr) {
         return -1;
     }
+    // Of the innermost share: "#recycle" in a directory above its root is a name like any other.
     const ShareConf* share = FindShareOfPath(*shares, path);
     return share != nullptr && quivra::base::IsAtOrBelow(path, share->path + "/" + name);
 }
@@ -76,7 +77,7 @@ int KESTOShareGet(const char* name, KESTOShare** share) {
     if (found == nullptr) {
         return SetError(KESTO_ERR_NO_SUCH_SHARE);
     }
-    auto* record = new KESTOShare{};
+    auto* record = new KESTOShare{};  // zeroed, so that each text is ended
     kesto::CopyField(found->name, record->szName);
     kesto::CopyField(found->path, record->szPath);
     kesto::CopyField(found->users, record->szUsers);
@@ -128,6 +129,7 @@ int KESTOShareUserPrivGet(const char* user, const KESTOShare* share) {
     if (share == nullptr) {
         return SetError(KESTO_ERR_BAD_ARGUMENT);
     }
+    // First, because an administrator has the right whatever the share's list says.
     const int admin = KLIBGroupIsAdminGroupMem(user, 0);
     if (admin != 0) {
         return admin < 0 ? admin : KESTO_SHARE_PRIV_WRITE;

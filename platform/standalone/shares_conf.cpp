@@ -25,6 +25,7 @@ std::string_view Trim(std::string_view text) {
 
 /// The line without its comment: a semicolon counts at the start and behind a blank.
 std::string_view WithoutComment(std::string_view line) {
+    // Only behind a blank, because a directory's name may hold one.
     for (std::size_t i = line.find(';'); i < line.size(); i = line.find(';', i + 1)) {
         if (i == 0 || line[i - 1] == ' ' || line[i - 1] == '\t') {
             return Trim(line.substr(0, i));
@@ -75,7 +76,7 @@ bool* FlagOf(ShareConf& share, std::string_view key) {
 class Parser {
   public:
     SharesConf Parse(std::string_view text) {
-        if (text.starts_with("\xef\xbb\xbf")) {
+        if (text.starts_with("\xef\xbb\xbf")) {  // some editors begin UTF-8 files with a mark
             text.remove_prefix(3);
         }
         while (!text.empty()) {
@@ -134,6 +135,7 @@ class Parser {
         } else if (key == "ftpprivilege") {
             const char* end = value.data() + value.size();
             const auto [stop, error] = std::from_chars(value.data(), end, section_->ftp_privilege);
+            // The least right, as with every value that cannot be understood.
             if (error != std::errc() || stop != end) {
                 section_->ftp_privilege = 0;
                 Report(line_, "the ftp privilege is not a number: " + Quote(value));
@@ -193,6 +195,7 @@ class Parser {
             share.users.size() >= sizeof(KESTOShare::szUsers)) {
             return Refuse(section_line_, "the name, the path or the list of users is too long");
         }
+        // The first one stays: an addition at the end of the file must not move a share elsewhere.
         return FindShare(conf_.shares, share.name) == nullptr ||
                Refuse(section_line_, "the share exists already: " + Quote(share.name));
     }

@@ -13,6 +13,7 @@ struct KLIBCSzList {
 
 KLIBCSzList* KLIBCSzListAlloc(int size) {
     auto* list = new KLIBCSzList;
+    // A caller's guess must not cost memory that no machine has.
     list->texts.reserve(static_cast<std::size_t>(std::clamp(size, 0, 1 << 16)));
     return list;
 }

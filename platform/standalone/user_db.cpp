@@ -25,6 +25,8 @@ bool WithEntry(const Lookup& lookup, const Use& use) {
         if (error == ERANGE && buffer.size() < kMaxEntrySize) {
             buffer.resize(buffer.size() * 2);
         } else if (error != EINTR) {
+            // Databases behind a network answer ENOENT, ESRCH, EBADF or EPERM for "no such user";
+            // only the pointer tells.
             errno = error != 0 ? error : saved_errno;
             if (found != nullptr) {
                 use(*found);
@@ -60,6 +62,7 @@ std::optional<UserEntry> FindUser(uid_t uid) {
 }
 
 std::vector<gid_t> GroupsOf(const UserEntry& user) {
+    // The member may be in more groups than that: the call then says how many, and is repeated.
     int count = 32;
     std::vector<gid_t> groups(static_cast<std::size_t>(count));
     while (getgrouplist(user.name.c_str(), user.gid, groups.data(), &count) < 0) {

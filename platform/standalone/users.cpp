@@ -46,6 +46,7 @@ int KLIBGroupIsAdminGroupMem(const char* user, int /*flags*/) {
     if (entry->uid == 0) {
         return 1;
     }
+    // An ordinary machine need not have the group; then only root is one.
     const auto administrators = kesto::FindGroup(kAdministrators);
     if (!administrators) {
         return 0;
@@ -74,10 +75,11 @@ int KESTORecycleHomeEnumRecyclePath(KLIBCSzList** list) {
     if (directory == nullptr) {
         return kesto::SetError(KESTO_ERR_SYSTEM);
     }
-    errno = 0;
+    errno = 0;  // readdir's null is the end or a failure
     while (const dirent* entry = readdir(directory.get())) {
         const std::string recycle = std::string(entry->d_name) + "/#recycle";
         struct stat status {};
+        // A home's owner could put a link there: no directory behind one is a recycle bin.
         if (entry->d_name[0] != '.' &&
             fstatat(dirfd(directory.get()), recycle.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0 &&
             S_ISDIR(status.st_mode) &&

@@ -34,6 +34,7 @@ bool WriteToTerminal(const std::string& line, const std::string& text) {
 
 int WriteToTerminals(const std::string& text,
                      const std::function<bool(const std::string& user)>& is_recipient) {
+    // Collected first: writing may take a moment, and the records are a shared state of libc.
     std::set<std::string> lines;  // a terminal may have several records
     setutxent();
     while (const utmpx* entry = getutxent()) {
