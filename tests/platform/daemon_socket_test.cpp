@@ -4,6 +4,7 @@
 
 #include <cerrno>
 #include <csignal>
+#include <memory>
 #include <thread>
 
 #include "base/frame.h"
@@ -58,6 +59,18 @@ TEST_F(DaemonSocketTest, HostileFramesFail) {
         EXPECT_EQ(errno, error);
         EXPECT_TRUE(error != 0 || sent.starts_with(Frame(message)));
         server.join();
+    }
+}
+
+TEST_F(DaemonSocketTest, EachConnectionEndsWithItsUse) {
+    for (const bool again : {false, true}) {
+        auto connection = std::make_unique<DomainSockConnection>("/volume1/socket");
+        ASSERT_TRUE(connection->Connect());
+        const int peer = accept(server_, nullptr, nullptr);
+        again ? static_cast<void>(connection->Connect()) : connection.reset();
+        char byte = 0;
+        EXPECT_EQ(recv(peer, &byte, 1, MSG_DONTWAIT), 0) << again;
+        close(peer);
     }
 }
 

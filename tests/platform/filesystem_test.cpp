@@ -80,6 +80,10 @@ TEST_F(FilesystemTest, MountsAreWatched) {
 TEST_F(FilesystemTest, TypesAreClassed) {
     EXPECT_EQ(kesto::TypeCode(SQUASHFS_MAGIC), KESTO_FS_IMAGE);
     EXPECT_EQ(kesto::FuseTypeCode("fuseblk"), KESTO_FS_LOCAL);
+    for (const int type : {KESTO_FS_LOCAL, KESTO_FS_VIRTUAL, KESTO_FS_REMOTE, KESTO_FS_IMAGE}) {
+        EXPECT_EQ(KESTOFSIsRemoteFS(type) != 0, type == KESTO_FS_REMOTE) << type;
+        EXPECT_EQ(KESTOFSIsImageFS(type) != 0, type == KESTO_FS_IMAGE) << type;
+    }
     EXPECT_EQ(KESTOGetFSType("/volume1", 0), KESTO_FS_LOCAL);
     EXPECT_EQ(KESTOGetFSType("/proc/self", 0), 12);
     EXPECT_EQ(KESTOGetFSType("/volume1/gone", 0), -1);

@@ -161,6 +161,24 @@ TEST_F(SharesTest, EveryChangeOfTheFileIsSeen) {
     EXPECT_FALSE(GetShare("longer"));
 }
 
+TEST_F(SharesTest, HomesHaveRecycleBinsOfTheirOwn) {
+    KLIBCSzList* list = KLIBCSzListAlloc(0);
+    EXPECT_EQ(KESTOServiceUserHomeIsEnabled(KESTO_USER_HOME_LOCAL, 0), 0);
+    EXPECT_LT(KESTORecycleHomeEnumRecyclePath(&list), 0);
+    WriteFile(kSharesPath, "[homes]\npath = /volume1/homes\n");
+    for (const char* name : {"alice/#recycle", "bob", "carol/#recycle", ".trash/#recycle"}) {
+        std::filesystem::create_directories(std::string("/volume1/homes/") + name);
+    }
+    std::filesystem::create_directory_symlink("/volume1", "/volume1/homes/bob/#recycle");
+    EXPECT_EQ(KESTOServiceUserHomeIsEnabled(KESTO_USER_HOME_LOCAL, 0), 1);
+    EXPECT_EQ(KESTOServiceUserHomeIsEnabled(KESTO_USER_HOME_DOMAIN, 0), 0);
+    EXPECT_EQ(KESTORecycleHomeEnumRecyclePath(&list), 0);
+    EXPECT_GE(KLIBCSzListFind(list, "/volume1/homes/alice/#recycle"), 0);
+    EXPECT_GE(KLIBCSzListFind(list, "/volume1/homes/carol/#recycle"), 0);
+    EXPECT_EQ(KLIBCSzListGet(list, 2), nullptr);
+    KLIBCSzListFree(list);
+}
+
 TEST_F(SharesTest, LongestRootByComponentsHoldsAPath) {
     WriteFile(kSharesPath,
               "[a]\npath = /volume1/a\n[b]\npath = /volume1/a/x/b\n[ab]\npath = /volume1/ab\n");
