@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <array>
+#include <string_view>
 
 #include "fileindex/elastic/protocol.h"
 
@@ -73,7 +74,7 @@ constexpr std::array kErrorTexts = {
     ErrorText{elastic::kNoSpace, "the volume of the index is full", "free space there",
               Reason::kTell},
     ErrorText{elastic::kIndexUnavailable, "the files of its index are missing or unreadable",
-              "check that its volume is mounted", Reason::kTell},
+              "check that its volume is mounted", Reason::kLeaveOut},
     ErrorText{elastic::kIndexMadeAnew, "its index was damaged or missing and is made anew",
               "'fileindexctl status' shows how far it is", Reason::kLeaveOut},
     ErrorText{elastic::kReplyTooLarge, "there are too many hits for one reply", "use --limit",
@@ -126,11 +127,15 @@ const ErrorText* Find(const Error& error) {
 }
 
 std::string Cause(const ErrorText* text, const Error& error) {
+    constexpr std::string_view kDaemonSays = "Request failed, msg=";
+    const std::string reason = error.reason.starts_with(kDaemonSays)
+                                   ? error.reason.substr(kDaemonSays.size())
+                                   : error.reason;
     if (text == nullptr) {
-        return error.reason.empty() ? "kestoelasticd refused it" : error.reason;
+        return reason.empty() ? "kestoelasticd refused it" : reason;
     }
-    const bool tells = text->reason == Reason::kTell && !error.reason.empty();
-    return text->cause + (tells ? " (" + error.reason + ")" : std::string());
+    const bool tells = text->reason == Reason::kTell && !reason.empty();
+    return text->cause + (tells ? " (" + reason + ")" : std::string());
 }
 
 std::string Code(const Error& error) {

@@ -1,6 +1,7 @@
 #include "programs/fileindexctl/search.h"
 
 #include <algorithm>
+#include <memory>
 #include <utility>
 
 #include "common/error.h"
@@ -8,6 +9,7 @@
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/elastic/protocol.h"
 #include "programs/fileindexctl/error_text.h"
+#include "programs/fileindexctl/waiting.h"
 
 namespace quivra::ctl {
 namespace {
@@ -82,9 +84,13 @@ Json::Value WithPage(Json::Value query, const Page& page) {
     return query;
 }
 
-Rest SearchShare(const std::string& share, const Json::Value& query, SearchResults& results) {
-    Json::Value reply;
-    fileindex::elastic::IndexQuery(reply, share, query);
+Rest SearchShare(const std::string& share, const Json::Value& query, SearchResults& results,
+                 Session& session) {
+    const auto shared_reply = std::make_shared<Json::Value>();
+    WaitFor(session, Needs::kBothDaemons, [shared_reply, share, query] {
+        fileindex::elastic::IndexQuery(*shared_reply, share, query);
+    });
+    Json::Value& reply = *shared_reply;
     if (!reply["data"].isArray() || !reply["total"].isUInt64()) {
         throw Error(Error::kQueryWithoutData, toString(reply));
     }
@@ -120,7 +126,7 @@ SearchResults SearchShares(const std::vector<std::string>& shares, const Json::V
     for (const std::string& share : shares) {
         session.doing = "search share " + share;
         try {
-            rests.push_back(SearchShare(share, paged, results));
+            rests.push_back(SearchShare(share, paged, results, session));
         } catch (const Error& error) {
             const bool was_last_hope = results.failures.size() + 1 == shares.size();
             if (was_last_hope || error.code == Error::kChannelFailed ||

@@ -88,11 +88,14 @@ void Detach(const std::string& share, const std::string& root) {
 
 void PauseShare(const std::string& share) {
     NeedsFolders(share);
+    // Checked here, because the library first tells the daemon to end the worker.
+    RequirePlaceOfIndex(share);
     fileindex::SharePause(share);
 }
 
 void ResumeShare(const std::string& share) {
     NeedsFolders(share);
+    RequirePlaceOfIndex(share);
     fileindex::ShareResume(share);
 }
 
@@ -151,6 +154,7 @@ void MigrateShare(const std::string& share, const std::string& path) {
 
 void CheckRecycleBin(const std::string& share) {
     NeedsFolders(share);
+    RequirePlaceOfIndex(share);
     fileindex::ShareCheckRecycle(share);
 }
 

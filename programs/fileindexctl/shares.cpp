@@ -5,6 +5,7 @@
 #include <climits>
 #include <memory>
 #include <set>
+#include <stdexcept>
 
 #include <kesto/fileidx.h>
 #include <kesto/share.h>
@@ -12,7 +13,6 @@
 #include "common/error.h"
 #include "common/util.h"
 #include "fileindex/folder_mgr.h"
-#include "programs/fileindexctl/session.h"
 #include "sdk/share.h"
 
 namespace quivra::ctl {
@@ -64,7 +64,7 @@ std::string ProblemOfPlace(const std::string& share) {
 void RequirePlaceOfIndex(const std::string& share) {
     const std::string problem = ProblemOfPlace(share);
     if (!problem.empty()) {
-        throw Failure(problem);
+        throw std::runtime_error(problem);
     }
 }
 

@@ -19,7 +19,7 @@ std::string RootOf(const std::string& share);
 /// without its full stop. Empty when the place is right, or free, or cannot be looked at.
 std::string ProblemOfPlace(const std::string& share);
 
-/// Throws Failure with that sentence.
+/// Throws that sentence, as the cause of whatever is being done.
 void RequirePlaceOfIndex(const std::string& share);
 
 /// The shares that a search covers: those of the indexed folders, sorted; where no folder was ever

@@ -85,7 +85,10 @@ void AddProblem(ShareLine& share, const std::string& problem) {
     }
 }
 
-void TakeFromIndexer(ShareLine& share, const DaemonState& indexer) {
+constexpr const char* kRegisterAgain =
+    "'fileindexctl folder set' with one of its folders registers it again";
+
+void TakeFromIndexer(ShareLine& share, bool is_paused, const DaemonState& indexer) {
     const Json::Value told = Find(indexer.data["shares"], "share", share.name);
     share.has_worker = told.isObject();
     share.state = Text(told, "state");
@@ -100,6 +103,9 @@ void TakeFromIndexer(ShareLine& share, const DaemonState& indexer) {
     share.eta = Number(told, "eta", -1);
     share.failed = Count(told, "failed");
     AddProblem(share, Text(told, "problem"));
+    if (indexer.reach == DaemonState::Reach::kReplied && !share.has_worker && !is_paused) {
+        AddProblem(share, std::string("fileindexd does not work on it; ") + kRegisterAgain);
+    }
 }
 
 /// An older daemon does not count its documents; then the index itself is asked.
@@ -128,9 +134,7 @@ void TakeFromMonitor(ShareLine& share, const std::string& queue, const DaemonSta
     }
     const Json::Value told = Find(monitor.data["folders"], "queue", queue);
     if (!told.isObject()) {
-        AddProblem(share,
-                   "kestotifyd does not watch it; 'fileindexctl folder set' with one of its "
-                   "folders registers it again");
+        AddProblem(share, std::string("kestotifyd does not watch it; ") + kRegisterAgain);
         return;
     }
     share.watched = Number(told, "watched", -1);
@@ -236,7 +240,7 @@ ShareLine TakeShareLine(const std::string& name, bool is_paused, const Status& s
                             "share clear " +
                                 name + " PATH'"
                           : ProblemOfPlace(name));
-    TakeFromIndexer(share, status.indexer);
+    TakeFromIndexer(share, is_paused, status.indexer);
     try {
         const std::string queue = sdk::SDKShare(name).GetQueuePath();
         share.queue_lines = CountLines(queue);

@@ -180,16 +180,20 @@ TEST_F(FolderTest, AShareThatIsGoneIsNamedWithItsRemedy) {
 
 TEST_F(FolderTest, WhatStandsInThePlaceOfTheIndexIsNamed) {
     Piped({"folder", "add", "/photo"});
+    const std::size_t commands = indexer_.Requests().size();
     std::filesystem::remove_all("/volume1/photo/@eaDir");
     WriteFile("/volume1/photo/@eaDir", "planted");
-    for (const char* command : {"reindex", "set"}) {
-        const Result result = Piped({"folder", command, "/photo"});
+    const std::vector<std::string> rows[] = {
+        {"folder", "reindex", "/photo"}, {"folder", "set", "/photo"}, {"share", "pause", "photo"}};
+    for (const std::vector<std::string>& row : rows) {
+        const Result result = Piped(row);
         EXPECT_EQ(result.status, kFailure);
         EXPECT_EQ(result.out, "");
         EXPECT_NE(result.err.find("/volume1/photo/@eaDir is not a directory; remove it"),
                   std::string::npos)
             << result.err;
     }
+    EXPECT_EQ(indexer_.Requests().size(), commands);
 }
 
 TEST_F(FolderTest, AReindexThatCouldNotBeQueuedIsNotClaimed) {

@@ -40,6 +40,7 @@ TEST_F(StatusTest, FinishedIsSaidOnlyWhenEverythingWorks) {
          R"({"problem":"no descriptors left.","folders":[{"queue":")" + queue + R"("}]})",
          "no descriptors left."},
         {&monitor_, "7", "kestotifyd does not tell how it is (its reply makes no sense)"},
+        {&indexer_, R"({"shares":[]})", "fileindexd does not work on it"},
         {&indexer_, R"({"shares":[{"share":"s","problem":"its store is damaged"}]})",
          "its store is damaged"},
         {&search_, R"({"indexes":[{"id":"fileindex_s","documents":3,"problem":"disk on fire"}]})",
