@@ -1,5 +1,6 @@
 #include "programs/fileindexd/backlog.h"
 
+#include <sqlite3.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -103,6 +104,14 @@ Statement& Backlog::Prepared(const std::string& sql) {
         found = statements_.emplace(sql, Statement(*database_, sql)).first;
     }
     return found->second;
+}
+
+/// An entry that was read can be changed, unless table and index disagree: then the same work would
+/// come again and again.
+void Backlog::CheckChanged() {
+    if (database_->Changes() == 0) {
+        throw sqlite::Error(SQLITE_CORRUPT, "an entry of the backlog cannot be found again");
+    }
 }
 
 void Backlog::CreateTables() {
@@ -343,12 +352,14 @@ std::optional<Backlog::Tree> Backlog::FirstTree() {
 void Backlog::NoteListed(const Tree& tree, const std::string& up_to) {
     Statement& set = Prepared("UPDATE trees SET listed = ?2 WHERE id = ?1");
     set.Bind(1, tree.id).BindBlob(2, up_to).Run();
+    CheckChanged();
 }
 
 void Backlog::FinishListing(const Tree& tree, const std::vector<Directory>& roots) {
     Transaction transaction(*database_);
     Statement& remove = Prepared("DELETE FROM trees WHERE id = ?1");
     remove.Bind(1, tree.id).Run();
+    CheckChanged();
     for (Directory root : roots) {
         AddDirectory(root);
     }
@@ -382,6 +393,7 @@ void Backlog::RemoveDirectories(const std::vector<std::int64_t>& ids) {
     Statement& remove = Prepared("DELETE FROM directories WHERE id = ?1");
     for (const std::int64_t id : ids) {
         remove.Bind(1, id).Run();
+        CheckChanged();
     }
     transaction.Commit();
 }
@@ -404,6 +416,7 @@ void Backlog::NoteFiles(const std::vector<std::string>& done, const std::vector<
     Transaction transaction(*database_);
     for (const std::string& path : done) {
         RemoveFile(path);
+        CheckChanged();
     }
     for (const Problem& problem : failures) {
         AddFailure(problem, now);

@@ -140,6 +140,7 @@ class Backlog {
     void Open(const quivra::base::PrivateDirectory& directory);
     void Close();
     void CreateTables();
+    void CheckChanged();
     sqlite::Statement& Prepared(const std::string& sql);
     std::string Meta(const char* key);
     void SetMeta(const char* key, const std::string& value);
