@@ -27,7 +27,7 @@ std::vector<Change> TranslateRename(const FanotifyEvent& event, HandlePaths& pat
     const bool is_dir = (event.mask & FAN_ONDIR) != 0;
     std::vector<Change> changes;
     if (from.empty() && to.empty()) {
-        return changes;
+        return changes;  // in another mount of the file system, or both directories are gone
     }
     if (to.empty()) {  // out of sight, or into a directory that is gone already
         changes.push_back({Kind::kDeleted, is_dir, from});
@@ -71,6 +71,8 @@ std::vector<Change> TranslateFanotify(const FanotifyEvent& event, HandlePaths& p
         return changes;
     }
     const bool is_dir = (event.mask & FAN_ONDIR) != 0;
+    // A merged event's bits have no order of their own. The deletion first: the consumer looks at
+    // the disk for the others.
     static constexpr std::array<std::pair<std::uint64_t, Kind>, 5> kOrder{
         {{FAN_DELETE, Kind::kDeleted},
          {FAN_CREATE, Kind::kCreated},
@@ -82,6 +84,7 @@ std::vector<Change> TranslateFanotify(const FanotifyEvent& event, HandlePaths& p
             changes.push_back({kind, is_dir, path});
         }
     }
+    // Created and deleted in one event, the object is another one than the target or is gone.
     if (is_dir && (event.mask & FAN_DELETE) != 0) {
         paths.Erase(event.target);
     } else if (is_dir && (event.mask & FAN_CREATE) != 0) {

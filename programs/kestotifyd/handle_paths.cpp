@@ -40,7 +40,7 @@ std::string HandlePaths::Find(const std::string& handle) const {
 
 void HandlePaths::Set(const std::string& handle, const std::string& path) {
     if (is_ahead_) {
-        return;
+        return;  // a place found on the disk now belongs to a later point of the stream
     }
     const auto there = by_path_.find(path);
     const auto known = by_handle_.find(handle);
@@ -78,6 +78,7 @@ void HandlePaths::Rename(const std::string& handle, const std::string& from,
         BecomeAhead();
         return;
     }
+    // Copied: the new places may lie between the old ones in the map's order.
     const Entries moved = Below(by_path_, from);
     EraseBelow(from);
     for (const auto& [path, moved_handle] : moved) {
@@ -86,6 +87,7 @@ void HandlePaths::Rename(const std::string& handle, const std::string& from,
     Set(handle, to);
 }
 
+/// Which of the known places are wrong cannot be told, so all are forgotten.
 void HandlePaths::BecomeAhead() {
     Clear();
     is_ahead_ = true;

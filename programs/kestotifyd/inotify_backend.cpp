@@ -33,6 +33,7 @@ constexpr std::chrono::minutes kForcedRescan{30};
 constexpr std::chrono::milliseconds kProcessSlice{50};
 constexpr std::chrono::milliseconds kLastSlice{300};
 
+/// A part of the limit: it is one for all programs of the user.
 std::size_t ReadLimit() {
     std::size_t limit = kDefaultLimit;
     std::ifstream(kLimitFile) >> limit;
@@ -147,6 +148,7 @@ void InotifyBackend::Handle(const MovePairing::Paired& paired) {
     if (renames_.IsFull()) {
         renames_.Run(sink_, false);
     }
+    // After the reports: a scan takes in what the events behind this one will tell again.
     for (const InotifyOutcome::Appeared& appeared : outcome.appeared) {
         Appear(appeared.parent, appeared.name, 0);
     }
@@ -169,6 +171,7 @@ void InotifyBackend::HandleOverflow() {
     for (const std::string& root : tree_.RootPaths()) {
         sink_.OnOverflow(root);
     }
+    // Not at once: while the storm goes on, new directories would only be missed again.
     rescan_due_ = Clock::now() + kRescanDelay;
 }
 

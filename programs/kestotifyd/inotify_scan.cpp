@@ -245,6 +245,7 @@ void InotifyBackend::ScanDirectory(Scan& scan, const NodeRef& ref) {
     }
 }
 
+/// Only for a rescan: in a first scan, what is missing is told by an event that is on its way.
 void InotifyBackend::DropMissing(WatchNode& node, const std::set<std::string_view>& names) {
     std::vector<WatchNode*> missing;
     for (const auto& [name, child] : node.children) {
@@ -257,6 +258,8 @@ void InotifyBackend::DropMissing(WatchNode& node, const std::set<std::string_vie
     }
 }
 
+/// A directory that has appeared is reported only now, with all below it watched: whoever walks it
+/// then misses nothing.
 void InotifyBackend::Finish(const Scan& scan) {
     if (!tree_.IsAlive(scan.top)) {
         return;

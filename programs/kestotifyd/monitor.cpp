@@ -132,6 +132,7 @@ void Monitor::Run() {
             CheckRoots();
         }
         queues_.Flush(Clock::now());
+        // Last, so that the reply tells what this turn has led to.
         if (is_asked) {
             state_server_->Reply(State());
         }
@@ -165,6 +166,7 @@ void Monitor::WorkBackends(bool is_last) {
     }
 }
 
+/// All files are read each time: they are few, and an event need not tell which of them it was.
 void Monitor::LoadRegistrations(bool is_start) {
     const Registrations read = ReadRegistrations(options_.registrations);
     registration_problem_ = read.problem;

@@ -69,7 +69,8 @@ Monitor::Roots::iterator Monitor::InnermostRoot(const std::string& path) {
     return innermost;
 }
 
-/// The registered folders, and what is mounted below them.
+/// The registered folders, and what is mounted below them. A mount is a root of its own, because
+/// neither back end sees across its border.
 void Monitor::UpdateRoots() {
     wanted_roots_ = queues_.OutermostFolders();
     for (const std::string& folder : std::set<std::string>(wanted_roots_)) {
@@ -221,6 +222,8 @@ void Monitor::OnRootComplete(const std::string& path) {
     }
 }
 
+/// Deleted or moved away on its file system, a folder is gone; with its file system, it is only
+/// absent. The table is read again in between, since its event may not have come yet.
 void Monitor::OnRootLost(const std::string& path) {
     Root& root = roots_.at(path);
     const bool was_mounted_here = mounts_.Covering(path) == root.mount_point;

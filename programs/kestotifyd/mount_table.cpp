@@ -20,6 +20,8 @@ MountTable::MountTable() : fd_(kesto::WatchMounts()) {
 }
 
 bool MountTable::Reload() {
+    // Compared with what was known, and kept until somebody asks: a table is also read when a
+    // folder disappears, and what it shows then must not be missed by the mount event that follows.
     std::optional<std::set<std::string>> points = kesto::ReadMountPoints();
     if (!points) {
         quivra::LogError({"mount_table", __LINE__}, "The mount table cannot be read");
@@ -33,6 +35,8 @@ bool MountTable::Reload() {
     return true;
 }
 
+/// By text, without asking the disk: the answer for a volume that is away has to be what it would
+/// be if it were there.
 std::string MountTable::Covering(const std::string& path) const {
     for (std::string at = path;; at = quivra::base::Directory(at)) {
         if (points_.contains(at)) {

@@ -7,6 +7,7 @@
 namespace kestotifyd {
 
 void MovePairing::Push(InotifyEvent event, Time now) {
+    // Noted by running number, because positions change with each event that is handed out.
     if ((event.mask & IN_MOVED_TO) != 0) {
         second_halves_[event.cookie] = first_index_ + waiting_.size();
     }
@@ -28,6 +29,8 @@ std::optional<MovePairing::Paired> MovePairing::Pop(Time now) {
                 return std::nullopt;
             }
         } else if ((front.event.mask & IN_MOVED_TO) != 0 && !front.is_taken) {
+            // Moved in from elsewhere, or its first half has given up. Cookies come again after a
+            // while, so none may stay behind.
             second_halves_.erase(front.event.cookie);
         }
         const bool is_taken = front.is_taken;

@@ -15,8 +15,12 @@ namespace {
 /// longer than this, the walk may have been faster than the watches.
 constexpr std::chrono::seconds kQuickStart{1};
 
+/// A reader holds the lock for a rename, so a busy queue is free in a moment. What has failed wants
+/// somebody to act.
 constexpr std::chrono::milliseconds kBusyRetry{20};
 constexpr std::chrono::seconds kFailedRetry{2};
+
+/// A storm's lines are written without waiting for their batch: 8,192 take about a megabyte.
 constexpr std::size_t kMaxBatchLines = 8192;
 
 std::string CrashLine(const Registration& registration) {
@@ -44,6 +48,8 @@ void QueueSet::Update(const std::vector<Registration>& registrations, bool is_st
     watched_.Save();
 }
 
+/// A changed registration keeps the writer, with whatever waits in it, and what its folders are
+/// owed. The translator is made anew: lines for the old one's folders and mask are taken out first.
 void QueueSet::UpdateQueue(const Registration& registration, bool is_start, Time now) {
     Queue& queue = queues_[registration.queue];
     if (queue.translator && queue.translator->GetRegistration() == registration) {
@@ -73,6 +79,8 @@ void QueueSet::UpdateQueue(const Registration& registration, bool is_start, Time
     }
 }
 
+/// A volume's events are many and most concern no queue: they are sorted out by looking up each
+/// directory above in a table, however many folders are registered.
 void QueueSet::RebuildIndex() {
     by_folder_.clear();
     for (auto& [path, queue] : queues_) {

@@ -126,6 +126,8 @@ void QueueTranslator::EmitDelete(bool is_dir, const std::string& path) {
     }
 }
 
+/// What has been deleted counts as long as its line and that of a later creation can be in one
+/// queue file. A reader takes the file away at any time: the next one begins without them.
 void QueueTranslator::OnWritten(bool is_new_file) {
     if (is_new_file) {
         deleted_.clear();
@@ -135,6 +137,7 @@ void QueueTranslator::OnWritten(bool is_new_file) {
     deleted_now_.clear();
 }
 
+/// The earliest time wins: a file that is written without end is reported all the same.
 void QueueTranslator::Hold(const std::string& path, Time due) {
     const auto [it, is_new] = held_.emplace(path, due);
     it->second = std::min(it->second, due);

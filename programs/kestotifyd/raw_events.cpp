@@ -86,6 +86,7 @@ std::optional<FanotifyEvent> TakeFanotifyEvent(std::string_view& buffer) {
     FanotifyEvent event;
     event.mask = metadata.mask;
     event.pid = metadata.pid;
+    // Both lengths are the kernel's: later versions have longer headers and more records.
     std::string_view records = buffer.substr(0, metadata.event_len);
     records.remove_prefix(metadata.metadata_len);
     while (records.size() >= sizeof(fanotify_event_info_header)) {

@@ -82,6 +82,7 @@ bool ListFiles(int directory, std::set<std::string>& names) {
 
 }  // namespace
 
+/// Members that are not used ("app", "type") may be anything: they are the registering side's.
 Registration ParseRegistration(const Json::Value& description) {
     Registration registration;
     Json::Value value;
@@ -114,6 +115,7 @@ Registrations ReadRegistrations(const std::string& directory) {
         found.is_whole = false;
         return found;
     }
+    // By name, so that of two files for one queue the same one counts each time.
     std::set<std::string> queues;
     for (const std::string& name : names) {
         Registration registration;

@@ -12,6 +12,7 @@ void RenameCheck::Add(const Change& rename) {
 
 void RenameCheck::Run(BackendSink& sink, bool were_names_early) {
     using Kind = Change::Kind;
+    // Not for directories alone: two exchanged files look like one that was moved to and fro.
     for (const Rename& rename : renames_) {
         struct stat status {};
         if (lstat(rename.to.c_str(), &status) != 0) {

@@ -50,6 +50,7 @@ WatchNode* WatchTree::AddRoot(const std::string& path, int wd) {
     return added;
 }
 
+/// The map's keys view the names that the nodes own, so a name never changes while it is a key.
 WatchNode* WatchTree::AddChild(WatchNode& parent, const std::string& entry, int wd) {
     auto node = std::make_unique<WatchNode>();
     node->parent = &parent;

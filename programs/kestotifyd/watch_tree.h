@@ -39,7 +39,7 @@ class WatchTree {
     /// The entry must not be a child yet.
     WatchNode* AddChild(WatchNode& parent, const std::string& entry, int wd);
 
-    /// Drops the node with everything below it; answers the watches that no node needs any more.
+    /// Drops the node with everything below it. Returns the watches that no node needs any more.
     std::vector<int> Remove(WatchNode& node);
 
     /// Relinks a node that is no root, and drops what was at the new place, as Remove does.

@@ -8,6 +8,8 @@
 namespace kestotifyd {
 
 WatchedFolders::WatchedFolders(std::string path) : path_(std::move(path)) {
+    // Without the file every folder counts as new, and gets no reindex when it returns; that is
+    // made up for by the one that every start brings.
     Json::Value stored;
     if (!quivra::fromFile(stored, path_) || !stored.isObject()) {
         return;
@@ -27,6 +29,7 @@ bool WatchedFolders::Has(const std::string& queue, const std::string& folder) co
     return folders != queues_.end() && folders->second.contains(folder);
 }
 
+/// The same for all queues of a folder, and not yet known for one that was added since.
 std::string WatchedFolders::MountPoint(const std::string& folder) const {
     for (const auto& [queue, folders] : queues_) {
         const auto it = folders.find(folder);
@@ -61,6 +64,8 @@ void WatchedFolders::Save() {
             stored[queue][folder] = mount_point;
         }
     }
+    // Written at once, not when the daemon stops: a killed one must not take an absent volume for
+    // an empty one at its next start.
     if (quivra::toFile(stored, path_)) {
         is_changed_ = false;
     } else {

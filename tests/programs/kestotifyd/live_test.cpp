@@ -304,12 +304,14 @@ TEST_P(LiveTest, ARefusedWatchBecomesACrashMarker) {
 }
 
 TEST_P(LiveTest, WithoutDescriptorsNothingIsLostInSilence) {
+    fs::create_directories(share_ + "/old");  // no event has told fanotify where it is
     ASSERT_TRUE(StartAndSettle()) << ReadFile(kLog);
     const rlimit none{3, 1024};
     const rlimit enough{1024, 1024};
     ASSERT_EQ(prlimit(monitor_->Pid(), RLIMIT_NOFILE, &none, nullptr), 0);
     fs::create_directories(share_ + "/unseen/deep");
     WriteFile(share_ + "/unseen/deep/f");
+    WriteFile(share_ + "/old/f");
     EXPECT_TRUE(Eventually([] { return HasLog("cannot be watched") || HasLog("are missed"); }));
     ASSERT_EQ(prlimit(monitor_->Pid(), RLIMIT_NOFILE, &enough, nullptr), 0);
     EXPECT_TRUE(Comes(Line(0x200, true, kShare)));
@@ -321,6 +323,7 @@ TEST_P(LiveTest, WithoutDescriptorsNothingIsLostInSilence) {
 TEST_P(LiveTest, TellsItsState) {
     ASSERT_TRUE(StartAndSettle()) << ReadFile(kLog);
     fs::create_directories(share_ + "/sub");
+    kill(monitor_->Pid(), SIGHUP);  // reads the registrations again
     LinesUntilNow();
     const Json::Value state = State();
     EXPECT_EQ(state["backend"], GetParam());
