@@ -117,21 +117,24 @@ InotifyBackend::Child InotifyBackend::EnsureChild(WatchNode& parent, int parent_
         }
         return {Child::State::kAbsent};
     }
-    const int wd = Watch(Below(parent_fd, name), false);
-    if (wd < 0) {
-        if (!IsRefusal(errno)) {
-            return {Child::State::kAbsent};  // where `present` went, the events ahead will tell
-        }
-        Refuse(errno, parent.Root().name, path);
-        return {Child::State::kRefused};
-    }
+    int wd = Watch(Below(parent_fd, name), false);
     if (present != nullptr && present->wd == wd) {
         return {Child::State::kPresent, present};
     }
-    if (present != nullptr) {
+    if (present != nullptr && wd >= 0) {
         Release(tree_.Remove(*present));
+        // The directory was perhaps known below the one whose place it has taken, and its watch has
+        // just been released with that one's.
+        wd = Watch(Below(parent_fd, name), false);
     }
-    return Adopt(parent, name, wd);
+    if (wd >= 0) {
+        return Adopt(parent, name, wd);
+    }
+    if (!IsRefusal(errno)) {
+        return {Child::State::kAbsent};  // where `present` went, the events ahead will tell
+    }
+    Refuse(errno, parent.Root().name, path);
+    return {Child::State::kRefused};
 }
 
 /// Puts a watch into the tree. When the kernel returns a watch that another node has, the directory

@@ -255,6 +255,7 @@ TEST_P(LiveTest, EveryStartBeginsWithAReindex) {
 }
 
 TEST_P(LiveTest, OverflowBecomesACrashMarkerAndNothingStaysUnwatched) {
+    fs::create_directories(share_ + "/outer/inner/deep");
     ASSERT_TRUE(StartAndSettle()) << ReadFile(kLog);
     kill(monitor_->Pid(), SIGSTOP);
     for (int i = 0; i < 300; ++i) {
@@ -263,12 +264,20 @@ TEST_P(LiveTest, OverflowBecomesACrashMarkerAndNothingStaysUnwatched) {
     for (int i = 0; i < 17000; ++i) {
         WriteFile(share_ + "/f" + std::to_string(i));
     }
+    // Unseen, a directory takes the place of the one above it.
+    fs::rename(share_ + "/outer/inner", share_ + "/between");
+    fs::remove(share_ + "/outer");
+    fs::rename(share_ + "/between", share_ + "/outer");
     kill(monitor_->Pid(), SIGCONT);
     EXPECT_TRUE(Comes(Line(0x200, true, kShare)));
     EXPECT_TRUE(HasLog("max_queued_events"));
     EXPECT_TRUE(model_.Converges());
     WriteFile(share_ + "/d299/sub/late");
     EXPECT_TRUE(Comes(Line(0x2, false, share_ + "/d299/sub/late")));
+    for (const std::string place : {"/outer/late", "/outer/deep/late"}) {
+        WriteFile(share_ + place);
+        EXPECT_TRUE(Comes(Line(0x2, false, share_ + place)));
+    }
 }
 
 TEST_P(LiveTest, ARefusedWatchBecomesACrashMarker) {
