@@ -2,7 +2,7 @@
 # The Debian packages' whole life, in a machine of their own: installed into an image, booted, used,
 # upgraded, disabled, masked, removed and purged. Exit status 77 where no such machine can be had.
 #
-#   packages_test.sh SOURCE_DIRECTORY      after scripts/package; keeps build/machine.tar
+#   packages_test.sh SOURCE_DIRECTORY      after scripts/package; keeps build/machine-*.tar
 set -euo pipefail
 source=$1
 packages=$source/build/packages
@@ -29,13 +29,15 @@ quietly() {
 # --- the machine --------------------------------------------------------------------------------
 
 make_root() {
-    local cache=$source/build/machine.tar mirror names
+    local cache mirror names
+    names=$(for file in "$packages"/{libfileindex1,fileindex}_*.deb; do
+        dpkg-deb -f "$file" Depends
+    done | tr ',' '\n' | sed 's/^ *//;s/[ (|].*//' | grep -v fileindex | sort -u | paste -sd,)
+    # Made once for each set of dependencies.
+    cache=$source/build/machine-$(cksum <<<"$names" | cut -d' ' -f1).tar
     if [ ! -e "$cache" ]; then
         # Where this machine gets its own packages from.
         mirror=$(apt-get indextargets --format '$(REPO_URI)' 'Created-By: Packages' | head -n 1)
-        names=$(for file in "$packages"/{libfileindex1,fileindex}_*.deb; do
-            dpkg-deb -f "$file" Depends
-        done | tr ',' '\n' | sed 's/^ *//;s/[ (|].*//' | grep -v fileindex | sort -u | paste -sd,)
         quietly debootstrap --variant=minbase --include="systemd,systemd-sysv,$names" bookworm \
             "$work/base" "$mirror"
         tar -C "$work/base" -cf "$cache.new" .
