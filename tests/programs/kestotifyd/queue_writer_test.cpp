@@ -17,6 +17,7 @@
 #include <vector>
 
 #include "common/lock_file.h"
+#include "programs/kestotifyd/queue_set.h"
 #include "tests/fake/fake_libc.h"
 #include "tests/support/files.h"
 
@@ -117,6 +118,33 @@ TEST_F(QueueWriterTest, NothingIsWrittenWhereOthersMayWrite) {
     fs::permissions(directory_, fs::perms(0755));
     EXPECT_EQ(writer_.Write(), Result::kDone);
     EXPECT_EQ(Content(), "crash\n");
+}
+
+/// What is made where a volume is away would make it look like an empty one.
+TEST_F(QueueWriterTest, AMissingDirectoryIsMadeOnlyWhileItsFolderIsWatched) {
+    using std::chrono::seconds;
+    const std::string share = directory_ + "/share";
+    const std::string queue = share + "/@eaDir/fileindex/queue";
+    fs::create_directories(share);
+    WatchedFolders watched(directory_ + "/watched.json");
+    QueueSet queues(watched, [](const std::string& name) { return name == "@eaDir"; });
+    Time now{seconds(1000)};
+    const auto flush_twice = [&] {
+        for (int i = 0; i < 2; ++i) {
+            now += seconds(5);
+            queues.Flush(now);
+        }
+    };
+    queues.Update({{queue, {share}, 65478, {}}}, true, now);
+    queues.OnRootComplete(share, now);
+    queues.OnRootLost(share, false, now);
+    flush_twice();
+    EXPECT_TRUE(fs::is_empty(share));
+    queues.OnRootComplete(share, now);
+    now += seconds(5);
+    queues.Flush(now);
+    EXPECT_TRUE(fs::exists(queue));
+    EXPECT_EQ(queues.States().front().problem, "");
 }
 
 /// A user who may write to the share's root puts a directory of their own in the queue's place and
