@@ -1,17 +1,15 @@
 #include "common/error.h"
 
-#include <sstream>
-
 namespace quivra {
 namespace {
 
 std::string ComposeMessage(int code, const std::string& reason) {
-    std::ostringstream message;
-    message << "Quivra error, code=" << code;
+    // Not by a stream: the host program's locale may group digits.
+    std::string message = "Quivra error, code=" + std::to_string(code);
     if (!reason.empty()) {
-        message << ", reason=[" << reason << "]";
+        message += ", reason=[" + reason + "]";
     }
-    return message.str();
+    return message;
 }
 
 }  // namespace

@@ -1,46 +1,151 @@
 #include "common/json.h"
 
 #include <fcntl.h>
+#include <rapidjson/reader.h>
+#include <rapidjson/stringbuffer.h>
+#include <rapidjson/writer.h>
 #include <sys/stat.h>
-#include <unistd.h>
 
 #include <cerrno>
-#include <fstream>
-#include <memory>
-#include <sstream>
+#include <cmath>
+#include <limits>
+#include <vector>
 
+#include "base/file.h"
 #include "base/unique_fd.h"
-#include "common/util.h"
+#include "common/log.h"
 
+// Texts are read and written by RapidJSON, values are JsonCpp's. JsonCpp's own reader takes
+// trailing commas, comments, "007" and whatever follows a NUL byte, and its numbers depend on the
+// locale of the host program.
 namespace quivra {
 namespace {
 
-Json::CharReader& Reader() {
-    static thread_local const std::unique_ptr<Json::CharReader> reader = [] {
-        Json::CharReaderBuilder builder;
-        builder["collectComments"] = false;
-        builder["failIfExtra"] = true;
-        return std::unique_ptr<Json::CharReader>(builder.newCharReader());
-    }();
-    return *reader;
+/// Whoever frees a value recurses as deep as it nests.
+constexpr std::size_t kMaxDepth = 1000;
+
+/// Far above what a thousand folders can take; a larger file is none of ours.
+constexpr std::size_t kMaxFileSize = std::size_t{1} << 28;
+
+/// Builds a value from what the parser reports.
+class Builder {
+  public:
+    explicit Builder(Json::Value& root) : root_(root) {}
+
+    bool Null() { return Put(Json::Value()); }
+    bool Bool(bool value) { return Put(value); }
+    bool Int(int value) { return Put(value); }
+    bool Int64(std::int64_t value) { return Put(Json::Int64{value}); }
+    bool Uint(unsigned int value) { return Put(Json::Int64{value}); }
+    bool Uint64(std::uint64_t value) {
+        // Signed where it fits, as the values' own reader does: equality looks at the type.
+        return value <= static_cast<std::uint64_t>(std::numeric_limits<Json::Int64>::max())
+                   ? Put(static_cast<Json::Int64>(value))
+                   : Put(Json::UInt64{value});
+    }
+    bool Double(double value) { return Put(value); }
+    bool RawNumber(const char*, rapidjson::SizeType, bool) { return false; }
+    bool String(const char* text, rapidjson::SizeType size, bool) {
+        return Put(Json::Value(text, text + size));
+    }
+    bool StartObject() { return Open(Json::objectValue); }
+    bool Key(const char* text, rapidjson::SizeType size, bool) {
+        key_.assign(text, size);
+        return true;
+    }
+    bool EndObject(rapidjson::SizeType) { return Close(); }
+    bool StartArray() { return Open(Json::arrayValue); }
+    bool EndArray(rapidjson::SizeType) { return Close(); }
+
+  private:
+    Json::Value& Place() {
+        if (open_.empty()) {
+            return root_;
+        }
+        Json::Value& container = *open_.back();
+        return container.isArray() ? container.append(Json::Value()) : container[key_];
+    }
+    bool Put(Json::Value value) {
+        Place().swap(value);
+        return true;
+    }
+    bool Open(Json::ValueType type) {
+        if (open_.size() == kMaxDepth) {
+            return false;
+        }
+        Json::Value& place = Place();
+        place = Json::Value(type);
+        open_.push_back(&place);  // stays where it is while its container grows
+        return true;
+    }
+    bool Close() {
+        open_.pop_back();
+        return true;
+    }
+
+    Json::Value& root_;
+    std::vector<Json::Value*> open_;
+    std::string key_;
+};
+
+using Writer = rapidjson::Writer<rapidjson::StringBuffer>;
+
+void Write(Writer& writer, const Json::Value& value);
+
+void WriteText(Writer& writer, const Json::Value& value) {
+    const char* begin = nullptr;
+    const char* end = nullptr;
+    value.getString(&begin, &end);
+    writer.String(begin, static_cast<rapidjson::SizeType>(end - begin));
 }
 
-Json::StreamWriter& Writer() {
-    static thread_local const std::unique_ptr<Json::StreamWriter> writer = [] {
-        Json::StreamWriterBuilder builder;
-        builder["indentation"] = "";
-        builder["emitUTF8"] = true;
-        return std::unique_ptr<Json::StreamWriter>(builder.newStreamWriter());
-    }();
-    return *writer;
+void WriteObject(Writer& writer, const Json::Value& value) {
+    writer.StartObject();
+    for (auto it = value.begin(); it != value.end(); ++it) {
+        const char* end = nullptr;
+        const char* begin = it.memberName(&end);
+        writer.Key(begin, static_cast<rapidjson::SizeType>(end - begin));
+        Write(writer, *it);
+    }
+    writer.EndObject();
 }
 
-bool SyncDirectory(const std::string& file_path) {
-    const std::size_t slash = file_path.rfind('/');
-    const std::string directory =
-        slash == std::string::npos ? "." : file_path.substr(0, slash == 0 ? 1 : slash);
-    const base::UniqueFd fd(open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-    return fd.IsValid() && fsync(fd.Get()) == 0;
+void WriteArray(Writer& writer, const Json::Value& value) {
+    writer.StartArray();
+    for (const Json::Value& element : value) {
+        Write(writer, element);
+    }
+    writer.EndArray();
+}
+
+void Write(Writer& writer, const Json::Value& value) {
+    switch (value.type()) {
+        case Json::nullValue:
+            writer.Null();
+            break;
+        case Json::booleanValue:
+            writer.Bool(value.asBool());
+            break;
+        case Json::intValue:
+            writer.Int64(value.asInt64());
+            break;
+        case Json::uintValue:
+            writer.Uint64(value.asUInt64());
+            break;
+        case Json::realValue:
+            // JSON has no text for what is not finite.
+            std::isfinite(value.asDouble()) ? writer.Double(value.asDouble()) : writer.Null();
+            break;
+        case Json::stringValue:
+            WriteText(writer, value);
+            break;
+        case Json::objectValue:
+            WriteObject(writer, value);
+            break;
+        case Json::arrayValue:
+            WriteArray(writer, value);
+            break;
+    }
 }
 
 mode_t ModeForReplacement(const std::string& path) {
@@ -48,46 +153,41 @@ mode_t ModeForReplacement(const std::string& path) {
     return stat(path.c_str(), &status) == 0 ? status.st_mode & 07777 : 0644;
 }
 
-bool WriteAside(const std::string& text, int fd, mode_t mode) {
-    return WriteAll(fd, text.data(), text.size()) && fchmod(fd, mode) == 0 && fsync(fd) == 0;
-}
-
 }  // namespace
 
 bool fromString(Json::Value& value, const std::string& text) {
-    try {
-        return Reader().parse(text.data(), text.data() + text.size(), &value, nullptr);
-    } catch (const Json::Exception&) {
-        return false;  // nested beyond the parser's limit
-    }
+    // Not recursive, so that no text overflows the stack.
+    constexpr unsigned int kFlags =
+        rapidjson::kParseIterativeFlag | rapidjson::kParseFullPrecisionFlag;
+    value = Json::Value();
+    Builder builder(value);
+    rapidjson::StringStream stream(text.c_str());
+    rapidjson::Reader reader;
+    // The parser takes a NUL byte for the end of the text.
+    return !reader.Parse<kFlags>(stream, builder).IsError() && stream.Tell() == text.size();
 }
 
 std::string toString(const Json::Value& value) {
-    std::ostringstream text;
-    Writer().write(value, &text);
-    return text.str();
+    rapidjson::StringBuffer text;
+    Writer writer(text);
+    Write(writer, value);
+    return std::string(text.GetString(), text.GetSize());
 }
 
 bool fromFile(Json::Value& value, const std::string& path) {
-    std::ifstream file(path, std::ios::binary);
-    std::ostringstream text;
-    return file && (text << file.rdbuf()) && fromString(value, text.str());
+    const base::UniqueFd fd(open(path.c_str(), O_RDONLY | O_CLOEXEC));
+    std::string text;
+    return fd.IsValid() && base::ReadUpTo(fd.Get(), kMaxFileSize, text) && fromString(value, text);
 }
 
 bool toFile(const Json::Value& value, const std::string& path) {
-    std::string aside = path + ".XXXXXX";
-    base::UniqueFd fd(mkostemp(aside.data(), O_CLOEXEC));
-    if (!fd.IsValid()) {
-        return false;
+    const base::Replaced replaced =
+        base::ReplaceFile(path, toString(value), ModeForReplacement(path));
+    if (replaced == base::Replaced::kNotSure) {
+        // Who calls would take the change back; but every reader sees it already.
+        LogError(LogSite(), "%s is saved, but may be lost in a power failure", path.c_str());
     }
-    if (WriteAside(toString(value), fd.Get(), ModeForReplacement(path)) &&
-        rename(aside.c_str(), path.c_str()) == 0) {
-        return SyncDirectory(path);
-    }
-    const int saved_errno = errno;
-    unlink(aside.c_str());
-    errno = saved_errno;
-    return false;
+    return replaced != base::Replaced::kNo;
 }
 
 template <>
@@ -176,7 +276,8 @@ void JsonApplyChanges(Json::Value& target, const Json::Value& changes) {
     for (auto it = changes.begin(); it != changes.end(); ++it) {
         const std::string key = it.name();
         if (it->isNull()) {
-            target.removeMember(key);
+            // Not by the whole text: that stops at a NUL byte.
+            target.removeMember(key.data(), key.data() + key.size(), nullptr);
         } else if (it->isObject()) {
             JsonApplyChanges(target[key], *it);
         } else {

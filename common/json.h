@@ -11,21 +11,25 @@
 /// quivra::Error leaves these functions, whatever the document holds.
 namespace quivra {
 
-/// Parses `text`, which may hold any JSON value and nothing behind it. False, and `value` is
-/// unspecified, for anything else (a syntax error, trailing text, nesting beyond the parser's
-/// limit of 1000).
+/// Parses `text`, which must hold one JSON value of any kind and nothing behind it, as RFC 8259 has
+/// it: no comments, trailing commas, leading zeros or plus signs, no raw control characters or NUL
+/// bytes. Bytes that are not valid UTF-8 pass. False, and `value` is unspecified, for anything else
+/// and for nesting beyond 1000 levels. The locale plays no part.
 QUIVRA_EXPORT bool fromString(Json::Value& value, const std::string& text);
 
-/// The compact text of `value`, on one line. Bytes that are no valid UTF-8 are kept as they are,
-/// so that the name of every file survives.
+/// The compact text of `value`, on one line. Bytes that are not valid UTF-8 are kept as they are,
+/// so that the name of every file survives. The locale plays no part. A real number that is not
+/// finite becomes null.
 QUIVRA_EXPORT std::string toString(const Json::Value& value);
 
-/// Reads and parses a file. False when it cannot be read or parsed.
+/// Reads and parses a file of at most 256 MiB. False when it cannot be read or parsed.
 QUIVRA_EXPORT bool fromFile(Json::Value& value, const std::string& path);
 
-/// Replaces the file by the text of `value`, atomically and durably: whatever fails or is
-/// interrupted, the path holds either the old file whole or the new one. False on any failure,
-/// with errno telling why. A new file gets mode 0644, an existing one keeps its mode.
+/// Replaces the file by the text of `value`, atomically: whatever fails or is interrupted, the path
+/// holds either the old file whole or the new one. False, with errno telling why, when it still
+/// holds the old one. When the new one is there and only cannot be made durable, that is logged and
+/// the result is true. A new file gets mode 0644, an existing one keeps its mode. Uses the name
+/// with ".new" behind it for a moment; what a killed process left there is used by the next.
 QUIVRA_EXPORT bool toFile(const Json::Value& value, const std::string& path);
 
 /// Whether asJsonType<T> can read the value: convertible for std::string, bool, int, unsigned int
@@ -46,6 +50,11 @@ QUIVRA_EXPORT bool isJsonType<long long>(const Json::Value& value);
 template <>
 QUIVRA_EXPORT bool isJsonType<double>(const Json::Value& value);
 
+template <>
+inline bool isJsonType<Json::Value>(const Json::Value& /*value*/) {
+    return true;
+}
+
 /// Reads a value for which isJsonType<T> holds.
 template <typename T>
 T asJsonType(const Json::Value& value);
@@ -62,11 +71,15 @@ template <>
 QUIVRA_EXPORT long long asJsonType<long long>(const Json::Value& value);
 template <>
 QUIVRA_EXPORT double asJsonType<double>(const Json::Value& value);
+template <>
+inline Json::Value asJsonType<Json::Value>(const Json::Value& value) {
+    return value;
+}
 
 /// ", data=" and the text of the document: the tail of a reason text.
 QUIVRA_EXPORT std::string AppendData(const Json::Value& data);
 
-/// The member `key` of the object `json`. Null when there is none or `json` is no object; then,
+/// The member `key` of the object `json`. Null when there is none or `json` is not an object; then,
 /// when `required`, Error 120 is thrown instead ("Not an object...", "Missing property: ...").
 /// The result lives as long as `json` is not changed.
 QUIVRA_EXPORT const Json::Value* FindJsonMember(const Json::Value& json, const std::string& key,
@@ -95,8 +108,8 @@ QUIVRA_EXPORT void GetJsonValue(Json::Value& out, const Json::Value& json, const
                                 bool required);
 
 /// Merges `changes` into `target`: a null member removes, an object member merges, everything else
-/// replaces. A target that is no object becomes an empty one first; `changes` that are no object
-/// change nothing.
+/// replaces. A target that is not an object becomes an empty one first; `changes` that are not an
+/// object change nothing.
 QUIVRA_EXPORT void JsonApplyChanges(Json::Value& target, const Json::Value& changes);
 
 }  // namespace quivra

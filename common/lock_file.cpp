@@ -2,81 +2,64 @@
 
 #include <fcntl.h>
 #include <sys/file.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <cstdlib>
 
+#include "base/file.h"
 #include "common/log.h"
 
 namespace quivra {
 namespace {
 
+constexpr LogUnit kLog{"lock_file", 0};
+
 constexpr int kMaxAttempts = 64;
 constexpr int kSleepSteps = 10;
 constexpr useconds_t kSleepStepMicroseconds = 100000;
+constexpr unsigned int kMode = 0644;
 
 }  // namespace
 
-LockFile::LockFile(const std::string& path, bool exclusive) : path_(path) {
-    for (int attempt = 0; attempt < kMaxAttempts; ++attempt) {
-        Open();
-        if (TryLock(exclusive)) {
-            if (IsStillAtPath()) {
+LockFile::LockFile(const std::string& path, bool exclusive)
+    : LockFile(AT_FDCWD, path, exclusive, kMode) {}
+
+LockFile::LockFile(int directory, const std::string& name, bool exclusive, unsigned int mode) {
+    int attempt = 0;
+    for (; attempt < kMaxAttempts; ++attempt) {
+        base::UniqueFd fd;
+        switch (base::TryLock(directory, name, exclusive, mode, fd)) {
+            case base::LockAttempt::kTaken:
+                fd_ = fd.Release();
                 return;
+            case base::LockAttempt::kReplaced:
+                break;  // nobody to wait for
+            case base::LockAttempt::kBusy:
+                usleep(static_cast<useconds_t>(std::rand() % kSleepSteps) * kSleepStepMicroseconds);
+                break;
+            case base::LockAttempt::kOpenFailed: {
+                const std::string reason = "open failed, reason=" + SystemErrorText(errno);
+                // Support tools know this text. O_CREAT is left out where the file exists: kernels
+                // refuse it to root for other users' files in /tmp.
+                Fail(kLog.Here(), "0 > (fd_ = open(path_.c_str(), O_RDWR | O_CREAT, 0644))",
+                     Error(Error::kLockFailed, reason));
             }
-            Close();  // replaced between open and lock: no need to wait for anybody
-            continue;
+            case base::LockAttempt::kLockFailed: {
+                const std::string reason = SystemErrorText(errno);
+                Fail(kLog.Here(), "0 > flock(fd_, operation | LOCK_NB)",
+                     Error(Error::kLockFailed, reason));
+            }
         }
-        Close();
-        usleep(static_cast<useconds_t>(std::rand() % kSleepSteps) * kSleepStepMicroseconds);
     }
-    Fail({"lock_file", __LINE__}, "attempt < kMaxAttempts",
-         Error(Error::kLockFailed, "Exceed max retry"));
+    QUIVRA_FAIL_IF(kLog, attempt >= kMaxAttempts, Error(Error::kLockFailed, "Exceed max retry"));
 }
 
 LockFile::~LockFile() {
     if (fd_ >= 0) {
         flock(fd_, LOCK_UN);
-        Close();
+        close(fd_);
     }
-}
-
-void LockFile::Open() {
-    fd_ = open(path_.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0644);
-    if (fd_ < 0) {
-        const std::string reason = "open failed, reason=" + SystemErrorText(errno);
-        Fail({"lock_file", __LINE__}, "0 > (fd_ = open(path_.c_str(), O_RDWR | O_CREAT, 0644))",
-             Error(Error::kLockFailed, reason));
-    }
-}
-
-bool LockFile::TryLock(bool exclusive) {
-    if (flock(fd_, (exclusive ? LOCK_EX : LOCK_SH) | LOCK_NB) == 0) {
-        return true;
-    }
-    if (errno == EINTR || errno == EAGAIN) {
-        return false;
-    }
-    const std::string reason = SystemErrorText(errno);
-    Close();
-    Fail({"lock_file", __LINE__}, "0 > flock(fd_, operation | LOCK_NB)",
-         Error(Error::kLockFailed, reason));
-}
-
-void LockFile::Close() {
-    const int saved_errno = errno;
-    close(fd_);
-    errno = saved_errno;
-    fd_ = -1;
-}
-
-bool LockFile::IsStillAtPath() const {
-    struct stat held {};
-    struct stat named {};
-    return fstat(fd_, &held) == 0 && stat(path_.c_str(), &named) == 0 &&
-           held.st_dev == named.st_dev && held.st_ino == named.st_ino;
 }
 
 }  // namespace quivra

@@ -8,6 +8,8 @@
 #include <cstdio>
 #include <system_error>
 
+#include "base/text.h"
+
 namespace quivra {
 
 namespace fileindex {
@@ -39,8 +41,9 @@ void LogError(LogSite site, const char* format, ...) {
     va_end(arguments);
     const std::string tail =
         saved_errno == 0 ? std::string() : " [err: " + SystemErrorText(saved_errno) + "]";
-    syslog(LOG_ERR, "%s:%d (%d, %u) %s%s", site.unit, site.line, getpid(), geteuid(), text.c_str(),
-           tail.c_str());
+    // A user's file name may hold line breaks: it must not pass for a line of its own.
+    syslog(LOG_ERR, "%s:%d (%d, %u) %s", site.unit, site.line, getpid(), geteuid(),
+           base::EscapeControl(text + tail).c_str());
     errno = 0;
 }
 
@@ -50,7 +53,7 @@ void LogTrace(LogSite site, const char* format, ...) {
     va_start(arguments, format);
     const std::string text = Format(format, arguments);
     va_end(arguments);
-    syslog(LOG_ERR, "%s:%d %s", site.unit, site.line, text.c_str());
+    syslog(LOG_ERR, "%s:%d %s", site.unit, site.line, base::EscapeControl(text).c_str());
     errno = saved_errno;
 }
 

@@ -1,11 +1,15 @@
 #pragma once
 
 #include <cstdint>
+#include <source_location>
 #include <string>
 
 #include "common/error.h"
 #include "common/export.h"
 
+/// The one place that writes to the system log. Whatever a text holds, names of files included, a
+/// line stays one line: control characters, bytes that are not valid UTF-8 and invisible characters
+/// that change the direction of a text are written as escapes (\n, \x1b, \u202e).
 namespace quivra {
 
 namespace fileindex {
@@ -19,11 +23,33 @@ inline constexpr std::int32_t kLogLevelDebug = 7;
 
 }  // namespace fileindex
 
-/// Where a log line comes from: the name of the source unit ("optree") and a line number. Support
-/// tools search for these marks, so a site keeps its number when the code around it moves.
+/// Where a log line comes from, "UNIT:LINE": a mark that leads to one place. Support tools search
+/// for some of them; those are written out and keep their number when the code around them moves.
 struct LogSite {
+    /// The source file and line of the call itself: LogError(LogSite(), ...).
+    constexpr LogSite(std::source_location here = std::source_location::current())
+        : unit(here.file_name()), line(static_cast<int>(here.line())) {
+        for (const char* c = unit; *c != '\0'; ++c) {
+            unit = *c == '/' ? c + 1 : unit;
+        }
+    }
+    constexpr LogSite(const char* given_unit, int given_line)
+        : unit(given_unit), line(given_line) {}
+
     const char* unit;
     int line;
+};
+
+/// The name under which a source file logs where the file's own name will not do, because tools
+/// know another one. Files that share a name begin at different thousands, so that a mark still
+/// leads to one place.
+struct LogUnit {
+    const char* name;
+    int base;  ///< is added to the number of the line
+
+    constexpr LogSite Here(std::source_location here = std::source_location::current()) const {
+        return {name, base + static_cast<int>(here.line())};
+    }
 };
 
 /// Writes "UNIT:LINE (PID, EUID) TEXT" to the system log at error priority, TEXT being made as by
@@ -38,10 +64,20 @@ QUIVRA_EXPORT void LogTrace(LogSite site, const char* format, ...)
 /// Writes the failure line "Failed [CONDITION], reason: REASON" as LogError does.
 QUIVRA_EXPORT void LogFailure(LogSite site, const char* condition, const std::string& reason);
 
-/// Logs the failure of `condition` with the error's reason, then throws the error.
+/// Logs the failure of `condition` with the error's reason, then throws the error. For a condition
+/// whose text in the log is given; else use QUIVRA_FAIL_IF.
 [[noreturn]] QUIVRA_EXPORT void Fail(LogSite site, const char* condition, const Error& error);
 
 /// The text of an errno value. Does not change errno.
 QUIVRA_EXPORT std::string SystemErrorText(int error_number);
 
 }  // namespace quivra
+
+/// Where the condition holds, logs its own text with the error's reason and throws the error, which
+/// is made only then. `unit` is a LogUnit.
+#define QUIVRA_FAIL_IF(unit, condition, ...)                        \
+    do {                                                            \
+        if (condition) {                                            \
+            ::quivra::Fail((unit).Here(), #condition, __VA_ARGS__); \
+        }                                                           \
+    } while (false)

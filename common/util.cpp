@@ -6,11 +6,8 @@
 #include <algorithm>
 #include <array>
 #include <cctype>
-#include <cerrno>
 #include <set>
 #include <utility>
-
-#include <kesto/filesystem.h>
 
 namespace quivra {
 
@@ -43,26 +40,12 @@ bool IsDirExist(const std::string& path, bool follow_link) {
 }
 
 bool IsDirentDir(const dirent& entry, const std::string& /*full_path*/) {
-    // An entry of unknown type is no directory, whether its status can be read or not.
+    // An entry of unknown type never counts, whether its status can be read or not.
     return entry.d_type == DT_DIR;
-}
-
-bool CheckACLPerm(const std::string& path, int perm) {
-    const int granted = KESTOACLPermGet(path.c_str());
-    return granted >= 0 && (perm & granted) != 0;
-}
-
-bool IsMountPoint(const std::string& path) {
-    return KESTOFSDirIsMntPoint(path.c_str()) > 0;
 }
 
 bool StringStartWith(const std::string& s, const std::string& prefix) {
     return s.compare(0, prefix.size(), prefix) == 0;
-}
-
-bool IsPathWithin(std::string_view path, std::string_view ancestor) {
-    return path.starts_with(ancestor) &&
-           (path.size() == ancestor.size() || path[ancestor.size()] == '/');
 }
 
 std::string Basename(const std::string& path) {
@@ -85,21 +68,6 @@ std::string GetFileExtension(const std::string& path, bool to_lower) {
                        [](unsigned char c) { return static_cast<char>(std::tolower(c)); });
     }
     return extension;
-}
-
-bool WriteAll(int fd, const char* data, std::size_t size) {
-    while (size > 0) {
-        const ssize_t written = write(fd, data, size);
-        if (written < 0) {
-            if (errno == EINTR) {
-                continue;
-            }
-            return false;
-        }
-        data += written;
-        size -= static_cast<std::size_t>(written);
-    }
-    return true;
 }
 
 }  // namespace quivra

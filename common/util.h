@@ -2,13 +2,11 @@
 
 #include <dirent.h>
 
-#include <cstddef>
 #include <string>
-#include <string_view>
 
 #include "common/export.h"
 
-/// File-system and string helpers. None throws: the answer is false or an empty string.
+/// File-system and string helpers. None throws: they return false or an empty string.
 namespace quivra {
 
 /// Whether the path is a regular file. A symbolic link, even to a regular file, is not.
@@ -21,18 +19,15 @@ QUIVRA_EXPORT bool IsDirExist(const std::string& path, bool follow_link);
 /// Whether a directory entry is itself a directory. An entry of unknown type never counts as one.
 QUIVRA_EXPORT bool IsDirentDir(const dirent& entry, const std::string& full_path);
 
-/// Whether the calling user holds at least one of the permission bits `perm` on the path.
+/// Whether the calling user holds at least one of the permission bits `perm` on the path, as the
+/// platform sees it (sdk/filesystem.cpp).
 QUIVRA_EXPORT bool CheckACLPerm(const std::string& path, int perm);
 
-/// Whether a file system is mounted at the path.
+/// Whether a file system is mounted at the path, as the platform sees it (sdk/filesystem.cpp).
 QUIVRA_EXPORT bool IsMountPoint(const std::string& path);
 
-/// A plain prefix test: no component boundary. An empty prefix is always there.
+/// A plain prefix test: no component boundary. Every string starts with the empty prefix.
 QUIVRA_EXPORT bool StringStartWith(const std::string& s, const std::string& prefix);
-
-/// Whether `path` is `ancestor` or lies below it: /a/b is within /a, /ab is not. Neither path ends
-/// in "/"; the empty ancestor stands for the root directory.
-QUIVRA_EXPORT bool IsPathWithin(std::string_view path, std::string_view ancestor);
 
 /// The part behind the last "/"; the whole string when there is none.
 QUIVRA_EXPORT std::string Basename(const std::string& path);
@@ -42,9 +37,5 @@ QUIVRA_EXPORT std::string Dirname(const std::string& path);
 
 /// What stands behind the last "." of the base name, lower-cased byte by byte with `to_lower`.
 QUIVRA_EXPORT std::string GetFileExtension(const std::string& path, bool to_lower);
-
-/// Writes all `size` bytes to a descriptor, however many calls that takes. False with errno set
-/// when one fails.
-QUIVRA_EXPORT bool WriteAll(int fd, const char* data, std::size_t size);
 
 }  // namespace quivra

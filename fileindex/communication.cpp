@@ -9,9 +9,9 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
-#include <cstdint>
 #include <cstring>
 
+#include "base/frame.h"
 #include "base/unique_fd.h"
 #include "common/error.h"
 #include "common/json.h"
@@ -20,10 +20,11 @@
 namespace quivra::fileindex {
 namespace {
 
+constexpr LogUnit kLog{"communication", 0};
+
 constexpr unsigned int kMaxChunk = 1024;
 constexpr int kMaxInterruptions = 10;
 constexpr int kConnectAttempts = 5;
-constexpr std::uint32_t kMaxMessageSize = 1U << 30;
 constexpr useconds_t kEmptyReadPauseMicroseconds = 10000;
 
 [[noreturn]] void FailChannel(LogSite site, const char* condition, const char* what) {
@@ -49,7 +50,7 @@ void ConnectPatiently(int fd) {
 void SetSendTimeout(int fd_socket) {
     const timeval timeout{.tv_sec = 1, .tv_usec = 0};
     if (setsockopt(fd_socket, SOL_SOCKET, SO_SNDTIMEO, &timeout, sizeof(timeout)) < 0) {
-        FailChannel({"communication", __LINE__},
+        FailChannel(kLog.Here(),
                     "0 > setsockopt(fd_socket, SOL_SOCKET, SO_SNDTIMEO, (char *)&timeout, "
                     "sizeof(timeout))",
                     "setsockopt");
@@ -57,30 +58,29 @@ void SetSendTimeout(int fd_socket) {
 }
 
 void SendMessage(int fd, const std::string& text) {
-    if (text.size() > kMaxMessageSize) {
+    if (text.size() > base::kMaxFrameSize) {
         errno = EMSGSIZE;
-        FailChannel({"communication", __LINE__}, "text.size() > kMaxMessageSize", "write");
+        FailChannel(kLog.Here(), "text.size() > base::kMaxFrameSize", "write");
     }
-    const auto size = static_cast<std::uint32_t>(text.size());
-    std::array<unsigned char, sizeof(size)> prefix{};
-    std::memcpy(prefix.data(), &size, sizeof(size));
-    BufferWrite(fd, sizeof(size), prefix.data());
-    BufferWrite(fd, size, reinterpret_cast<const unsigned char*>(text.data()));
+    const base::FramePrefix prefix = base::MakeFramePrefix(text.size());
+    BufferWrite(fd, prefix.size(), reinterpret_cast<const unsigned char*>(prefix.data()));
+    BufferWrite(fd, static_cast<unsigned int>(text.size()),
+                reinterpret_cast<const unsigned char*>(text.data()));
 }
 
 /// Reads the reply through a buffer of fixed size, so that no announced length costs memory.
 void DiscardReply(int fd) {
-    std::uint32_t size = 0;
-    std::array<unsigned char, 65536> buffer{};
-    BufferRead(fd, sizeof(size), buffer.data());
-    std::memcpy(&size, buffer.data(), sizeof(size));
-    if (size > kMaxMessageSize) {
+    base::FramePrefix prefix{};
+    BufferRead(fd, prefix.size(), reinterpret_cast<unsigned char*>(prefix.data()));
+    std::size_t size = base::FrameSize(prefix);
+    if (size > base::kMaxFrameSize) {
         errno = EMSGSIZE;
-        FailChannel({"communication", __LINE__}, "size > kMaxMessageSize", "read");
+        FailChannel(kLog.Here(), "size > base::kMaxFrameSize", "read");
     }
+    std::array<unsigned char, 65536> buffer{};
     while (size > 0) {
-        const std::uint32_t piece = std::min<std::uint32_t>(size, buffer.size());
-        BufferRead(fd, piece, buffer.data());
+        const std::size_t piece = std::min(size, buffer.size());
+        BufferRead(fd, static_cast<unsigned int>(piece), buffer.data());
         size -= piece;
     }
 }
@@ -96,9 +96,10 @@ void BufferRead(int fd, unsigned int size, unsigned char* buf) {
                 ++interruptions;
                 continue;
             }
-            FailChannel({"communication", __LINE__}, "0 > read(fd, buf, size)", "read");
+            FailChannel(kLog.Here(), "0 > read(fd, buf, size)", "read");
         }
         if (received == 0) {
+            // Not a failure here, whatever it means; but it must not take a core.
             usleep(kEmptyReadPauseMicroseconds);
         }
         buf += received;
@@ -115,7 +116,7 @@ void BufferWrite(int fd, unsigned int size, const unsigned char* buf) {
                 ++interruptions;
                 continue;
             }
-            FailChannel({"communication", __LINE__}, "0 >= write(fd, buf, size)", "write");
+            FailChannel(kLog.Here(), "0 >= write(fd, buf, size)", "write");
         }
         buf += written;
         size -= static_cast<unsigned int>(written);
@@ -126,8 +127,7 @@ void SendCommandToDaemon(const std::string& type, const Json::Value& data) {
     signal(SIGPIPE, SIG_IGN);
     const base::UniqueFd fd_socket(socket(PF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
     if (!fd_socket.IsValid()) {
-        FailChannel({"communication", __LINE__},
-                    "0 > (fd_socket = socket(PF_UNIX, SOCK_STREAM, 0))", "socket");
+        FailChannel(kLog.Here(), "0 > (fd_socket = socket(PF_UNIX, SOCK_STREAM, 0))", "socket");
     }
     ConnectPatiently(fd_socket.Get());
     SetSendTimeout(fd_socket.Get());

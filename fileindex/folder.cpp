@@ -1,25 +1,12 @@
 #include "fileindex/folder.h"
 
-#include <ctime>
-
-#include "common/error.h"
 #include "common/json.h"
-#include "common/log.h"
+#include "fileindex/folder_status.h"
 #include "fileindex/queue_mgr.h"
-#include "fileindex/status_mgr.h"
 #include "fileindex/util.h"
 #include "sdk/share.h"
 
 namespace quivra::fileindex {
-namespace {
-
-bool IsPausedNow(const StatusMgr& status) {
-    const std::int64_t resume_time = status.GetPauseInfo();
-    return resume_time == kPausedWithoutEnd || time(nullptr) < resume_time;
-}
-
-}  // namespace
-
 Folder::Folder(const std::string& path, const std::string& name, bool document, bool audio,
                bool video, bool photo, bool paused)
     : path_(path),
@@ -88,40 +75,11 @@ bool Folder::IsIndexing() const {
 }
 
 void Folder::GetStatus(Json::Value& out) const {
-    const StatusMgr status;
-    if (!out.isObject()) {
-        out = Json::Value(Json::objectValue);
-    }
-    if (!CanPathBeIndexed(path_)) {
-        out["text"] = "error";
-        out["desc"] = "invalid_path";
-    } else if ((status.GetShareStatus(GetShare()) & kShareNeedReindex) != 0) {
-        out["text"] = "need_reindex";
-    } else if (!IsIndexing()) {
-        out["text"] = "finished";
-    } else {
-        out["text"] = IsPausedNow(status) ? "paused" : "processing";
-    }
+    FolderStatus({this}).Write(out, *this);
 }
 
 Json::Value Folder::GetDataWithAdditional(const Json::Value& additionals) const {
-    Json::Value data = GetData();
-    if (!additionals.isArray()) {
-        Fail({"folder.cpp", 45}, "!addiitionals.isArray()",
-             Error(Error::kBadArgument, toString(additionals)));
-    }
-    for (const Json::Value& it : additionals) {
-        if (!it.isString()) {
-            Fail({"folder.cpp", 48}, "!it.isString()", Error(Error::kBadArgument, toString(it)));
-        }
-        const std::string name = it.asString();
-        if (name != "status") {
-            Fail({"folder.cpp", __LINE__}, "\"status\" != it.asString()",
-                 Error(Error::kBadArgument, "Unknown additioal: " + name));
-        }
-        GetStatus(data["additional"]["status"]);
-    }
-    return data;
+    return FolderStatus({this}).DataWithAdditional(*this, additionals);
 }
 
 }  // namespace quivra::fileindex

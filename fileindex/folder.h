@@ -54,9 +54,10 @@ class QUIVRA_EXPORT Folder {
     /// what GetFullPath, the share's queue path and a malformed queue line do.
     bool IsIndexing() const;
 
-    /// Sets out["text"] to "error" (and out["desc"] to "invalid_path"), "need_reindex",
-    /// "finished", "paused" or "processing"; other members of `out` stay. Throws as IsIndexing and
-    /// CanPathBeIndexed do, and Error 504 when the status file cannot be read.
+    /// Sets out["text"] to "error" (and out["desc"] to "invalid_path"; also when the share is
+    /// gone), "need_reindex", "finished", "paused" or "processing"; other members of `out` stay.
+    /// Throws as IsIndexing and CanPathBeIndexed do otherwise, and Error 504 when the status file
+    /// cannot be read.
     void GetStatus(Json::Value& out) const;
 
     /// GetData and, under "additional", the items that are asked for: an array of names, of which

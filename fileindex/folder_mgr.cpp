@@ -7,6 +7,7 @@
 #include <iterator>
 #include <utility>
 
+#include "base/path.h"
 #include "common/error.h"
 #include "common/json.h"
 #include "common/log.h"
@@ -17,10 +18,13 @@
 namespace quivra::fileindex {
 namespace {
 
+/// Below 1000 are marks that support tools know.
+constexpr LogUnit kLog{"folder_mgr.cpp", 1000};
+
 using FolderPtr = FolderMgr::FolderPtr;
 
-bool Covers(const Folder& folder, const std::string& full_path) {
-    return IsPathWithin(full_path, folder.GetFullPath());
+bool Covers(const std::string* folder, const std::string& full_path) {
+    return folder != nullptr && base::IsAtOrBelow(full_path, *folder);
 }
 
 bool (*OrderBy(const std::string& key))(const FolderPtr&, const FolderPtr&) {
@@ -55,10 +59,9 @@ FolderMgr::FolderMgr() {
              Error(Error::kLoadFailed,
                    std::string("Cannot load json: ") + kFileIndexFoldersCfgPath));
     }
-    if (!folders.isArray()) {
-        Fail({"folder_mgr.cpp", __LINE__}, "!folders.isArray()",
-             Error(Error::kBadArgument, "Not an array" + AppendData(folders)));
-    }
+    // null and {} hold nothing that could be lost; anything else is not ours to overwrite.
+    QUIVRA_FAIL_IF(kLog, !folders.isArray() && !folders.empty(),
+                   Error(Error::kBadArgument, "Not an array" + AppendData(folders)));
     folders_.reserve(folders.size());
     for (const Json::Value& folder : folders) {
         folders_.push_back(std::make_shared<Folder>(folder));
@@ -112,9 +115,7 @@ void FolderMgr::Delete(FolderPtr& diff, const std::string& path) {
     std::string full_path;
     GetFullPath(full_path, path);
     const FolderPtr before = GetMostSuitableCfg(full_path);
-    if (before == nullptr) {
-        Fail({"folder_mgr.cpp", __LINE__}, "!before", Error(Error::kNoSuchFolder, path));
-    }
+    QUIVRA_FAIL_IF(kLog, before == nullptr, Error(Error::kNoSuchFolder, path));
     RemovePath(path);
     diff = DiffCfg(before, GetMostSuitableCfg(full_path));
 }
@@ -150,13 +151,34 @@ FolderPtr FolderMgr::DiffCfg(FolderPtr next, FolderPtr previous) {
                                     changes(&Folder::GetPhoto), false);
 }
 
+const std::string* FolderMgr::FindFullPath(const Folder& folder) const {
+    if (!gone_shares_.empty() && gone_shares_.contains(folder.GetShare())) {
+        return nullptr;
+    }
+    try {
+        return &folder.GetFullPath();
+    } catch (const Error& error) {
+        if (error.code != Error::kNoSuchShare) {
+            throw;
+        }
+    }
+    // One folder without a place must not make every question about the others fail.
+    LogError(kLog.Here(),
+             "Share %s is gone, so folder %s covers nothing; fileindexctl share rename, migrate or "
+             "clear mends that",
+             folder.GetShare().c_str(), folder.GetPath().c_str());
+    gone_shares_.insert(folder.GetShare());
+    return nullptr;
+}
+
 FolderPtr FolderMgr::GetMostSuitableCfg(const std::string& full_path) const {
     const FolderPtr* best = nullptr;
     std::size_t best_size = 0;
     for (const FolderPtr& folder : folders_) {
-        if (Covers(*folder, full_path) && folder->GetFullPath().size() > best_size) {
+        const std::string* own = FindFullPath(*folder);
+        if (Covers(own, full_path) && own->size() > best_size) {
             best = &folder;
-            best_size = folder->GetFullPath().size();
+            best_size = own->size();
         }
     }
     return best == nullptr ? nullptr : *best;
@@ -183,13 +205,16 @@ bool FolderMgr::IsFullPathNeedMeta(const std::string& full_path) const {
 }
 
 bool FolderMgr::IsFullPathHasOwnCfg(const std::string& full_path) const {
-    return std::any_of(folders_.begin(), folders_.end(),
-                       [&](const FolderPtr& folder) { return folder->GetFullPath() == full_path; });
+    return std::any_of(folders_.begin(), folders_.end(), [&](const FolderPtr& folder) {
+        const std::string* own = FindFullPath(*folder);
+        return own != nullptr && *own == full_path;
+    });
 }
 
 bool FolderMgr::IsFullPathIndexed(const std::string& full_path) const {
-    return std::any_of(folders_.begin(), folders_.end(),
-                       [&](const FolderPtr& folder) { return Covers(*folder, full_path); });
+    return std::any_of(folders_.begin(), folders_.end(), [&](const FolderPtr& folder) {
+        return Covers(FindFullPath(*folder), full_path);
+    });
 }
 
 bool FolderMgr::IsShareIndexed(const std::string& share) const {

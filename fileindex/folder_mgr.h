@@ -23,15 +23,21 @@ inline constexpr std::size_t kFileIndexFoldersMax = 1000;
 /// changes the file holds kFileIndexFoldersLockPath from before the load until after the save.
 /// Not for use from several threads.
 ///
-/// A folder covers a full path when it is that path or one of its ancestors. The questions about
-/// full paths throw Error 800 when the platform does not know the share of a folder that they
-/// come by, and Error 120 when a stored path does not begin with "/".
+/// A folder covers a full path when it is that path or one of its ancestors. A folder whose share
+/// the platform does not know covers nothing: the questions go on with the others, and each such
+/// share is logged once per object. They throw Error 120 when a stored path does not begin with
+/// "/".
+///
+/// MIND: Save takes root's identity and the process KEEPS it, see sdk/credentials.h. A program that
+/// serves users saves from a process of its own.
 class QUIVRA_EXPORT FolderMgr {
   public:
     using FolderPtr = std::shared_ptr<Folder>;
 
-    /// Reads the file; a missing one is an empty set. Throws Error 504 when it is no JSON, and
-    /// Error 120 when an element is no folder or it is no array.
+    /// Reads the file; a missing one is an empty set. Throws Error 504 when it is not JSON, and
+    /// Error 120 when an element is not a folder. A file that holds null or {} has no elements, so
+    /// it is an empty set, too; any other value that is not an array is Error 120, because the next
+    /// Save would erase what somebody wrote there.
     FolderMgr();
 
     /// Writes the file as user root, mode 0644. Throws Error 503, 505 (the file is unchanged) or
@@ -48,7 +54,7 @@ class QUIVRA_EXPORT FolderMgr {
 
     /// Puts the folder at the end, in place of one of the same path. `diff` tells which kinds of
     /// content change state below it, see DiffCfg. Throws Error 900 when the set gets too large;
-    /// drop this object then, for the folder is in it.
+    /// drop this object then, for the folder is in it. Error 120 or 800 as Folder::GetFullPath.
     void Upsert(FolderPtr& diff, FolderPtr folder);
 
     /// Removes the folder with exactly this path. `diff` tells which kinds of content change state
@@ -57,7 +63,8 @@ class QUIVRA_EXPORT FolderMgr {
     /// as it was then.
     void Delete(FolderPtr& diff, const std::string& path);
 
-    /// Removes every folder of the share.
+    /// Removes every folder of the share. Throws Error 120 as Folder::GetShare; nothing has changed
+    /// then.
     void DeleteByShare(const std::string& share);
 
     /// One page of the folders: sorted by "document", "audio", "video" or "photo" (false first),
@@ -72,6 +79,9 @@ class QUIVRA_EXPORT FolderMgr {
     /// not be null.
     static FolderPtr DiffCfg(FolderPtr next, FolderPtr previous);
 
+    /// The full path of one of the folders. Null when the platform does not know its share.
+    const std::string* FindFullPath(const Folder& folder) const;
+
     /// The folder that governs the path: the deepest that covers it, of two with the same path the
     /// earlier. Null when none does.
     FolderPtr GetMostSuitableCfg(const std::string& full_path) const;
@@ -79,8 +89,10 @@ class QUIVRA_EXPORT FolderMgr {
     /// Whether a file at the path is to be indexed with content and metadata.
     bool IsFullPathNeedMeta(const std::string& full_path) const;
 
+    /// Whether a folder of exactly this path is configured, and whether any covers the path.
     bool IsFullPathHasOwnCfg(const std::string& full_path) const;
     bool IsFullPathIndexed(const std::string& full_path) const;
+    /// Whether the share has a folder, and all shares that have one, whether they exist or not.
     bool IsShareIndexed(const std::string& share) const;
     std::set<std::string> GetIndexedShares() const;
 
@@ -88,6 +100,7 @@ class QUIVRA_EXPORT FolderMgr {
     void RemovePath(const std::string& path);
 
     std::vector<FolderPtr> folders_;
+    mutable std::set<std::string> gone_shares_;
 };
 
 }  // namespace quivra::fileindex

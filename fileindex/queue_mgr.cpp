@@ -1,89 +1,58 @@
 #include "fileindex/queue_mgr.h"
 
-#include <fcntl.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <cstdio>
 
-#include "base/unique_fd.h"
+#include "base/path.h"
+#include "base/queue_file.h"
 #include "common/error.h"
 #include "common/json.h"
 #include "common/lock_file.h"
 #include "common/log.h"
-#include "common/util.h"
 #include "fileindex/folder_mgr.h"
-#include "fileindex/queue_reader.h"
+#include "fileindex/pending.h"
+#include "fileindex/queue_directory.h"
 
 namespace quivra::fileindex {
 namespace {
 
-/// Whether an event of the file satisfies the predicate. A missing file holds none.
-template <typename Predicate>
-bool HasEvent(const std::string& path, const Predicate& predicate) {
-    if (!IsFileExist(path)) {
-        return false;
-    }
-    QueueReader reader(path);
-    if (!reader.IsOpen() && errno == ENOENT) {
-        return false;  // a pass moved or deleted it meanwhile
-    }
-    reader.RequireOpen({"queue_mgr", __LINE__});
-    std::string line;
-    while (reader.ReadLine(line)) {
-        if (predicate(Event(line))) {
-            return true;
-        }
-    }
-    return false;
+/// Below 1000 are marks that support tools know.
+constexpr LogUnit kLog{"queue_mgr", 1000};
+
+[[noreturn]] void FailLock(const std::string& reason) {
+    Fail(kLog.Here(), "!directory.IsValid()",
+         Error(Error::kLockFailed, "open failed, reason=" + reason));
 }
 
-[[noreturn]] void FailAppend(const char* condition, const char* what) {
-    const std::string reason = std::string(what) + " queue, reason=" + SystemErrorText(errno);
-    Fail({"queue_mgr", __LINE__}, condition, Error(Error::kSystemCallFailed, reason));
-}
-
-/// Whether the last line lacks its end: a writer died, or the disk was full, in the middle of it.
-bool EndsInMidLine(int fd, off_t size) {
-    char last = '\n';
-    return size > 0 && pread(fd, &last, 1, size - 1) == 1 && last != '\n';
-}
-
-/// Appends the line whole or not at all.
-void AppendLine(const std::string& queue_path, const std::string& line) {
-    const base::UniqueFd fd(
-        open(queue_path.c_str(), O_RDWR | O_APPEND | O_CREAT | O_CLOEXEC, 0644));
-    struct stat status {};
-    if (!fd.IsValid() || fstat(fd.Get(), &status) != 0) {
-        FailAppend("!queue", "Failed to open");
-    }
-    const std::string text = (EndsInMidLine(fd.Get(), status.st_size) ? "\n" : "") + line + "\n";
-    if (!WriteAll(fd.Get(), text.data(), text.size())) {
-        const int saved_errno = errno;
-        [[maybe_unused]] const int cut = ftruncate(fd.Get(), status.st_size);
-        errno = saved_errno;
-        FailAppend("!(queue << line << std::endl)", "Failed to write");
-    }
+/// Whether `path` is `top` or below it. Nothing lies below "/" here: it is no share's path.
+bool IsTouched(const std::string& path, const std::string& top) {
+    return top == "/" ? path == top : base::IsAtOrBelow(path, top);
 }
 
 }  // namespace
 
 QueueMgr::QueueMgr(const std::string& queue_path)
-    : queue_path_(queue_path), queue_path_tmp_(queue_path + ".tmp") {}
+    : queue_path_(queue_path), queue_path_tmp_(base::WorkingCopy(queue_path)) {}
 
 void QueueMgr::PrepareTmpQueue() {
-    if (!IsFileExist(queue_path_)) {
+    const QueueDirectory directory(queue_path_);
+    if (!directory.IsValid() && errno != ENOENT) {
+        FailLock(directory.Reason());
+    }
+    if (!directory.HasFile(directory.QueueName())) {
         return;
     }
     // When another pass takes the queue between the check and the lock, the lock makes an empty
     // file, which then waits here or gives an empty pass. It must not be deleted: a writer may
     // have opened it already.
-    const LockFile lock(queue_path_, true);
-    if (IsFileExist(queue_path_tmp_)) {
+    const LockFile lock(directory.Fd(), directory.QueueName(), true, base::kQueueMode);
+    if (directory.HasFile(directory.CopyName())) {
         return;
     }
-    if (rename(queue_path_.c_str(), queue_path_tmp_.c_str()) < 0) {
+    if (renameat(directory.Fd(), directory.QueueName().c_str(), directory.Fd(),
+                 directory.CopyName().c_str()) < 0) {
         const std::string reason = "rename failed, reason=" + SystemErrorText(errno);
         Fail({"queue_mgr", 136}, "0 > rename(queue_path_.c_str(), queue_path_tmp_.c_str())",
              Error(Error::kSystemCallFailed, reason));
@@ -91,8 +60,23 @@ void QueueMgr::PrepareTmpQueue() {
 }
 
 void QueueMgr::Append(const Json::Value& event) const {
-    const LockFile lock(queue_path_, true);
-    AppendLine(queue_path_, toString(event));
+    AppendAll({event});
+}
+
+void QueueMgr::AppendAll(const std::vector<Json::Value>& events) const {
+    std::string lines;
+    for (const Json::Value& event : events) {
+        lines += toString(event) + "\n";
+    }
+    const QueueDirectory directory(queue_path_);
+    if (!directory.IsValid()) {
+        FailLock(directory.Reason());
+    }
+    const LockFile lock(directory.Fd(), directory.QueueName(), true, base::kQueueMode);
+    if (base::AppendLines(lock.Fd(), lines) != lines.size()) {
+        const std::string reason = "Failed to write queue, reason=" + SystemErrorText(errno);
+        Fail(kLog.Here(), "!(queue << line << std::endl)", Error(Error::kSystemCallFailed, reason));
+    }
 }
 
 std::shared_ptr<OPTree> QueueMgr::GetOPTree() const {
@@ -104,14 +88,16 @@ std::shared_ptr<OPTree> QueueMgr::GetOPTreeTmp() const {
 }
 
 int QueueMgr::DeleteTmp() {
-    return unlink(queue_path_tmp_.c_str());
+    const QueueDirectory directory(queue_path_);
+    return directory.IsValid() ? unlinkat(directory.Fd(), directory.CopyName().c_str(), 0) : -1;
 }
 
 int QueueMgr::ProcessOP(const std::function<void(std::shared_ptr<OP>)>& fn, bool use_tmp) {
     if (use_tmp) {
         PrepareTmpQueue();
     }
-    if (!IsFileExist(use_tmp ? queue_path_tmp_ : queue_path_)) {
+    const QueueDirectory directory(queue_path_);
+    if (!directory.HasFile(use_tmp ? directory.CopyName() : directory.QueueName())) {
         return 0;
     }
     return (use_tmp ? GetOPTreeTmp() : GetOPTree())->ProcessOP(fn);
@@ -120,17 +106,15 @@ int QueueMgr::ProcessOP(const std::function<void(std::shared_ptr<OP>)>& fn, bool
 bool QueueMgr::IsFullPathProcessing(const std::string& full_path) const {
     // Not consulted: who asks learns here when the configured folders cannot be read.
     const FolderMgr folder_mgr;
-    const auto touches = [&](const Event& event) {
-        return IsPathWithin(event.path, full_path) || IsPathWithin(event.path_old, full_path);
-    };
-    return HasEvent(queue_path_, touches) || HasEvent(queue_path_tmp_, touches);
+    return HasPendingEvent(queue_path_, [&](const Event& event) {
+        return IsTouched(event.path, full_path) || IsTouched(event.path_old, full_path);
+    });
 }
 
 bool QueueMgr::IsFullPathHasReindex(const std::string& full_path) const {
-    const auto covers = [&](const Event& event) {
-        return event.event == EVENT_REINDEX && IsPathWithin(full_path, event.path);
-    };
-    return HasEvent(queue_path_, covers) || HasEvent(queue_path_tmp_, covers);
+    return HasPendingEvent(queue_path_, [&](const Event& event) {
+        return event.event == EVENT_REINDEX && IsTouched(full_path, event.path);
+    });
 }
 
 }  // namespace quivra::fileindex

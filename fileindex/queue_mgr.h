@@ -5,6 +5,7 @@
 #include <functional>
 #include <memory>
 #include <string>
+#include <vector>
 
 #include "common/export.h"
 #include "fileindex/optree.h"
@@ -20,6 +21,11 @@ namespace quivra::fileindex {
 ///
 /// Writers hold an exclusive LockFile on the queue file while they append. A failure of any call
 /// leaves both files as they were.
+///
+/// Both files of a share lie below "@eaDir", in a directory that users may exchange. They are used
+/// only while "@eaDir" and what is below belong to root or the effective user and nobody else may
+/// write there; else the calls throw, with a sentence that says what stands in the way. A link or
+/// FIFO in the place of a file counts as no file and is never followed or waited for.
 class QUIVRA_EXPORT QueueMgr {
   public:
     explicit QueueMgr(const std::string& queue_path);
@@ -32,6 +38,9 @@ class QUIVRA_EXPORT QueueMgr {
     /// that is missing is made, a last line that lacks its end gets one first. Throws Error 506
     /// (lock) or 502; the queue is as it was then.
     void Append(const Json::Value& event) const;
+    /// The same for several events, under one lock. After a failure the first of them may be in the
+    /// queue, each whole.
+    void AppendAll(const std::vector<Json::Value>& events) const;
 
     /// A new tree of the queue or of the working copy. Throws Error 502 when it cannot be read.
     std::shared_ptr<OPTree> GetOPTree() const;

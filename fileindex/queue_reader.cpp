@@ -1,10 +1,11 @@
 #include "fileindex/queue_reader.h"
 
-#include <fcntl.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <cstring>
+
+#include "fileindex/queue_directory.h"
 
 namespace quivra::fileindex {
 namespace {
@@ -13,7 +14,7 @@ constexpr std::size_t kBufferSize = 64 * 1024;
 
 }  // namespace
 
-QueueReader::QueueReader(const std::string& path) : fd_(open(path.c_str(), O_RDONLY | O_CLOEXEC)) {}
+QueueReader::QueueReader(const std::string& path) : fd_(QueueDirectory::OpenFile(path)) {}
 
 void QueueReader::RequireOpen(LogSite site) const {
     if (!IsOpen()) {

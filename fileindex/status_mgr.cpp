@@ -16,6 +16,9 @@
 namespace quivra::fileindex {
 namespace {
 
+/// Below 1000 are marks that support tools know.
+constexpr LogUnit kLog{"status_mgr.cpp", 1000};
+
 constexpr const char* kResumeTime = "resume_time";
 constexpr const char* kShare = "share";
 constexpr std::uint32_t kSecondsPerHour = 3600;
@@ -32,12 +35,18 @@ std::int64_t ResumeTimeIn(int hours) {
 }  // namespace
 
 StatusMgr::StatusMgr() {
-    if (IsFileExist(kFileIndexStatusCfgPath) && !fromFile(data_, kFileIndexStatusCfgPath)) {
+    Load();
+}
+
+void StatusMgr::Load() {
+    Json::Value data;
+    if (IsFileExist(kFileIndexStatusCfgPath) && !fromFile(data, kFileIndexStatusCfgPath)) {
         Fail(
-            {"status_mgr.cpp", __LINE__},
+            kLog.Here(),
             "IsFileExist(kFileIndexStatusCfgPath) && !data_.fromFile(kFileIndexStatusCfgPath)",
             Error(Error::kLoadFailed, std::string("Cannot load json: ") + kFileIndexStatusCfgPath));
     }
+    data_.swap(data);
 }
 
 void StatusMgr::Save() const {
@@ -56,10 +65,9 @@ void StatusMgr::Save() const {
 
 void StatusMgr::Pause(int hours) {
     const LockFile lock(kFileIndexStatusLockPath, true);
-    if (hours < 0) {
-        Fail({"status_mgr.cpp", __LINE__}, "0 > hours",
-             Error(Error::kBadArgument, "Pause length should NOT be negative"));
-    }
+    QUIVRA_FAIL_IF(kLog, 0 > hours,
+                   Error(Error::kBadArgument, "Pause length should NOT be negative"));
+    Load();
     const std::int64_t resume_time = ResumeTimeIn(hours);
     SetResumeTime(resume_time);
     Json::Value data;
@@ -69,24 +77,28 @@ void StatusMgr::Pause(int hours) {
 
 void StatusMgr::Resume() {
     const LockFile lock(kFileIndexStatusLockPath, true);
+    Load();
     SetResumeTime(kNotPaused);
     SendCommandToDaemon("resume", Json::Value());
 }
 
 void StatusMgr::SetShareStatus(const std::string& share, ShareStatus flag) {
     const LockFile lock(kFileIndexStatusLockPath, true);
+    Load();
     MutableShares()[share] = GetShareStatus(share) | flag;
     Save();
 }
 
 void StatusMgr::UnsetShareStatus(const std::string& share, ShareStatus flag) {
     const LockFile lock(kFileIndexStatusLockPath, true);
+    Load();
     MutableShares()[share] = GetShareStatus(share) & ~static_cast<unsigned int>(flag);
     Save();
 }
 
 void StatusMgr::ClearShareStatus(const std::string& share) {
     const LockFile lock(kFileIndexStatusLockPath, true);
+    Load();
     MutableShares().removeMember(share);
     Save();
 }
@@ -114,6 +126,7 @@ void StatusMgr::SetResumeTime(std::int64_t resume_time) {
 }
 
 Json::Value& StatusMgr::MutableShares() {
+    // What somebody else left in the file must not stop a flag from being kept.
     if (!data_.isObject()) {
         data_ = Json::Value(Json::objectValue);
     }

@@ -17,27 +17,32 @@ enum ShareStatus : unsigned int {
     kShareNeedReindex = 1,  ///< the share's index misses changes and must be rebuilt
 };
 
-/// What GetPauseInfo answers, beside a time in seconds since the epoch.
+/// What GetPauseInfo returns, beside a time in seconds since the epoch.
 inline constexpr std::int64_t kNotPaused = -1;
 inline constexpr std::int64_t kPausedWithoutEnd = 0;
 
 /// The global pause and the flags of each share, kept in one file:
-/// {"resume_time": SECONDS, "share": {NAME: FLAGS}}. An object holds the file as it was when the
-/// object was made, and every change writes it back at once, so build one for each use and do not
-/// keep it: a kept one may overwrite what others wrote. Not for use from several threads.
+/// {"resume_time": SECONDS, "share": {NAME: FLAGS}}. The questions look at the file as it was when
+/// the object was made or changed something, so build one for each use. Every change reads the file
+/// again under the lock and writes it back at once, so no concurrent change is lost. Not for use
+/// from several threads.
 ///
 /// Members of unexpected types count as absent, and a change replaces them (a file that holds no
 /// object at all included). The changing calls hold the status lock file throughout and throw
-/// Error 506 when it cannot be had, 503 when root's identity cannot be taken, 505 when the file
-/// cannot be written (it is then unchanged, this object is not) and 502 when its mode cannot be
-/// set.
+/// Error 506 when it cannot be had, 504 when the file is not JSON by then, 503 when root's identity
+/// cannot be taken, 505 when the file cannot be written (it is then unchanged, this object is not)
+/// and 502 when its mode cannot be set.
+///
+/// MIND: a change takes root's identity and the process KEEPS it, see sdk/credentials.h. A program
+/// that serves users makes changes from a process of its own.
 class QUIVRA_EXPORT StatusMgr {
   public:
     /// Reads the file. A missing one stands for: not paused, no flags. Throws Error 504 when it is
-    /// no JSON.
+    /// not JSON.
     StatusMgr();
 
-    /// Writes the file as user root, mode 0644. Does not take the lock. Its directory must exist.
+    /// Writes what this object holds as user root, mode 0644. Neither takes the lock nor reads the
+    /// file again: for a caller that holds the lock. The file's directory must exist.
     void Save() const;
 
     /// Pauses all indexing for that many hours, or without end when 0, and tells the indexing
@@ -62,6 +67,7 @@ class QUIVRA_EXPORT StatusMgr {
     unsigned int GetShareStatus(const std::string& share) const;
 
   private:
+    void Load();
     Json::Value& MutableShares();
     void SetResumeTime(std::int64_t resume_time);
 

@@ -19,6 +19,8 @@
 namespace quivra::fileindex {
 namespace {
 
+constexpr LogUnit kLog{"util", 0};
+
 constexpr const char* kHomesShare = "homes";
 constexpr int kHomeKinds[] = {KESTO_USER_HOME_DOMAIN, KESTO_USER_HOME_DIRECTORY,
                               KESTO_USER_HOME_LOCAL};
@@ -61,7 +63,7 @@ bool IsShareRecyclePath(const std::string& full_path) {
 
 void GetShareNameByPath(std::string& share_name, const std::string& share_path) {
     if (share_path.empty() || share_path.front() != '/') {
-        Fail({"util", __LINE__}, "1 > share_path.size() || '/' != share_path.at(0)",
+        Fail(kLog.Here(), "1 > share_path.size() || '/' != share_path.at(0)",
              Error(Error::kBadArgument, share_path));
     }
     share_name = share_path.substr(1, share_path.find('/', 1) - 1);
@@ -85,7 +87,7 @@ void GetShareNamePathByFullPath(std::string& share_name, std::string& share_path
                                        path.size());
     }
     if (result < 0) {
-        Fail({"util", __LINE__},
+        Fail(kLog.Here(),
              "0 > KESTOShareNamePathGet(full_path.c_str(), szShareName, sizeof(szShareName), "
              "szSharePath, sizeof(szSharePath))",
              Error(Error::kSystemCallFailed,
@@ -117,7 +119,7 @@ std::string ReplacePathShare(const std::string& path, const std::string& new_sha
                              const std::string& old_share) {
     const std::size_t pos = (path + "/").find("/" + old_share + "/");
     if (pos == std::string::npos) {
-        Fail({"util", __LINE__}, "string::npos == pos",
+        Fail(kLog.Here(), "string::npos == pos",
              Error(Error::kBadArgument, "Cannot find share: " + old_share));
     }
     return path.substr(0, pos + 1) + new_share + path.substr(pos + 1 + old_share.size());

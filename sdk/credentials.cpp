@@ -16,6 +16,8 @@ namespace quivra {
 namespace sdk {
 namespace {
 
+constexpr LogUnit kLog{"credentials", 0};
+
 /// The reason's text starts as many characters late as the platform's error code says: an oddity
 /// of the reasons in use, which support tools know. A code beyond the text leaves nothing.
 std::string LookupFailedReason(int code) {
@@ -34,7 +36,7 @@ SDKCredentials::SDKCredentials() : euid_(geteuid()), egid_(getegid()) {
     const LockMutex lock(SDKMutex());
     KESTOUser* user_info = nullptr;
     if (0 > KESTOUserGetByUID(euid_, &user_info) || !user_info) {
-        Fail({"credentials", __LINE__}, "0 > KESTOUserGetByUID(euid_, &user_info) || !user_info",
+        Fail(kLog.Here(), "0 > KESTOUserGetByUID(euid_, &user_info) || !user_info",
              Error(Error::kCredentialsFailed, LookupFailedReason(KLIBCErrGet())));
     }
     const std::unique_ptr<KESTOUser, void (*)(KESTOUser*)> owner(user_info, KESTOUserFree);
@@ -52,7 +54,7 @@ SDKCredentials::~SDKCredentials() {
         return;
     }
     if (!ResetCredentialsByName(username_.c_str(), true)) {
-        LogFailure({"credentials", __LINE__}, "!ResetCredentialsByName(username_)",
+        LogFailure(kLog.Here(), "!ResetCredentialsByName(username_)",
                    Error(Error::kCredentialsFailed).what());
         std::terminate();
     }
@@ -63,7 +65,7 @@ void SDKCredentials::AsUser(const std::string& user) {
     const bool is_admin = KLIBGroupIsAdminGroupMem(user.c_str(), 0) == 1;
     const std::string target_username = is_admin ? "root" : user;
     if (!ResetCredentialsByName(target_username.c_str(), true)) {
-        Fail({"credentials", __LINE__}, "!ResetCredentialsByName(target_username)",
+        Fail(kLog.Here(), "!ResetCredentialsByName(target_username)",
              Error(Error::kCredentialsFailed));
     }
 }

@@ -16,13 +16,15 @@ namespace quivra {
 namespace sdk {
 namespace {
 
+constexpr LogUnit kLog{"share", 0};
+
 constexpr unsigned long long kSpaceNeeded = 100ULL << 20;
 
 /// Shares that are never indexed, whatever their flags.
 constexpr std::array<const char*, 2> kExcludedShares{"surveillance", "NetBackup"};
 
-[[noreturn]] void FailCall(int line, const char* condition, const std::string& reason) {
-    Fail({"share", line}, condition, Error(Error::kSystemCallFailed, reason));
+[[noreturn]] void FailCall(LogSite site, const char* condition, const std::string& reason) {
+    Fail(site, condition, Error(Error::kSystemCallFailed, reason));
 }
 
 }  // namespace
@@ -30,8 +32,7 @@ constexpr std::array<const char*, 2> kExcludedShares{"surveillance", "NetBackup"
 SDKShare::SDKShare(const std::string& share_name) : share_name_(share_name) {
     const LockMutex lock(SDKMutex());
     if (0 > KESTOShareGet(share_name.c_str(), &share_info_) || !share_info_) {
-        Fail({"share", __LINE__},
-             "0 > KESTOShareGet(share_name.c_str(), &share_info_) || !share_info_",
+        Fail(kLog.Here(), "0 > KESTOShareGet(share_name.c_str(), &share_info_) || !share_info_",
              Error(Error::kNoSuchShare, share_name));
     }
 }
@@ -71,7 +72,7 @@ bool SDKShare::IsEncryption() const {
     int is_encryption = 0;
     const LockMutex lock(SDKMutex());
     if (0 > KLIBShareIsEncryptionGet(share_info_, &is_encryption)) {
-        FailCall(__LINE__, "0 > KLIBShareIsEncryptionGet(share_info_, &is_encryption)",
+        FailCall(kLog.Here(), "0 > KLIBShareIsEncryptionGet(share_info_, &is_encryption)",
                  "KLIBShareIsEncryptionGet failed, share=" + share_name_);
     }
     return is_encryption != 0;
@@ -81,7 +82,7 @@ bool SDKShare::IsEnableRecycleBin() const {
     int is_enabled = 0;
     const LockMutex lock(SDKMutex());
     if (0 > KLIBShareRecycleStatusGet(share_info_, &is_enabled)) {
-        FailCall(__LINE__, "0 > KLIBShareRecycleStatusGet(share_info_, &is_enabled)",
+        FailCall(kLog.Here(), "0 > KLIBShareRecycleStatusGet(share_info_, &is_enabled)",
                  "KLIBShareRecycleStatusGet failed, share=" + share_name_);
     }
     return is_enabled != 0;
@@ -91,7 +92,8 @@ std::string SDKShare::GetQueuePath() const {
     char path[4096] = "";
     const LockMutex lock(SDKMutex());
     if (0 > FILEIDXQueuePathCompose(share_info_->szPath, path, sizeof(path))) {
-        FailCall(__LINE__, "0 > FILEIDXQueuePathCompose(share_info_->szPath, path, sizeof(path))",
+        FailCall(kLog.Here(),
+                 "0 > FILEIDXQueuePathCompose(share_info_->szPath, path, sizeof(path))",
                  "FILEIDXQueuePathCompose failed, share=" + share_name_);
     }
     return path;
@@ -101,7 +103,7 @@ std::string SDKShare::GetDBPath() const {
     char path[4096] = "";
     const LockMutex lock(SDKMutex());
     if (0 > FILEIDXDBPathCompose(share_info_->szPath, path, sizeof(path))) {
-        FailCall(__LINE__, "0 > FILEIDXDBPathCompose(share_info_->szPath, path, sizeof(path))",
+        FailCall(kLog.Here(), "0 > FILEIDXDBPathCompose(share_info_->szPath, path, sizeof(path))",
                  "FILEIDXDBPathCompose failed, share=" + share_name_);
     }
     return path;
@@ -117,11 +119,11 @@ bool SDKShare::CanBeIndexed() const {
     }
     // The reasons' odd spelling is what support tools look for.
     if (0 > KLIBShareIsEncryptedGet(share_info_, &is_encrypted)) {
-        FailCall(__LINE__, "0 > KLIBShareIsEncryptedGet(share_info_, &is_encrypted)",
+        FailCall(kLog.Here(), "0 > KLIBShareIsEncryptedGet(share_info_, &is_encrypted)",
                  "KLIBShareis_encryptedGet failed, share=" + share_name_);
     }
     if (0 > KLIBShareIsReadOnlyGet(share_info_, &is_readonly)) {
-        FailCall(__LINE__, "0 > KLIBShareIsReadOnlyGet(share_info_, &is_readonly)",
+        FailCall(kLog.Here(), "0 > KLIBShareIsReadOnlyGet(share_info_, &is_readonly)",
                  "KLIBShareis_readonlyGet failed, share=" + share_name_);
     }
     return is_encrypted == 0 && is_readonly == 0;

@@ -33,7 +33,7 @@ Json::Value ExtractDocument(const std::string& full_path, bool need_meta) {
     cfg["need_meta"] = need_meta;
     Json::Value file_data;
     if (!KESTO::CONTENT_EXTRACT::ParseFile(full_path, cfg, file_data) || !file_data.isObject()) {
-        Fail({"elastic_control", __LINE__}, "!ParseFile(full_path, cfg, file_data)",
+        Fail(unit::kDocuments.Here(), "!ParseFile(full_path, cfg, file_data)",
              Error(Error::kParseFailed, "Parse failed, path=" + full_path));
     }
     file_data[field::kSearchFileName] = Json::Value(std::as_const(file_data)[field::kFSName]);
@@ -117,7 +117,7 @@ void IndexRename(const std::string& share, const std::string& new_path,
     SendRequestWithRetry(reply, request);
     const Json::Value* hits = FindJsonMember(reply, "data", false);
     if (hits == nullptr || !hits->isArray()) {
-        Fail({"elastic_control", __LINE__}, "!res.isMember(\"data\") || !res[\"data\"].isArray()",
+        Fail(unit::kDocuments.Here(), "!res.isMember(\"data\") || !res[\"data\"].isArray()",
              Error(Error::kQueryWithoutData, toString(reply)));
     }
 
@@ -141,7 +141,7 @@ void IndexCommit(const std::string& share) {
         }
     }
     StatusMgr().SetShareStatus(share, kShareNeedReindex);
-    Fail({"elastic_control", __LINE__}, "!sdk_share.IsSpaceEnough()",
+    Fail(unit::kDocuments.Here(), "!sdk_share.IsSpaceEnough()",
          Error(Error::kSpaceNotEnough, "Share (" + share + ") space not enough"));
 }
 

@@ -2,6 +2,7 @@
 #include "common/json.h"
 #include "common/log.h"
 #include "fileindex/elastic/elastic_control.h"
+#include "fileindex/elastic/request.h"
 
 namespace quivra::fileindex::elastic {
 namespace {
@@ -75,8 +76,7 @@ constexpr const char* kMappings = R"({
 Json::Value GetFileIndexMappings() {
     Json::Value ret;
     if (!fromString(ret, kMappings)) {
-        Fail({"elastic_control", __LINE__}, "!ret.fromString(mappings)",
-             Error(Error::kSystemCallFailed));
+        Fail(unit::kMappings.Here(), "!ret.fromString(mappings)", Error(Error::kSystemCallFailed));
     }
     return ret;
 }

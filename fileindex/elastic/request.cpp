@@ -36,17 +36,17 @@ bool ParseReply(Json::Value& response, const std::string& text) {
 void Exchange(Json::Value& response, const Json::Value& request) {
     kestodaemon::DomainSockConnection conn(kSearchDaemonSocketPath);
     if (!conn.Connect()) {
-        Fail({"elastic_control", __LINE__}, "!conn.Connect()",
+        Fail(unit::kRequest.Here(), "!conn.Connect()",
              Error(Error::kChannelFailed, "Connect failed"));
     }
     if (!conn.Send(toString(request))) {
-        Fail({"elastic_control", __LINE__}, "!conn.Send(req.toString())",
+        Fail(unit::kRequest.Here(), "!conn.Send(req.toString())",
              Error(Error::kChannelFailed, "Send failed"));
     }
     response = Json::Value();
     std::string resp_raw;
     if (!conn.Recv(resp_raw) || !ParseReply(response, resp_raw)) {
-        Fail({"elastic_control", __LINE__},
+        Fail(unit::kRequest.Here(),
              "!conn.Recv(resp_raw) || !res.fromString(resp_raw) || !res.isMember(\"success\") || "
              "!res[\"success\"].isBool()",
              Error(Error::kChannelFailed, "Recv failed, res=" + toString(response)));
@@ -68,31 +68,38 @@ Refusal ReadRefusal(const Json::Value& reply) {
     return refusal;
 }
 
+/// What a batch's element says of its failure. What is missing or of another type counts as 0 and
+/// empty: the others' failures are worth their log lines all the same.
+Refusal ReadElement(const Json::Value& element) {
+    Json::Value error;
+    GetJsonValue(error, element, "error", false);
+    Refusal refusal;
+    GetJsonValue<int>(refusal.code, error, "code", false);
+    GetJsonValue<std::string>(refusal.msg, error, "msg", false);
+    return refusal;
+}
+
 /// Elements that failed are logged, and the batch counts as done, unless the daemon was too busy
 /// for one: then the whole batch is to be sent again.
 void CheckCompound(const Json::Value& response, const Json::Value& request) {
     bool has_fail = false;
-    GetJsonValue<bool>(has_fail, response, "has_fail", response.isMember("has_fail"));
-    if (!has_fail) {
+    GetJsonValue<bool>(has_fail, response, "has_fail", false);
+    const Json::Value* data = FindJsonMember(response, "data", false);
+    if (!has_fail || data == nullptr || !data->isArray()) {
         return;
     }
-    const Json::Value& data = *FindJsonMember(response, "data", true);
-    if (!data.isArray()) {
-        Fail({"elastic_control", __LINE__}, "!res[\"data\"].isArray()",
-             Error(Error::kBadArgument, "Not an array" + AppendData(response)));
-    }
-    for (Json::ArrayIndex i = 0; i < data.size(); ++i) {
+    for (Json::ArrayIndex i = 0; i < data->size(); ++i) {
         bool success = false;
-        GetJsonValue<bool>(success, data[i], "success", true);
+        GetJsonValue<bool>(success, (*data)[i], "success", false);
         if (success) {
             continue;
         }
-        const Refusal refusal = ReadRefusal(data[i]);
+        const Refusal refusal = ReadElement((*data)[i]);
         if (IsBusy(refusal.code)) {
-            Fail({"elastic_control", __LINE__}, "1400 == code || 1401 == code",
+            Fail(unit::kRequest.Here(), "1400 == code || 1401 == code",
                  Error(refusal.code, refusal.msg));
         }
-        LogError({"elastic_control", __LINE__}, "Compound failed: %s (%d) %s",
+        LogError(unit::kRequest.Here(), "Compound failed: %s (%d) %s",
                  toString(request["compound"][i]).c_str(), refusal.code, refusal.msg.c_str());
     }
 }
@@ -103,7 +110,7 @@ void SendRequest(Json::Value& response, const Json::Value& request) {
     Exchange(response, request);
     if (!response["success"].asBool()) {
         const Refusal refusal = ReadRefusal(response);
-        Fail({"elastic_control", __LINE__}, "!res[\"success\"].asBool()",
+        Fail(unit::kRequest.Here(), "!res[\"success\"].asBool()",
              Error(refusal.code, "Request failed, msg=" + refusal.msg));
     }
     if (request.isMember("compound")) {
@@ -112,7 +119,7 @@ void SendRequest(Json::Value& response, const Json::Value& request) {
 }
 
 void SendRequestWithRetry(Json::Value& response, const Json::Value& request) {
-    bool notified = false;
+    bool notified = false;  // once per call: the next call of the same hour tells them again
     for (unsigned int attempt = 1;; ++attempt) {
         try {
             SendRequest(response, request);
@@ -122,7 +129,7 @@ void SendRequestWithRetry(Json::Value& response, const Json::Value& request) {
                 throw;
             }
         }
-        LogError({"elastic_control", __LINE__},
+        LogError(unit::kRequest.Here(),
                  "Retry[%u] since kestoelasticd is busy. Command: %s, db: %s", attempt - 1,
                  request["command"].asString().c_str(), request["data"]["id"].asString().c_str());
         if (attempt > kAttemptsBeforeNotice && !notified) {

@@ -5,7 +5,7 @@
 
 #include <cerrno>
 
-#include "common/util.h"
+#include "base/file.h"
 
 namespace quivra::ctl {
 
@@ -29,7 +29,8 @@ DescriptorBuffer::int_type DescriptorBuffer::overflow(int_type character) {
 }
 
 int DescriptorBuffer::sync() {
-    if (error_ == 0 && !WriteAll(fd_, pbase(), static_cast<std::size_t>(pptr() - pbase()))) {
+    if (error_ == 0 &&
+        !base::WriteAll(fd_, {pbase(), static_cast<std::size_t>(pptr() - pbase())})) {
         error_ = errno;
     }
     // Also after a failure: a buffer that stays full would be written again and again.

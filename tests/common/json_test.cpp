@@ -3,10 +3,31 @@
 #include <gtest/gtest.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
+#include <unistd.h>
 
+#include <cerrno>
+#include <clocale>
 #include <csignal>
 #include <filesystem>
 #include <fstream>
+#include <locale>
+
+#include "tests/fake/fake_libc.h"
+
+namespace {
+/// Directories cannot be made durable.
+bool failing_sync = false;
+}  // namespace
+
+extern "C" int fsync(int fd) {
+    struct stat status {};
+    if (failing_sync && fstat(fd, &status) == 0 && S_ISDIR(status.st_mode)) {
+        errno = EIO;
+        return -1;
+    }
+    return static_cast<int>(syscall(SYS_fsync, fd));
+}
 
 namespace quivra {
 namespace {
@@ -39,6 +60,31 @@ TEST(JsonTest, GettersTakeWhatTheTypeAllows) {
     Json::Value itself = Parse(R"({"a": {"b": 1}})");
     GetJsonValue(itself, itself, "a", true);
     EXPECT_EQ(toString(itself), R"({"b":1})");
+    GetJsonValue<Json::Value>(itself, itself, "b", true);
+    EXPECT_EQ(itself, 1);
+}
+
+/// Groups digits and has a decimal comma, as a host program's locale may.
+class CommaLocale : public std::numpunct<char> {
+  protected:
+    char do_decimal_point() const override { return ','; }
+    char do_thousands_sep() const override { return '.'; }
+    std::string do_grouping() const override { return "\3"; }
+};
+
+TEST(JsonTest, TheLocaleOfTheHostPlaysNoPart) {
+    const std::string text = R"([-1234567,18446744073709551615,1234.5,1e+300])";
+    const std::locale old = std::locale::global(std::locale(std::locale(), new CommaLocale));
+    for (const char* name : {"C", "de_DE.UTF-8"}) {  // the second where the machine has it
+        std::setlocale(LC_ALL, name);
+        const Json::Value value = Parse(text);
+        EXPECT_EQ(value[2].asDouble(), 1234.5);
+        EXPECT_EQ(toString(value).substr(0, 37), text.substr(0, 37));
+        EXPECT_EQ(Parse(toString(value)), value);
+        EXPECT_STREQ(Error(123456).what(), "Quivra error, code=123456");
+    }
+    std::locale::global(old);
+    std::setlocale(LC_ALL, "C");
 }
 
 TEST(JsonTest, MergesChanges) {
@@ -55,15 +101,38 @@ TEST(JsonTest, MergesChanges) {
         JsonApplyChanges(target, Parse(changes));
         EXPECT_EQ(toString(target), merged);
     }
+    Json::Value target = Parse(R"({"a":1,"a\u0000b":2})");
+    JsonApplyChanges(target, Parse(R"({"a\u0000b":null})"));
+    EXPECT_EQ(toString(target), R"({"a":1})");
 }
 
 TEST(JsonTest, HostileTextIsRefusedAndBytesSurvive) {
     Json::Value value;
-    for (const std::string& text :
-         {std::string(), std::string("{"), std::string("{} x"), std::string(5000, '['),
-          std::string(1000000, '{'), std::string("\0", 1), std::string("{\"a\":}")}) {
+    using namespace std::string_literals;
+    for (const std::string& text : {""s,
+                                    "{"s,
+                                    "{} x"s,
+                                    std::string(5000, '['),
+                                    std::string(1000000, '{'),
+                                    "\0"s,
+                                    "{\"a\":}"s,
+                                    "[]\0junk"s,
+                                    "[1]\0"s,
+                                    "[1,]"s,
+                                    "{\"a\":1,}"s,
+                                    "[1] // one"s,
+                                    "/* one */ [1]"s,
+                                    "007"s,
+                                    "+1"s,
+                                    "[1.]"s,
+                                    "['a']"s,
+                                    "\"a\tb\""s,
+                                    "\"a\0b\""s,
+                                    "nan"s}) {
         EXPECT_FALSE(fromString(value, text)) << text.substr(0, 20);
     }
+    EXPECT_TRUE(fromString(value, std::string(1000, '[') + std::string(1000, ']')));
+    EXPECT_FALSE(fromString(value, std::string(1001, '[') + std::string(1001, ']')));
     const std::string text = "{\"path\":\"/a\xff\xfe b\"}";
     EXPECT_EQ(toString(Parse(text)), text);
     EXPECT_EQ(Parse(R"("a\u0000b")").asString(), std::string("a\0b", 3));
@@ -94,6 +163,28 @@ TEST(JsonFileTest, AFailedSaveLeavesTheOldFileAndNothingElse) {
     EXPECT_EQ(std::distance(std::filesystem::directory_iterator(directory), {}), 1);
     EXPECT_FALSE(toFile(value, directory + "/missing/file"));
     EXPECT_FALSE(fromFile(value, directory));
+
+    const int lowest = dup(0);
+    close(lowest);
+    getrlimit(RLIMIT_NOFILE, &old_limit);
+    const struct rlimit one_left { static_cast<rlim_t>(lowest) + 1, old_limit.rlim_max };
+    setrlimit(RLIMIT_NOFILE, &one_left);
+    EXPECT_FALSE(toFile(Parse("[3]"), path));
+    setrlimit(RLIMIT_NOFILE, &old_limit);
+    ASSERT_TRUE(fromFile(value, path));
+    EXPECT_EQ(toString(value), "[2]");
+
+    // Replaced is replaced, even if it is not safe from a power failure; and what a killed process
+    // left is used up.
+    std::ofstream(path + ".new") << "junk of a longer text";
+    failing_sync = true;
+    EXPECT_TRUE(toFile(Parse("[4]"), path));
+    failing_sync = false;
+    EXPECT_EQ(fake::LogLinesWith("may be lost in a power failure").size(), 1U);
+    ASSERT_TRUE(fromFile(value, path));
+    EXPECT_EQ(toString(value), "[4]");
+    EXPECT_EQ(std::filesystem::status(path).permissions(), std::filesystem::perms(0640));
+    EXPECT_EQ(std::distance(std::filesystem::directory_iterator(directory), {}), 1);
     std::filesystem::remove_all(directory);
 }
 

@@ -1,5 +1,6 @@
 #include "common/lock_file.h"
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/file.h>
 #include <sys/stat.h>
@@ -7,9 +8,11 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <cstdarg>
 #include <cstdlib>
 #include <filesystem>
 #include <functional>
+#include <vector>
 
 #include "common/error.h"
 #include "tests/fake/fake_libc.h"
@@ -17,7 +20,18 @@
 namespace {
 /// Runs in the moment between the opening and the locking of a file.
 std::function<void()> before_flock;
+/// The flags of each opening.
+std::vector<int> open_flags;
 }  // namespace
+
+extern "C" int openat(int directory, const char* path, int flags, ...) {
+    va_list arguments;
+    va_start(arguments, flags);
+    const mode_t mode = (flags & O_CREAT) != 0 ? va_arg(arguments, mode_t) : 0;
+    va_end(arguments);
+    open_flags.push_back(flags);
+    return static_cast<int>(syscall(SYS_openat, directory, path, flags, mode));
+}
 
 extern "C" int flock(int fd, int operation) noexcept {
     if (before_flock) {
@@ -101,6 +115,25 @@ TEST_F(LockFileTest, WaitsForADyingHolderButNotForEver) {
     fake::OnSleep([&](auto) { holder.Kill(); });
     const LockFile lock(path_, true);
     EXPECT_EQ(fake::Sleeps().size(), 65U);
+}
+
+TEST_F(LockFileTest, WhatIsNotAFileIsRefusedAndAFileIsNotMadeTwice) {
+    const std::string target = directory_ + "/target";
+    std::filesystem::create_symlink(target, path_);
+    EXPECT_TRUE(LockErrorOf(path_, true).starts_with("open failed"));
+    EXPECT_FALSE(std::filesystem::exists(target)) << "the link was followed";
+    std::filesystem::remove(path_);
+    ASSERT_EQ(mkfifo(path_.c_str(), 0600), 0);
+    EXPECT_TRUE(LockErrorOf(path_, true).starts_with("open failed"));
+    std::filesystem::remove(path_);
+
+    umask(022);
+    { const LockFile lock(path_, true); }
+    EXPECT_EQ(std::filesystem::status(path_).permissions(), std::filesystem::perms(0644));
+    open_flags.clear();
+    { const LockFile lock(path_, true); }
+    ASSERT_EQ(open_flags.size(), 1U);
+    EXPECT_EQ(open_flags[0] & O_CREAT, 0) << "root is refused where fs.protected_regular is 2";
 }
 
 TEST_F(LockFileTest, LocksTheFileThatIsAtThePathNow) {

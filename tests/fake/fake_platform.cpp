@@ -18,8 +18,8 @@
 #include <filesystem>
 #include <iterator>
 
+#include "base/path.h"
 #include "common/json.h"
-#include "common/util.h"
 
 namespace fake {
 namespace {
@@ -63,7 +63,7 @@ bool Begin(const std::string& name, const Arguments&... arguments) {
 bool IsInShareDirectory(const std::string& path, const std::string& name) {
     Platform machine;
     return std::any_of(machine->shares.begin(), machine->shares.end(), [&](const auto& entry) {
-        return quivra::IsPathWithin(path, entry.second.szPath + ("/" + name));
+        return quivra::base::IsAtOrBelow(path, entry.second.szPath + ("/" + name));
     });
 }
 
@@ -186,7 +186,7 @@ int KESTOShareNamePathGet(const char* full_path, char* name, int name_size, char
     }
     Platform machine;
     for (const auto& [share_name, share] : machine->shares) {
-        if (quivra::IsPathWithin(full_path, share.szPath)) {
+        if (quivra::base::IsAtOrBelow(full_path, share.szPath)) {
             std::snprintf(name, static_cast<std::size_t>(name_size), "%s", share.szName);
             std::snprintf(path, static_cast<std::size_t>(path_size), "%s", share.szPath);
             return 0;
@@ -242,7 +242,7 @@ int KESTOGetFSType(const char* path, int flags) {
     }
     Platform machine;
     for (const auto& [top, type] : machine->fs_types) {
-        if (quivra::IsPathWithin(path, top)) {
+        if (quivra::base::IsAtOrBelow(path, top)) {
             return type;
         }
     }

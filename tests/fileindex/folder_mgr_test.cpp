@@ -58,17 +58,44 @@ TEST_F(FolderMgrTest, FilesThatCannotBeReadOrWrittenAreErrors) {
         {"[" + Stored("/s") + ",{}]", 120},
         {"[" + Stored("/s", R"(,"photo":"yes")") + "]", 120},
         {"[" + Stored("no slash") + "]", 0},
+        {"null", 0},
+        {"{}", 0},
+        {R"({"path":"/s"})", 120},
+        {"7", 120},
+        {"[]" + std::string("\0x", 2), 504},
     };
     for (const auto& [text, code] : rows) {
         SetFolders(text);
         EXPECT_EQ(ErrorOf([] { FolderMgr(); }).code, code) << text;
     }
+    SetFolders("[" + Stored("no slash") + "]");
     const FolderMgr folder_mgr;
     EXPECT_EQ(ErrorOf([&] { folder_mgr.IsFullPathIndexed("/volume1/s"); }).code, 120);
     fake::FailNext("ResetCredentialsByName");
     EXPECT_EQ(ErrorOf([&] { folder_mgr.Save(); }).code, 503);
     std::filesystem::remove_all("/var/packages/Quivra/etc");
     EXPECT_EQ(ErrorOf([&] { folder_mgr.Save(); }).code, 505);
+}
+
+TEST_F(FolderMgrTest, AShareThatIsGoneStopsNothingOfTheOthers) {
+    SetFolders("[" + Stored("/gone") + "," + Stored("/s/a") + "," + Stored("/gone/x") + "]");
+    FolderMgr folder_mgr;
+    fake::ResetLibc();
+    EXPECT_TRUE(folder_mgr.IsFullPathIndexed("/volume1/s/a/f"));
+    EXPECT_FALSE(folder_mgr.IsFullPathIndexed("/volume1/gone/f"));
+    EXPECT_FALSE(folder_mgr.IsFullPathHasOwnCfg("/volume1/gone"));
+    EXPECT_TRUE(folder_mgr.IsFullPathNeedMeta("/volume1/s/a/f.txt"));
+    EXPECT_EQ(fake::LogLinesWith("Share gone is gone").size(), 1U) << "once, not for each question";
+
+    FolderPtr diff;
+    folder_mgr.Upsert(diff, std::make_shared<Folder>("/s", "n", true, true, true, true, false));
+    const Error error = ErrorOf([&] { folder_mgr.Delete(diff, "/gone/x"); });
+    EXPECT_EQ(error.code, 800);
+    EXPECT_EQ(error.reason, "gone");
+    EXPECT_EQ(folder_mgr.GetIndexedShares(), (std::set<std::string>{"gone", "s"}));
+    Json::Value status;
+    Folder(Parse(Stored("/gone"))).GetStatus(status);
+    EXPECT_EQ(status, Parse(R"({"text":"error","desc":"invalid_path"})"));
 }
 
 TEST_F(FolderMgrTest, TheDeepestFolderGoverns) {

@@ -188,9 +188,35 @@ TEST_F(OperationsTest, DeletingTheLastFolderDropsTheShareThenTheServices) {
     EXPECT_EQ(Steps().back(), "KLIBServicectlStop(pkg-Quivra-fileindexd, 1)");
 }
 
+TEST_F(OperationsTest, AListReadsEachQueueOnceAndGoesOnWithoutAShareThatIsGone) {
+    EXPECT_TRUE(toFile(List({"/a/x", "/gone", "/b", "/a/y", "/a"}), kFileIndexFoldersCfgPath));
+    WriteFile(QueuePath("/volume1/a"), R"({"event":2,"path":"/volume1/a/x/f"})"
+                                       "\n"
+                                       R"({"event":2,"path":"/volume1/a/x2"})"
+                                       "\n");
+    Json::Value result;
+    FolderList(result, 0, 10, "path", "", Parse(R"(["status"])"));
+    std::string states;
+    for (const Json::Value& folder : result["folder"]) {
+        states += folder["path"].asString() + ":" +
+                  folder["additional"]["status"]["text"].asString() + " ";
+    }
+    EXPECT_EQ(states, "/a:processing /a/x:processing /a/y:finished /b:finished /gone:error ");
+    EXPECT_EQ(fake::CallsOf("FILEIDXQueuePathCompose").size(), 2U);
+
+    // A bad line is no reason to believe that nothing is pending; what was found before it holds.
+    WriteFile(QueuePath("/volume1/a"), R"({"event":2,"path":"/volume1/a/x/f"})"
+                                       "\nbad\n");
+    FolderList(result, 1, 1, "path", "", Parse(R"(["status"])"));
+    EXPECT_EQ(result["folder"][0]["additional"]["status"]["text"], "processing");
+    EXPECT_EQ(ErrorOf([&] { FolderList(result, 2, 1, "path", "", Parse(R"(["status"])")); }).code,
+              906);
+    EXPECT_EQ(ErrorOf([&] { FolderList(result, 0, 1, "", "", Json::Value()); }).code, 120);
+}
+
 TEST_F(OperationsTest, AVolumeIsAPlainPrefixAndIsSavedFirst) {
     AddShare("c", "/volume10");
-    EXPECT_TRUE(toFile(List({"/b", "/a", "/a/x", "/c"}), kFileIndexFoldersCfgPath));
+    EXPECT_TRUE(toFile(List({"/b", "/a", "/gone", "/a/x", "/c"}), kFileIndexFoldersCfgPath));
     SharePause("unindexed");
     EXPECT_EQ(ErrorOf([] { VolumePause(""); }).code, 120) << "a prefix of all";
     EXPECT_TRUE(Steps().empty());

@@ -5,7 +5,7 @@
 #include <map>
 #include <random>
 
-#include "common/util.h"
+#include "base/path.h"
 #include "fileindex/optree.h"
 #include "tests/fileindex/queue_support.h"
 
@@ -175,7 +175,7 @@ std::vector<Step> StepsOver(const std::vector<std::string>& paths) {
         }
         add(EVENT_UPDATE_CFG, path, "", R"({"audio":true,"photo":false})");
         for (const std::string& old : paths) {
-            if (path == old || !(IsPathWithin(path, old) || IsPathWithin(old, path))) {
+            if (path == old || !(base::IsAtOrBelow(path, old) || base::IsAtOrBelow(old, path))) {
                 add(EVENT_RENAME, path, old, "");
             }
         }

@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 #include <poll.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -78,6 +79,45 @@ TEST_F(QueueMgrTest, NoEventIsLostBetweenWritersAndPasses) {
     }
     pass();
     EXPECT_EQ(seen.size(), static_cast<std::size_t>(kWriters * kLines));
+}
+
+TEST_F(QueueMgrTest, OnlyAPrivatePlaceBelowTheSystemDirectoryIsUsed) {
+    const std::string share = std::filesystem::path(queue_).parent_path() / "share";
+    const std::string place = share + "/@eaDir/fileindex";
+    const std::string queue = place + "/queue";
+    const std::string secret = share + "/secret";
+    Json::Value event;
+    fromString(event, Line(EVENT_REINDEX, "/x"));
+    const struct {
+        const char* what;
+        std::function<void()> plant;
+        int prepare;  // code of PrepareTmpQueue
+        int append;
+    } rows[] = {
+        {"nothing", [] {}, 0, 0},
+        {"others may write", [&] { chmod((share + "/@eaDir").c_str(), 0777); }, 506, 506},
+        {"a link as @eaDir",
+         [&] {
+             std::filesystem::rename(share + "/@eaDir", share + "/theirs");
+             std::filesystem::create_symlink("theirs", share + "/@eaDir");
+         },
+         506, 506},
+        {"a link as queue", [&] { std::filesystem::create_symlink(secret, queue); }, 0, 506},
+        {"a FIFO as queue", [&] { mkfifo(queue.c_str(), 0600); }, 0, 506},
+        {"no directory", [&] { std::filesystem::remove_all(share + "/@eaDir"); }, 0, 506},
+    };
+    for (const auto& row : rows) {
+        std::filesystem::remove_all(share);
+        std::filesystem::create_directories(place);
+        std::ofstream(secret) << "theirs";
+        row.plant();
+        QueueMgr manager(queue);
+        EXPECT_EQ(ErrorOf([&] { manager.PrepareTmpQueue(); }).first, row.prepare) << row.what;
+        EXPECT_EQ(ErrorOf([&] { manager.Append(event); }).first, row.append) << row.what;
+        EXPECT_EQ(std::filesystem::file_size(secret), 6U) << row.what;
+        EXPECT_EQ(manager.IsFullPathHasReindex("/x"), row.append == 0) << row.what;
+    }
+    std::filesystem::remove_all(share);
 }
 
 TEST_F(QueueMgrTest, TellsWhatIsPending) {

@@ -53,6 +53,16 @@ TEST_F(StatusMgrTest, FlagsAreSetClearedAndForgottenUnderTheLock) {
     status.ClearShareStatus("a");
     EXPECT_EQ(Stored(), Parse(R"({"resume_time":7,"share":{"new":0},"other":[1]})"));
 
+    // Of two objects neither takes back what the other has done.
+    StatusMgr first;
+    StatusMgr second;
+    first.SetShareStatus("x", kShareNeedReindex);
+    second.SetShareStatus("y", kShareNeedReindex);
+    EXPECT_EQ(ErrorOf([&] { first.Pause(0); }).code, 502);  // nobody to tell
+    second.UnsetShareStatus("new", kShareNeedReindex);
+    EXPECT_EQ(Stored(), Parse(R"({"resume_time":0,"share":{"new":0,"x":1,"y":1},"other":[1]})"));
+    EXPECT_EQ(second.GetPauseInfo(), 0);
+
     const LockFile held(kFileIndexStatusLockPath, true);
     const std::function<void()> changes[] = {
         [&] { status.Resume(); },

@@ -9,7 +9,7 @@
 #include "fileindex/event.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/index_mgr.h"
-#include "fileindex/index_steps.h"
+#include "fileindex/operations/steps.h"
 #include "fileindex/queue_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "sdk/share.h"

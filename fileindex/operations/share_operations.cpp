@@ -6,7 +6,7 @@
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/index_mgr.h"
-#include "fileindex/index_steps.h"
+#include "fileindex/operations/steps.h"
 #include "fileindex/status_mgr.h"
 
 namespace quivra::fileindex {
@@ -21,13 +21,15 @@ void SavePausedOfShare(const FolderMgr& folder_mgr, const std::string& share, bo
     folder_mgr.Save();
 }
 
-/// Marks the folders of a volume; answers their shares.
+/// Marks the folders of a volume; returns their shares.
 std::set<std::string> SavePausedOfVolume(const std::string& mount_point, bool paused) {
     const FolderMgr folder_mgr;
     std::set<std::string> shares;
     for (const auto& folder : folder_mgr.GetFolders()) {
-        // A plain prefix, without regard to components, is what callers rely on.
-        if (StringStartWith(folder->GetFullPath(), mount_point)) {
+        // A plain prefix, without regard to components, is what callers rely on. A folder whose
+        // share is gone is on no volume.
+        const std::string* full_path = folder_mgr.FindFullPath(*folder);
+        if (full_path != nullptr && StringStartWith(*full_path, mount_point)) {
             folder->SetPaused(paused);
             shares.insert(folder->GetShare());
         }
@@ -53,7 +55,7 @@ void SaveAfterClear(const FolderMgr& folder_mgr) {
 
 bool IsToBeCleaned(const Folder& folder, const std::string& mount_point) {
     if (log_level == kLogLevelDebug) {
-        LogTrace({"index_mgr", __LINE__}, "Examine path=%s, paused=%d, volume_to_be_clean=%s",
+        LogTrace(unit::kShareOperations.Here(), "Examine path=%s, paused=%d, volume_to_be_clean=%s",
                  folder.GetPath().c_str(), folder.GetPaused() ? 1 : 0,
                  folder.GetVolumeToBeClean().c_str());
     }

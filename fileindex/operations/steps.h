@@ -2,11 +2,26 @@
 
 #include <json/json.h>
 
+#include <set>
 #include <string>
+#include <vector>
+
+#include "common/log.h"
 
 /// The steps that the management operations share. None takes a lock. They throw Error 502 when
 /// the indexing daemon or the file monitor fails, and what SDKShare throws for a share.
 namespace quivra::fileindex {
+
+/// All operations log under one given name; each source has a thousand of its own.
+namespace unit {
+
+inline constexpr LogUnit kFolderOperations{"index_mgr", 0};
+inline constexpr LogUnit kCustomEvent{"index_mgr", 1000};
+inline constexpr LogUnit kServices{"index_mgr", 2000};
+inline constexpr LogUnit kShareOperations{"index_mgr", 3000};
+inline constexpr LogUnit kSteps{"index_mgr", 4000};
+
+}  // namespace unit
 
 /// Tells the indexing daemon that a share's folders changed, or that it is to start or drop the
 /// share's worker.
@@ -34,9 +49,16 @@ void RequireArgument(const std::string& argument, const char* condition, const c
 /// Starts or stops the services that indexing needs; what fails is logged.
 void SwitchServices(bool enable);
 
-/// AddCustomEvent that tells whether the event is queued, or covered by a queued reindex; else the
-/// share has been flagged.
-bool QueueCustomEvent(int event, const std::string& path, const std::string& path_old,
-                      const Json::Value& data);
+/// What AddCustomEvent takes.
+struct CustomEvent {
+    int event = 0;
+    std::string path;
+    std::string path_old;
+    Json::Value data;
+};
+
+/// AddCustomEvent for several events, in their order; each share's queue is read and locked once.
+/// Returns the paths of the events that are neither queued nor covered by a queued reindex.
+std::set<std::string> QueueCustomEvents(const std::vector<CustomEvent>& events);
 
 }  // namespace quivra::fileindex

@@ -4,7 +4,7 @@
 #include "common/log.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/index_mgr.h"
-#include "fileindex/index_steps.h"
+#include "fileindex/operations/steps.h"
 
 namespace quivra::fileindex {
 namespace {
@@ -18,14 +18,14 @@ bool LogPlatformFailure(const char* call, int result) {
     if (result >= 0) {
         return true;
     }
-    LogError({"index_mgr", __LINE__}, "%s failed: err=[0x%04X %s:%d]", call,
+    LogError(unit::kServices.Here(), "%s failed: err=[0x%04X %s:%d]", call,
              static_cast<unsigned int>(KLIBCErrGet()), KLIBCErrorGetFile(), KLIBCErrorGetLine());
     return false;
 }
 
 void LogServiceFailure(const char* condition, int result) {
     if (result < 0) {
-        LogError({"index_mgr", __LINE__}, "Failed [%s]", condition);
+        LogError(unit::kServices.Here(), "Failed [%s]", condition);
     }
 }
 

@@ -1,4 +1,4 @@
-#include "fileindex/index_steps.h"
+#include "fileindex/operations/steps.h"
 
 #include <array>
 
@@ -6,6 +6,7 @@
 #include <kesto/monitor_queue.h>
 #include <kesto/process.h>
 
+#include "base/queue_file.h"
 #include "common/error.h"
 #include "common/log.h"
 #include "common/mutex.h"
@@ -52,7 +53,7 @@ Json::Value DescribeMonitorQueue(const std::string& share) {
 void RemoveTree(const std::string& path) {
     const char* const arguments[] = {"-rf", path.c_str(), nullptr};
     if (KLIBCExec("/bin/rm", arguments) != 0) {
-        LogError({"index_mgr", __LINE__}, "Failed to remove %s", path.c_str());
+        LogError(unit::kSteps.Here(), "Failed to remove %s", path.c_str());
     }
 }
 
@@ -60,7 +61,7 @@ std::string ComposeDBPath(const std::string& share_path) {
     std::array<char, kPathSize> path{};
     const LockMutex lock(sdk::SDKMutex());
     if (FILEIDXDBPathCompose(share_path.c_str(), path.data(), path.size()) < 0) {
-        Fail({"index_mgr", __LINE__},
+        Fail(unit::kSteps.Here(),
              "0 > FILEIDXDBPathCompose(share_path.c_str(), path, sizeof(path))",
              Error(Error::kSystemCallFailed,
                    "FILEIDXDBPathCompose failed, share_path=" + share_path));
@@ -72,7 +73,7 @@ std::string ComposeDBPath(const std::string& share_path) {
 
 void RequireArgument(const std::string& argument, const char* condition, const char* reason) {
     if (argument.empty()) {
-        Fail({"index_mgr", __LINE__}, condition, Error(Error::kBadArgument, reason));
+        Fail(unit::kSteps.Here(), condition, Error(Error::kBadArgument, reason));
     }
 }
 
@@ -94,7 +95,7 @@ void DeleteWorker(const std::string& share) {
 void UpsertMonitorQueue(const std::string& share) {
     const MonitorQueue monitor_queue(DescribeMonitorQueue(share));
     if (!MonitorQueue::Upsert(monitor_queue, kAppName, MONITOR_QUEUE_TYPE_APPLICATION)) {
-        Fail({"index_mgr", __LINE__},
+        Fail(unit::kSteps.Here(),
              "!MonitorQueue::Upsert(monitor_queue, kAppName, MONITOR_QUEUE_TYPE_APPLICATION)",
              Error(Error::kSystemCallFailed, "MonitorQueue::Upsert failed, share=" + share));
     }
@@ -106,7 +107,7 @@ void DeleteMonitorQueue(const std::string& share) {
 
 void DeleteMonitorQueue(const std::string& share, const std::string& queue_path) {
     if (!MonitorQueue::Delete(queue_path, kAppName, MONITOR_QUEUE_TYPE_APPLICATION)) {
-        Fail({"index_mgr", __LINE__},
+        Fail(unit::kSteps.Here(),
              "!MonitorQueue::Delete(share.GetQueuePath(), kAppName, "
              "MONITOR_QUEUE_TYPE_APPLICATION)",
              Error(Error::kSystemCallFailed, "MonitorQueue::Delete failed, share=" + share));
@@ -117,7 +118,7 @@ std::string ComposeQueuePath(const std::string& share_path) {
     std::array<char, kPathSize> path{};
     const LockMutex lock(sdk::SDKMutex());
     if (FILEIDXQueuePathCompose(share_path.c_str(), path.data(), path.size()) < 0) {
-        Fail({"index_mgr", __LINE__},
+        Fail(unit::kSteps.Here(),
              "0 > FILEIDXQueuePathCompose(share_path.c_str(), path, sizeof(path))",
              Error(Error::kSystemCallFailed,
                    "FILEIDXQueuePathCompose failed, share_path=" + share_path));
@@ -128,7 +129,7 @@ std::string ComposeQueuePath(const std::string& share_path) {
 void RemoveShareIndexData(const std::string& share, const std::string& share_path) {
     const std::string queue_path = ComposeQueuePath(share_path);
     RemoveTree(queue_path);
-    RemoveTree(queue_path + ".tmp");
+    RemoveTree(base::WorkingCopy(queue_path));
     RemoveTree(ComposeDBPath(share_path));
     StatusMgr().ClearShareStatus(share);
 }

@@ -1,3 +1,4 @@
+#include <map>
 #include <memory>
 #include <set>
 #include <string>
@@ -10,8 +11,9 @@
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/event.h"
 #include "fileindex/folder_mgr.h"
+#include "fileindex/folder_status.h"
 #include "fileindex/index_mgr.h"
-#include "fileindex/index_steps.h"
+#include "fileindex/operations/steps.h"
 #include "fileindex/status_mgr.h"
 #include "fileindex/util.h"
 #include "sdk/share.h"
@@ -29,14 +31,14 @@ struct Changes {
 
 void RequireArray(const Json::Value& list, const char* condition) {
     if (!list.isArray()) {
-        Fail({"index_mgr", __LINE__}, condition,
+        Fail(unit::kFolderOperations.Here(), condition,
              Error(Error::kBadArgument, "Not an array" + AppendData(list)));
     }
 }
 
 std::string RequireString(const Json::Value& it) {
     if (!it.isString()) {
-        Fail({"index_mgr", __LINE__}, "!it.isString()",
+        Fail(unit::kFolderOperations.Here(), "!it.isString()",
              Error(Error::kBadArgument, "Not a string" + AppendData(it)));
     }
     return it.asString();
@@ -44,7 +46,8 @@ std::string RequireString(const Json::Value& it) {
 
 void RequireIndexable(const Folder& folder, bool updater_mode) {
     if (!CanPathBeIndexed(folder.GetPath()) && !updater_mode) {
-        Fail({"index_mgr", __LINE__}, "!CanPathBeIndexed(folder_new->GetPath()) && !updater_mode",
+        Fail(unit::kFolderOperations.Here(),
+             "!CanPathBeIndexed(folder_new->GetPath()) && !updater_mode",
              Error(Error::kPathNotIndexable, "Path cannot index: " + folder.GetPath()));
     }
 }
@@ -52,7 +55,7 @@ void RequireIndexable(const Folder& folder, bool updater_mode) {
 void RequireSpace(const std::string& share_name) {
     const sdk::SDKShare share(share_name);
     if (!share.IsSpaceEnough()) {
-        Fail({"index_mgr", __LINE__}, "!share.IsSpaceEnough()",
+        Fail(unit::kFolderOperations.Here(), "!share.IsSpaceEnough()",
              Error(Error::kSpaceNotEnough, "Share (" + share_name + ") space not enough"));
     }
 }
@@ -62,21 +65,24 @@ void UpsertFolder(FolderMgr& folder_mgr, Changes& changes, const Json::Value& el
     const auto folder_new = std::make_shared<Folder>(element);
     RequireIndexable(*folder_new, updater_mode);
     if (create && folder_mgr.HasFolder(folder_new->GetPath())) {
-        Fail({"index_mgr", __LINE__}, "create && folder_mgr.HasFolder(folder_new->GetPath())",
+        Fail(unit::kFolderOperations.Here(),
+             "create && folder_mgr.HasFolder(folder_new->GetPath())",
              Error(Error::kDuplicateFolder, "Duplicated ID: " + folder_new->GetPath()));
     }
     folder_mgr.Upsert(changes.diffs.emplace_back(), folder_new);
-    RequireSpace(folder_new->GetShare());
-    changes.shares.insert(folder_new->GetShare());
+    if (!changes.shares.contains(folder_new->GetShare())) {
+        RequireSpace(folder_new->GetShare());
+        changes.shares.insert(folder_new->GetShare());
+    }
 }
 
 bool HasChangedContent(const Folder& diff) {
     return diff.GetDocument() || diff.GetAudio() || diff.GetVideo() || diff.GetPhoto();
 }
 
-/// Queues the content that a change adds or drops.
-void QueueConfigEvent(const Folder& diff) {
-    AddCustomEvent(EVENT_UPDATE_CFG, diff.GetFullPath(), "", diff.GetIndexCfg());
+/// The content that a change adds or drops.
+CustomEvent ConfigEvent(const Folder& diff) {
+    return {EVENT_UPDATE_CFG, diff.GetFullPath(), "", diff.GetIndexCfg()};
 }
 
 void UpsertFolders(const Json::Value& folder_list, bool create, bool updater_mode) {
@@ -97,11 +103,30 @@ void UpsertFolders(const Json::Value& folder_list, bool create, bool updater_mod
         NotifySettingChanged(share, true);
         UpsertMonitorQueue(share);
     }
+    std::vector<CustomEvent> events;
     for (const FolderPtr& diff : changes.diffs) {
         if (HasChangedContent(*diff)) {
-            QueueConfigEvent(*diff);
+            events.push_back(ConfigEvent(*diff));
         }
     }
+    QueueCustomEvents(events);
+}
+
+struct Reindexes {
+    std::vector<CustomEvent> events;
+    std::map<std::string, std::string> shares;  // by the full path of an event
+};
+
+void AddReindex(Reindexes& reindexes, const std::string& path, const FolderMgr& folder_mgr) {
+    std::string share_name;
+    GetShareNameByPath(share_name, path);
+    if (!folder_mgr.IsShareIndexed(share_name)) {
+        return;
+    }
+    std::string full_path;
+    GetFullPath(full_path, path);
+    reindexes.events.push_back({EVENT_REINDEX, full_path, "", Json::Value()});
+    reindexes.shares.emplace(full_path, share_name);
 }
 
 /// A share without folders left: its index and data go.
@@ -135,11 +160,13 @@ void FolderDelete(const Json::Value& path_list) {
         changes.shares.insert(share_name);
     }
     folder_mgr.Save();
+    std::vector<CustomEvent> events;
     for (const FolderPtr& diff : changes.diffs) {
         // Also when an enclosing folder has the same switches: it does not index all that a folder
         // of its own does (see updater_mode).
-        QueueConfigEvent(*diff);
+        events.push_back(ConfigEvent(*diff));
     }
+    QueueCustomEvents(events);
     for (const std::string& share : changes.shares) {
         NotifySettingChanged(share, false);
         if (folder_mgr.IsShareIndexed(share)) {
@@ -162,8 +189,13 @@ void FolderList(Json::Value& result, unsigned int offset, unsigned int limit,
     folder_mgr.List(page, total, offset, limit, sort_by, sort_direction);
     Json::Value list;
     list["folder"] = Json::Value(Json::arrayValue);
+    std::vector<const Folder*> folders;
     for (const FolderPtr& folder : page) {
-        list["folder"].append(folder->GetDataWithAdditional(additional));
+        folders.push_back(folder.get());
+    }
+    FolderStatus status(folders);
+    for (const Folder* folder : folders) {
+        list["folder"].append(status.DataWithAdditional(*folder, additional));
     }
     list["total"] = total;
     list["offset"] = offset;
@@ -178,31 +210,28 @@ void FolderGet(Json::Value& result, const std::string& path) {
 }
 
 void FolderReindex(const Json::Value& path_list) {
-    const StatusMgr status_mgr;
+    StatusMgr status_mgr;
     const FolderMgr folder_mgr;
     RequireArray(path_list, "!path_list.isArray()");
+    Reindexes reindexes;
+    try {
+        for (const Json::Value& it : path_list) {
+            AddReindex(reindexes, RequireString(it), folder_mgr);
+        }
+    } catch (const Error&) {
+        QueueCustomEvents(reindexes.events);  // what was asked for before the mistake
+        throw;
+    }
     std::set<std::string> shares;
-    std::set<std::string> unqueued;  // these keep their flag
-    for (const Json::Value& it : path_list) {
-        const std::string path = RequireString(it);
-        std::string share_name;
-        GetShareNameByPath(share_name, path);
-        if (!folder_mgr.IsShareIndexed(share_name)) {
-            continue;
-        }
-        std::string full_path;
-        GetFullPath(full_path, path);
-        if (QueueCustomEvent(EVENT_REINDEX, full_path, "", Json::Value())) {
-            shares.insert(share_name);
-        } else {
-            unqueued.insert(share_name);
-        }
+    for (const auto& [full_path, share] : reindexes.shares) {
+        shares.insert(share);
+    }
+    for (const std::string& full_path : QueueCustomEvents(reindexes.events)) {
+        shares.erase(reindexes.shares.at(full_path));  // the need for a reindex has not ended
     }
     for (const std::string& share : shares) {
-        // A fresh store for each change: events that failed have set flags meanwhile.
-        if (!unqueued.contains(share) &&
-            (status_mgr.GetShareStatus(share) & kShareNeedReindex) != 0) {
-            StatusMgr().UnsetShareStatus(share, kShareNeedReindex);
+        if ((status_mgr.GetShareStatus(share) & kShareNeedReindex) != 0) {
+            status_mgr.UnsetShareStatus(share, kShareNeedReindex);
         }
     }
 }
