@@ -24,10 +24,10 @@ class QUIVRA_EXPORT Error : public std::runtime_error {
         kDuplicateFolder = 901,     ///< an indexed folder with that path already exists
         kNoSuchFolder = 902,        ///< the requested indexed folder does not exist
         kPathNotIndexable = 903,    ///< the path may not be indexed
-        kMalformedEvent = 906,      ///< a change-queue line is no JSON
+        kMalformedEvent = 906,      ///< a change-queue line is not JSON
         kChannelFailed = 913,       ///< the channel to the search daemon failed
         kParseFailed = 914,         ///< the content extraction of a file failed
-        kQueryWithoutData = 916,    ///< a search-daemon query was answered without a data array
+        kQueryWithoutData = 916,    ///< a search-daemon query came back without a data array
         kSpaceNotEnough = 1003,     ///< the share's volume has no room for index work
         kDaemonOutOfMemory = 1400,  ///< the search daemon is short of memory: retried
         kDaemonBusy = 1401,         ///< the search daemon moves or compacts the index: retried

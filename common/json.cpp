@@ -185,7 +185,7 @@ bool toFile(const Json::Value& value, const std::string& path) {
         base::ReplaceFile(path, toString(value), ModeForReplacement(path));
     if (replaced == base::Replaced::kNotSure) {
         // Who calls would take the change back; but every reader sees it already.
-        LogError(LogSite(), "%s is saved, but may be lost in a power failure", path.c_str());
+        LogError(LogSite::Here(), "%s is saved, but may be lost in a power failure", path.c_str());
     }
     return replaced != base::Replaced::kNo;
 }

@@ -1,7 +1,6 @@
 #pragma once
 
 #include <cstdint>
-#include <source_location>
 #include <string>
 
 #include "common/error.h"
@@ -26,18 +25,18 @@ inline constexpr std::int32_t kLogLevelDebug = 7;
 /// Where a log line comes from, "UNIT:LINE": a mark that leads to one place. Support tools search
 /// for some of them; those are written out and keep their number when the code around them moves.
 struct LogSite {
-    /// The source file and line of the call itself: LogError(LogSite(), ...).
-    constexpr LogSite(std::source_location here = std::source_location::current())
-        : unit(here.file_name()), line(static_cast<int>(here.line())) {
-        for (const char* c = unit; *c != '\0'; ++c) {
-            unit = *c == '/' ? c + 1 : unit;
-        }
-    }
-    constexpr LogSite(const char* given_unit, int given_line)
-        : unit(given_unit), line(given_line) {}
-
     const char* unit;
     int line;
+
+    /// The source file and line of the call itself: LogError(LogSite::Here(), ...).
+    static constexpr LogSite Here(const char* file = __builtin_FILE(),
+                                  int line = __builtin_LINE()) {
+        const char* name = file;
+        for (; *file != '\0'; ++file) {
+            name = *file == '/' ? file + 1 : name;
+        }
+        return {name, line};
+    }
 };
 
 /// The name under which a source file logs where the file's own name will not do, because tools
@@ -47,9 +46,7 @@ struct LogUnit {
     const char* name;
     int base;  ///< is added to the number of the line
 
-    constexpr LogSite Here(std::source_location here = std::source_location::current()) const {
-        return {name, base + static_cast<int>(here.line())};
-    }
+    constexpr LogSite Here(int line = __builtin_LINE()) const { return {name, base + line}; }
 };
 
 /// Writes "UNIT:LINE (PID, EUID) TEXT" to the system log at error priority, TEXT being made as by

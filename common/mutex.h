@@ -14,7 +14,7 @@ class QUIVRA_EXPORT Mutex {
     Mutex(const Mutex&) = delete;
     Mutex& operator=(const Mutex&) = delete;
 
-    /// Each answers whether the underlying call succeeded.
+    /// Each returns whether the underlying call succeeded.
     bool Lock();
     bool TryLock();
     bool Unlock();

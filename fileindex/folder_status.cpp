@@ -12,7 +12,7 @@
 namespace quivra::fileindex {
 namespace {
 
-/// The unit of Folder, whose answers these are. Below 1000 are marks that support tools know.
+/// The unit of Folder, on whose behalf this speaks. Below 1000 are marks that support tools know.
 constexpr LogUnit kLog{"folder.cpp", 1000};
 
 /// What lies in no share cannot be indexed either.

@@ -25,18 +25,20 @@ inline constexpr const char* kAppName = "fileindex";
 /// changed is queued. `updater_mode` accepts paths that may not be indexed. Both hold the folder
 /// lock throughout.
 ///
-/// Error 120: no array, or a malformed element; 903: the path may not be indexed; 901 (FolderAdd):
-/// exists already; 900: more than 1000 folders; 1003: no space left on the share's volume. In all
-/// these cases nothing has changed. A failure after the save (of a daemon, 502 of the file monitor)
-/// leaves the set saved and the rest undone: delete the folders and add them again.
+/// Error 120: not an array, or a malformed element; 903: the path may not be indexed; 901
+/// (FolderAdd): exists already; 900: more than 1000 folders; 1003: no space left on the share's
+/// volume. In all these cases nothing has changed. A failure after the save (of a daemon, 502 of
+/// the file monitor) leaves the set saved and the rest undone: delete the folders and add them
+/// again.
 QUIVRA_EXPORT void FolderAdd(const Json::Value& folder_list, bool updater_mode);
 QUIVRA_EXPORT void FolderSet(const Json::Value& folder_list, bool updater_mode);
 
 /// Removes the folders with these share paths (an array of strings) and queues the removal of
 /// their content. A share without folders left loses its index, its queue and its registration; a
-/// set without folders left stops the services. Holds the folder lock. Error 120: no array, or an
-/// element that is no string; 902: no such folder. In these cases nothing has changed. A failure
-/// after the save leaves the set saved; ShareClearPaused then drops what is left of a share.
+/// set without folders left stops the services. Holds the folder lock. Error 120: not an array,
+/// or an element that is not a string; 902: no such folder. In these cases nothing has changed. A
+/// failure after the save leaves the set saved; ShareClearPaused then drops what is left of a
+/// share.
 QUIVRA_EXPORT void FolderDelete(const Json::Value& path_list);
 
 /// One page of the folders: {"folder": [Folder::GetDataWithAdditional...], "total": number of all
@@ -50,8 +52,8 @@ QUIVRA_EXPORT void FolderList(Json::Value& result, unsigned int offset, unsigned
 QUIVRA_EXPORT void FolderGet(Json::Value& result, const std::string& path);
 
 /// Queues a reindex of each share path in the array and ends the need for one that a share may be
-/// flagged with. Paths in shares that no folder indexes are passed over. Error 120: no array, or
-/// an element that is no string; those before it are queued then.
+/// flagged with. Paths in shares that no folder indexes are passed over. Error 120: not an
+/// array, or an element that is not a string; those before it are queued then.
 QUIVRA_EXPORT void FolderReindex(const Json::Value& path_list);
 
 // --- Shares and volumes --------------------------------------------------------------------------

@@ -17,6 +17,10 @@ constexpr LogUnit kLog{"queue_mgr", 2000};
 
 bool HasEvent(const std::string& path, const std::function<bool(const Event&)>& predicate) {
     const QueueDirectory directory(path);
+    if (!directory.IsValid() && !directory.IsMissing()) {
+        Fail(kLog.Here(), "!input_stream",
+             Error(Error::kSystemCallFailed, "Failed to open queue, reason=" + directory.Reason()));
+    }
     if (!directory.HasFile(directory.QueueName())) {
         return false;
     }

@@ -10,8 +10,8 @@
 
 /// What waits in a share's queue and in its working copy. All read the queue first, then the copy,
 /// without the lock: what is appended meanwhile may be missed. Error 502 when a file cannot be
-/// read, and the error of the first malformed line, unless the answer was found before it: a bad
-/// line is no reason to believe that nothing is pending.
+/// read, and the error of the first malformed line, unless the question was settled before it: a
+/// bad line must not pass for a queue without work.
 namespace quivra::fileindex {
 
 /// Whether an event satisfies the predicate. A missing file holds none.

@@ -27,10 +27,15 @@ QueueDirectory::QueueDirectory(const std::string& queue_path)
     } else {
         plain_.Reset(open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
     }
+    error_ = IsValid() ? 0 : errno;
+}
+
+bool QueueDirectory::IsMissing() const {
+    return private_.Problem().empty() && (error_ == ENOENT || error_ == ENOTDIR);
 }
 
 std::string QueueDirectory::Reason() const {
-    return private_.Problem().empty() ? SystemErrorText(errno) : private_.Problem();
+    return private_.Problem().empty() ? SystemErrorText(error_) : private_.Problem();
 }
 
 bool QueueDirectory::HasFile(const std::string& name) const {

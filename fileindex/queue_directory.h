@@ -19,8 +19,10 @@ class QueueDirectory {
     /// What the names of files are relative to.
     int Fd() const { return private_.IsValid() ? private_.Fd() : plain_.Get(); }
 
-    /// Why it is not valid, to be called before errno changes: what stands in the way, as a
-    /// sentence, or the text of errno.
+    /// Whether it is not valid because there is none, so that nothing can wait in it.
+    bool IsMissing() const;
+
+    /// Why it is not valid: what stands in the way, as a sentence, or the text of errno.
     std::string Reason() const;
 
     const std::string& QueueName() const { return queue_name_; }
@@ -36,6 +38,7 @@ class QueueDirectory {
   private:
     base::PrivateDirectory private_;
     base::UniqueFd plain_;
+    int error_ = 0;  // errno of a failed opening
     std::string queue_name_;
     std::string copy_name_;
 };

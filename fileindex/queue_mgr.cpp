@@ -21,12 +21,14 @@ namespace {
 /// Below 1000 are marks that support tools know.
 constexpr LogUnit kLog{"queue_mgr", 1000};
 
-[[noreturn]] void FailLock(const std::string& reason) {
-    Fail(kLog.Here(), "!directory.IsValid()",
-         Error(Error::kLockFailed, "open failed, reason=" + reason));
+/// Throws where something else than the share's own directory holds the queue, or nothing can be
+/// told. The lock could not be had either, so the error is its.
+void RequireUsable(const QueueDirectory& directory) {
+    QUIVRA_FAIL_IF(kLog, !directory.IsValid() && !directory.IsMissing(),
+                   Error(Error::kLockFailed, "open failed, reason=" + directory.Reason()));
 }
 
-/// Whether `path` is `top` or below it. Nothing lies below "/" here: it is no share's path.
+/// Whether `path` is `top` or below it. Nothing lies below "/" here: no share has that path.
 bool IsTouched(const std::string& path, const std::string& top) {
     return top == "/" ? path == top : base::IsAtOrBelow(path, top);
 }
@@ -38,9 +40,7 @@ QueueMgr::QueueMgr(const std::string& queue_path)
 
 void QueueMgr::PrepareTmpQueue() {
     const QueueDirectory directory(queue_path_);
-    if (!directory.IsValid() && errno != ENOENT) {
-        FailLock(directory.Reason());
-    }
+    RequireUsable(directory);
     if (!directory.HasFile(directory.QueueName())) {
         return;
     }
@@ -69,9 +69,8 @@ void QueueMgr::AppendAll(const std::vector<Json::Value>& events) const {
         lines += toString(event) + "\n";
     }
     const QueueDirectory directory(queue_path_);
-    if (!directory.IsValid()) {
-        FailLock(directory.Reason());
-    }
+    QUIVRA_FAIL_IF(kLog, !directory.IsValid(),
+                   Error(Error::kLockFailed, "open failed, reason=" + directory.Reason()));
     const LockFile lock(directory.Fd(), directory.QueueName(), true, base::kQueueMode);
     if (base::AppendLines(lock.Fd(), lines) != lines.size()) {
         const std::string reason = "Failed to write queue, reason=" + SystemErrorText(errno);
@@ -97,6 +96,7 @@ int QueueMgr::ProcessOP(const std::function<void(std::shared_ptr<OP>)>& fn, bool
         PrepareTmpQueue();
     }
     const QueueDirectory directory(queue_path_);
+    RequireUsable(directory);
     if (!directory.HasFile(use_tmp ? directory.CopyName() : directory.QueueName())) {
         return 0;
     }

@@ -35,10 +35,8 @@ Mutex& SDKMutex() {
 SDKCredentials::SDKCredentials() : euid_(geteuid()), egid_(getegid()) {
     const LockMutex lock(SDKMutex());
     KESTOUser* user_info = nullptr;
-    if (0 > KESTOUserGetByUID(euid_, &user_info) || !user_info) {
-        Fail(kLog.Here(), "0 > KESTOUserGetByUID(euid_, &user_info) || !user_info",
-             Error(Error::kCredentialsFailed, LookupFailedReason(KLIBCErrGet())));
-    }
+    QUIVRA_FAIL_IF(kLog, 0 > KESTOUserGetByUID(euid_, &user_info) || !user_info,
+                   Error(Error::kCredentialsFailed, LookupFailedReason(KLIBCErrGet())));
     const std::unique_ptr<KESTOUser, void (*)(KESTOUser*)> owner(user_info, KESTOUserFree);
     username_ = user_info->szName;
 }

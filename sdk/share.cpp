@@ -23,18 +23,12 @@ constexpr unsigned long long kSpaceNeeded = 100ULL << 20;
 /// Shares that are never indexed, whatever their flags.
 constexpr std::array<const char*, 2> kExcludedShares{"surveillance", "NetBackup"};
 
-[[noreturn]] void FailCall(LogSite site, const char* condition, const std::string& reason) {
-    Fail(site, condition, Error(Error::kSystemCallFailed, reason));
-}
-
 }  // namespace
 
 SDKShare::SDKShare(const std::string& share_name) : share_name_(share_name) {
     const LockMutex lock(SDKMutex());
-    if (0 > KESTOShareGet(share_name.c_str(), &share_info_) || !share_info_) {
-        Fail(kLog.Here(), "0 > KESTOShareGet(share_name.c_str(), &share_info_) || !share_info_",
-             Error(Error::kNoSuchShare, share_name));
-    }
+    QUIVRA_FAIL_IF(kLog, 0 > KESTOShareGet(share_name.c_str(), &share_info_) || !share_info_,
+                   Error(Error::kNoSuchShare, share_name));
 }
 
 SDKShare::~SDKShare() {
@@ -71,41 +65,36 @@ int SDKShare::GetPrivilege(const std::string& user) const {
 bool SDKShare::IsEncryption() const {
     int is_encryption = 0;
     const LockMutex lock(SDKMutex());
-    if (0 > KLIBShareIsEncryptionGet(share_info_, &is_encryption)) {
-        FailCall(kLog.Here(), "0 > KLIBShareIsEncryptionGet(share_info_, &is_encryption)",
-                 "KLIBShareIsEncryptionGet failed, share=" + share_name_);
-    }
+    QUIVRA_FAIL_IF(
+        kLog, 0 > KLIBShareIsEncryptionGet(share_info_, &is_encryption),
+        Error(Error::kSystemCallFailed, "KLIBShareIsEncryptionGet failed, share=" + share_name_));
     return is_encryption != 0;
 }
 
 bool SDKShare::IsEnableRecycleBin() const {
     int is_enabled = 0;
     const LockMutex lock(SDKMutex());
-    if (0 > KLIBShareRecycleStatusGet(share_info_, &is_enabled)) {
-        FailCall(kLog.Here(), "0 > KLIBShareRecycleStatusGet(share_info_, &is_enabled)",
-                 "KLIBShareRecycleStatusGet failed, share=" + share_name_);
-    }
+    QUIVRA_FAIL_IF(
+        kLog, 0 > KLIBShareRecycleStatusGet(share_info_, &is_enabled),
+        Error(Error::kSystemCallFailed, "KLIBShareRecycleStatusGet failed, share=" + share_name_));
     return is_enabled != 0;
 }
 
 std::string SDKShare::GetQueuePath() const {
     char path[4096] = "";
     const LockMutex lock(SDKMutex());
-    if (0 > FILEIDXQueuePathCompose(share_info_->szPath, path, sizeof(path))) {
-        FailCall(kLog.Here(),
-                 "0 > FILEIDXQueuePathCompose(share_info_->szPath, path, sizeof(path))",
-                 "FILEIDXQueuePathCompose failed, share=" + share_name_);
-    }
+    QUIVRA_FAIL_IF(
+        kLog, 0 > FILEIDXQueuePathCompose(share_info_->szPath, path, sizeof(path)),
+        Error(Error::kSystemCallFailed, "FILEIDXQueuePathCompose failed, share=" + share_name_));
     return path;
 }
 
 std::string SDKShare::GetDBPath() const {
     char path[4096] = "";
     const LockMutex lock(SDKMutex());
-    if (0 > FILEIDXDBPathCompose(share_info_->szPath, path, sizeof(path))) {
-        FailCall(kLog.Here(), "0 > FILEIDXDBPathCompose(share_info_->szPath, path, sizeof(path))",
-                 "FILEIDXDBPathCompose failed, share=" + share_name_);
-    }
+    QUIVRA_FAIL_IF(
+        kLog, 0 > FILEIDXDBPathCompose(share_info_->szPath, path, sizeof(path)),
+        Error(Error::kSystemCallFailed, "FILEIDXDBPathCompose failed, share=" + share_name_));
     return path;
 }
 
@@ -118,14 +107,12 @@ bool SDKShare::CanBeIndexed() const {
         return false;
     }
     // The reasons' odd spelling is what support tools look for.
-    if (0 > KLIBShareIsEncryptedGet(share_info_, &is_encrypted)) {
-        FailCall(kLog.Here(), "0 > KLIBShareIsEncryptedGet(share_info_, &is_encrypted)",
-                 "KLIBShareis_encryptedGet failed, share=" + share_name_);
-    }
-    if (0 > KLIBShareIsReadOnlyGet(share_info_, &is_readonly)) {
-        FailCall(kLog.Here(), "0 > KLIBShareIsReadOnlyGet(share_info_, &is_readonly)",
-                 "KLIBShareis_readonlyGet failed, share=" + share_name_);
-    }
+    QUIVRA_FAIL_IF(
+        kLog, 0 > KLIBShareIsEncryptedGet(share_info_, &is_encrypted),
+        Error(Error::kSystemCallFailed, "KLIBShareis_encryptedGet failed, share=" + share_name_));
+    QUIVRA_FAIL_IF(
+        kLog, 0 > KLIBShareIsReadOnlyGet(share_info_, &is_readonly),
+        Error(Error::kSystemCallFailed, "KLIBShareis_readonlyGet failed, share=" + share_name_));
     return is_encrypted == 0 && is_readonly == 0;
 }
 

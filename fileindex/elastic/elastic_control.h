@@ -15,7 +15,7 @@
 /// any thread. All but IndexQuery wait, for as long as it takes, while the daemon is busy (codes
 /// 1400 and 1401): they sleep 15 to 19 minutes and send the request again; after the tenth repeat
 /// administrators are notified once per call. All throw quivra::Error:
-///   913   the daemon cannot be reached, or its reply is cut off or no reply at all
+///   913   the daemon cannot be reached, or its reply is cut off or missing
 ///   120   the daemon refused the request, but its error object is malformed
 ///   any   the daemon's own code, "Request failed, msg=" and its message
 /// Changes of documents become visible to queries, and durable, with IndexCommit.
@@ -49,7 +49,7 @@ QUIVRA_EXPORT void ShareIndexRename(const std::string& share_from, const std::st
 /// Moves the share's index to `db_path`.
 QUIVRA_EXPORT void ShareIndexMigrate(const std::string& share, const std::string& db_path);
 
-/// Removes one document; one that is not there is no error.
+/// Removes one document; one that is not there is not an error.
 QUIVRA_EXPORT void IndexDel(const std::string& share, const std::string& full_path);
 
 /// Removes every document below the directory. The directory's own document stays.

@@ -35,10 +35,7 @@ bool ParseReply(Json::Value& response, const std::string& text) {
 
 void Exchange(Json::Value& response, const Json::Value& request) {
     kestodaemon::DomainSockConnection conn(kSearchDaemonSocketPath);
-    if (!conn.Connect()) {
-        Fail(unit::kRequest.Here(), "!conn.Connect()",
-             Error(Error::kChannelFailed, "Connect failed"));
-    }
+    QUIVRA_FAIL_IF(unit::kRequest, !conn.Connect(), Error(Error::kChannelFailed, "Connect failed"));
     if (!conn.Send(toString(request))) {
         Fail(unit::kRequest.Here(), "!conn.Send(req.toString())",
              Error(Error::kChannelFailed, "Send failed"));

@@ -29,51 +29,24 @@ struct Changes {
     std::set<std::string> shares;
 };
 
-void RequireArray(const Json::Value& list, const char* condition) {
-    if (!list.isArray()) {
-        Fail(unit::kFolderOperations.Here(), condition,
-             Error(Error::kBadArgument, "Not an array" + AppendData(list)));
-    }
-}
-
-std::string RequireString(const Json::Value& it) {
-    if (!it.isString()) {
-        Fail(unit::kFolderOperations.Here(), "!it.isString()",
-             Error(Error::kBadArgument, "Not a string" + AppendData(it)));
-    }
-    return it.asString();
-}
-
-void RequireIndexable(const Folder& folder, bool updater_mode) {
-    if (!CanPathBeIndexed(folder.GetPath()) && !updater_mode) {
-        Fail(unit::kFolderOperations.Here(),
-             "!CanPathBeIndexed(folder_new->GetPath()) && !updater_mode",
-             Error(Error::kPathNotIndexable, "Path cannot index: " + folder.GetPath()));
-    }
-}
-
-void RequireSpace(const std::string& share_name) {
-    const sdk::SDKShare share(share_name);
-    if (!share.IsSpaceEnough()) {
-        Fail(unit::kFolderOperations.Here(), "!share.IsSpaceEnough()",
-             Error(Error::kSpaceNotEnough, "Share (" + share_name + ") space not enough"));
-    }
-}
-
+/// Makes one element of a request part of the set.
 void UpsertFolder(FolderMgr& folder_mgr, Changes& changes, const Json::Value& element, bool create,
                   bool updater_mode) {
     const auto folder_new = std::make_shared<Folder>(element);
-    RequireIndexable(*folder_new, updater_mode);
-    if (create && folder_mgr.HasFolder(folder_new->GetPath())) {
-        Fail(unit::kFolderOperations.Here(),
-             "create && folder_mgr.HasFolder(folder_new->GetPath())",
-             Error(Error::kDuplicateFolder, "Duplicated ID: " + folder_new->GetPath()));
-    }
+    QUIVRA_FAIL_IF(unit::kFolderOperations,
+                   !CanPathBeIndexed(folder_new->GetPath()) && !updater_mode,
+                   Error(Error::kPathNotIndexable, "Path cannot index: " + folder_new->GetPath()));
+    QUIVRA_FAIL_IF(unit::kFolderOperations, create && folder_mgr.HasFolder(folder_new->GetPath()),
+                   Error(Error::kDuplicateFolder, "Duplicated ID: " + folder_new->GetPath()));
     folder_mgr.Upsert(changes.diffs.emplace_back(), folder_new);
-    if (!changes.shares.contains(folder_new->GetShare())) {
-        RequireSpace(folder_new->GetShare());
-        changes.shares.insert(folder_new->GetShare());
+    if (changes.shares.contains(folder_new->GetShare())) {
+        return;  // one look at its space serves all its folders
     }
+    const sdk::SDKShare share(folder_new->GetShare());
+    QUIVRA_FAIL_IF(
+        unit::kFolderOperations, !share.IsSpaceEnough(),
+        Error(Error::kSpaceNotEnough, "Share (" + folder_new->GetShare() + ") space not enough"));
+    changes.shares.insert(folder_new->GetShare());
 }
 
 bool HasChangedContent(const Folder& diff) {
@@ -89,7 +62,8 @@ void UpsertFolders(const Json::Value& folder_list, bool create, bool updater_mod
     const LockFile lock(kFileIndexFoldersLockPath, true);
     FolderMgr folder_mgr;
     const FolderMgr folder_mgr_before;
-    RequireArray(folder_list, "!folder_list.isArray()");
+    QUIVRA_FAIL_IF(unit::kFolderOperations, !folder_list.isArray(),
+                   Error(Error::kBadArgument, "Not an array" + AppendData(folder_list)));
     Changes changes;
     for (const Json::Value& element : folder_list) {
         UpsertFolder(folder_mgr, changes, element, create, updater_mode);
@@ -150,10 +124,13 @@ void FolderSet(const Json::Value& folder_list, bool updater_mode) {
 void FolderDelete(const Json::Value& path_list) {
     const LockFile lock(kFileIndexFoldersLockPath, true);
     FolderMgr folder_mgr;
-    RequireArray(path_list, "!path_list.isArray()");
+    QUIVRA_FAIL_IF(unit::kFolderOperations, !path_list.isArray(),
+                   Error(Error::kBadArgument, "Not an array" + AppendData(path_list)));
     Changes changes;
     for (const Json::Value& it : path_list) {
-        const std::string path = RequireString(it);
+        QUIVRA_FAIL_IF(unit::kFolderOperations, !it.isString(),
+                       Error(Error::kBadArgument, "Not a string" + AppendData(it)));
+        const std::string path = it.asString();
         folder_mgr.Delete(changes.diffs.emplace_back(), path);
         std::string share_name;
         GetShareNameByPath(share_name, path);
@@ -212,11 +189,14 @@ void FolderGet(Json::Value& result, const std::string& path) {
 void FolderReindex(const Json::Value& path_list) {
     StatusMgr status_mgr;
     const FolderMgr folder_mgr;
-    RequireArray(path_list, "!path_list.isArray()");
+    QUIVRA_FAIL_IF(unit::kFolderOperations, !path_list.isArray(),
+                   Error(Error::kBadArgument, "Not an array" + AppendData(path_list)));
     Reindexes reindexes;
     try {
         for (const Json::Value& it : path_list) {
-            AddReindex(reindexes, RequireString(it), folder_mgr);
+            QUIVRA_FAIL_IF(unit::kFolderOperations, !it.isString(),
+                           Error(Error::kBadArgument, "Not a string" + AppendData(it)));
+            AddReindex(reindexes, it.asString(), folder_mgr);
         }
     } catch (const Error&) {
         QueueCustomEvents(reindexes.events);  // what was asked for before the mistake

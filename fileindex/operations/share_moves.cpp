@@ -3,7 +3,9 @@
 #include <string>
 #include <system_error>
 
+#include "common/error.h"
 #include "common/lock_file.h"
+#include "common/log.h"
 #include "common/util.h"
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/event.h"
@@ -125,8 +127,10 @@ void ReindexRecycleDirectory(const std::string& directory) {
 }  // namespace
 
 void ShareRename(const std::string& share_from, const std::string& share_to) {
-    RequireArgument(share_from, "share_from.empty()", "Missing share_from");
-    RequireArgument(share_to, "share_to.empty()", "Missing share_to");
+    QUIVRA_FAIL_IF(unit::kShareMoves, share_from.empty(),
+                   Error(Error::kBadArgument, "Missing share_from"));
+    QUIVRA_FAIL_IF(unit::kShareMoves, share_to.empty(),
+                   Error(Error::kBadArgument, "Missing share_to"));
     const LockFile lock(kFileIndexFoldersLockPath, true);
     const FolderMgr folder_mgr;
     const bool is_rest_due = folder_mgr.IsShareIndexed(share_to) && IsFlagged(share_to);
@@ -137,8 +141,10 @@ void ShareRename(const std::string& share_from, const std::string& share_to) {
 }
 
 void ShareMigrate(const std::string& share, const std::string& share_path_from) {
-    RequireArgument(share, "share.empty()", "Missing share name");
-    RequireArgument(share_path_from, "share_path_from.empty()", "Missing share path");
+    QUIVRA_FAIL_IF(unit::kShareMoves, share.empty(),
+                   Error(Error::kBadArgument, "Missing share name"));
+    QUIVRA_FAIL_IF(unit::kShareMoves, share_path_from.empty(),
+                   Error(Error::kBadArgument, "Missing share path"));
     const LockFile lock(kFileIndexFoldersLockPath, true);
     const FolderMgr folder_mgr;
     if (!folder_mgr.IsShareIndexed(share)) {
@@ -152,7 +158,8 @@ void ShareMigrate(const std::string& share, const std::string& share_path_from) 
 }
 
 void ShareCheckRecycle(const std::string& share) {
-    RequireArgument(share, "share.empty()", "Missing share name");
+    QUIVRA_FAIL_IF(unit::kShareMoves, share.empty(),
+                   Error(Error::kBadArgument, "Missing share name"));
     if (!FolderMgr().IsShareIndexed(share)) {
         return;
     }

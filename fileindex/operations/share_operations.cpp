@@ -1,6 +1,7 @@
 #include <set>
 #include <string>
 
+#include "common/error.h"
 #include "common/log.h"
 #include "common/util.h"
 #include "fileindex/elastic/elastic_control.h"
@@ -38,14 +39,6 @@ std::set<std::string> SavePausedOfVolume(const std::string& mount_point, bool pa
     return shares;
 }
 
-void RequireShareName(const std::string& share_name) {
-    RequireArgument(share_name, "share_name.empty()", "Missing share name");
-}
-
-void RequireMountPoint(const std::string& mount_point) {
-    RequireArgument(mount_point, "mount_point.empty()", "Missing mount point");
-}
-
 void SaveAfterClear(const FolderMgr& folder_mgr) {
     folder_mgr.Save();
     if (folder_mgr.GetFolders().empty()) {
@@ -66,7 +59,8 @@ bool IsToBeCleaned(const Folder& folder, const std::string& mount_point) {
 
 void SharePause(const std::string& share_name) {
     const FolderMgr folder_mgr;
-    RequireShareName(share_name);
+    QUIVRA_FAIL_IF(unit::kShareOperations, share_name.empty(),
+                   Error(Error::kBadArgument, "Missing share name"));
     if (!folder_mgr.IsShareIndexed(share_name)) {
         return;
     }
@@ -78,7 +72,8 @@ void SharePause(const std::string& share_name) {
 
 void ShareResume(const std::string& share_name) {
     const FolderMgr folder_mgr;
-    RequireShareName(share_name);
+    QUIVRA_FAIL_IF(unit::kShareOperations, share_name.empty(),
+                   Error(Error::kBadArgument, "Missing share name"));
     if (!folder_mgr.IsShareIndexed(share_name)) {
         return;
     }
@@ -89,7 +84,8 @@ void ShareResume(const std::string& share_name) {
 }
 
 void VolumePause(const std::string& mount_point) {
-    RequireMountPoint(mount_point);
+    QUIVRA_FAIL_IF(unit::kShareOperations, mount_point.empty(),
+                   Error(Error::kBadArgument, "Missing mount point"));
     for (const std::string& share : SavePausedOfVolume(mount_point, true)) {
         DeleteWorker(share);
         DeleteMonitorQueue(share);
@@ -98,7 +94,8 @@ void VolumePause(const std::string& mount_point) {
 }
 
 void VolumeResume(const std::string& mount_point) {
-    RequireMountPoint(mount_point);
+    QUIVRA_FAIL_IF(unit::kShareOperations, mount_point.empty(),
+                   Error(Error::kBadArgument, "Missing mount point"));
     for (const std::string& share : SavePausedOfVolume(mount_point, false)) {
         elastic::ShareIndexResume(share);
         CreateWorker(share);
@@ -108,8 +105,10 @@ void VolumeResume(const std::string& mount_point) {
 
 void ShareClearPaused(const std::string& share_name, const std::string& share_path) {
     FolderMgr folder_mgr;
-    RequireShareName(share_name);
-    RequireArgument(share_path, "share_path.empty()", "Missing share path");
+    QUIVRA_FAIL_IF(unit::kShareOperations, share_name.empty(),
+                   Error(Error::kBadArgument, "Missing share name"));
+    QUIVRA_FAIL_IF(unit::kShareOperations, share_path.empty(),
+                   Error(Error::kBadArgument, "Missing share path"));
     RemoveShareIndexData(share_name, share_path);
     elastic::ShareIndexDelete(share_name);
     folder_mgr.DeleteByShare(share_name);
@@ -117,7 +116,8 @@ void ShareClearPaused(const std::string& share_name, const std::string& share_pa
 }
 
 void VolumeClearPaused(const std::string& mount_point) {
-    RequireMountPoint(mount_point);
+    QUIVRA_FAIL_IF(unit::kShareOperations, mount_point.empty(),
+                   Error(Error::kBadArgument, "Missing mount point"));
     FolderMgr folder_mgr;
     StatusMgr status_mgr;
     std::set<std::string> shares;

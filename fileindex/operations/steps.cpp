@@ -1,7 +1,5 @@
 #include "fileindex/operations/steps.h"
 
-#include <array>
-
 #include <kesto/fileidx.h>
 #include <kesto/monitor_queue.h>
 #include <kesto/process.h>
@@ -58,24 +56,15 @@ void RemoveTree(const std::string& path) {
 }
 
 std::string ComposeDBPath(const std::string& share_path) {
-    std::array<char, kPathSize> path{};
+    char path[kPathSize] = "";
     const LockMutex lock(sdk::SDKMutex());
-    if (FILEIDXDBPathCompose(share_path.c_str(), path.data(), path.size()) < 0) {
-        Fail(unit::kSteps.Here(),
-             "0 > FILEIDXDBPathCompose(share_path.c_str(), path, sizeof(path))",
-             Error(Error::kSystemCallFailed,
-                   "FILEIDXDBPathCompose failed, share_path=" + share_path));
-    }
-    return path.data();
+    QUIVRA_FAIL_IF(
+        unit::kSteps, 0 > FILEIDXDBPathCompose(share_path.c_str(), path, sizeof(path)),
+        Error(Error::kSystemCallFailed, "FILEIDXDBPathCompose failed, share_path=" + share_path));
+    return path;
 }
 
 }  // namespace
-
-void RequireArgument(const std::string& argument, const char* condition, const char* reason) {
-    if (argument.empty()) {
-        Fail(unit::kSteps.Here(), condition, Error(Error::kBadArgument, reason));
-    }
-}
 
 void NotifySettingChanged(const std::string& share, bool is_upsert) {
     Json::Value data;
@@ -94,11 +83,9 @@ void DeleteWorker(const std::string& share) {
 
 void UpsertMonitorQueue(const std::string& share) {
     const MonitorQueue monitor_queue(DescribeMonitorQueue(share));
-    if (!MonitorQueue::Upsert(monitor_queue, kAppName, MONITOR_QUEUE_TYPE_APPLICATION)) {
-        Fail(unit::kSteps.Here(),
-             "!MonitorQueue::Upsert(monitor_queue, kAppName, MONITOR_QUEUE_TYPE_APPLICATION)",
-             Error(Error::kSystemCallFailed, "MonitorQueue::Upsert failed, share=" + share));
-    }
+    QUIVRA_FAIL_IF(unit::kSteps,
+                   !MonitorQueue::Upsert(monitor_queue, kAppName, MONITOR_QUEUE_TYPE_APPLICATION),
+                   Error(Error::kSystemCallFailed, "MonitorQueue::Upsert failed, share=" + share));
 }
 
 void DeleteMonitorQueue(const std::string& share) {
@@ -115,15 +102,13 @@ void DeleteMonitorQueue(const std::string& share, const std::string& queue_path)
 }
 
 std::string ComposeQueuePath(const std::string& share_path) {
-    std::array<char, kPathSize> path{};
+    char path[kPathSize] = "";
     const LockMutex lock(sdk::SDKMutex());
-    if (FILEIDXQueuePathCompose(share_path.c_str(), path.data(), path.size()) < 0) {
-        Fail(unit::kSteps.Here(),
-             "0 > FILEIDXQueuePathCompose(share_path.c_str(), path, sizeof(path))",
-             Error(Error::kSystemCallFailed,
-                   "FILEIDXQueuePathCompose failed, share_path=" + share_path));
-    }
-    return path.data();
+    QUIVRA_FAIL_IF(unit::kSteps,
+                   0 > FILEIDXQueuePathCompose(share_path.c_str(), path, sizeof(path)),
+                   Error(Error::kSystemCallFailed,
+                         "FILEIDXQueuePathCompose failed, share_path=" + share_path));
+    return path;
 }
 
 void RemoveShareIndexData(const std::string& share, const std::string& share_path) {

@@ -20,6 +20,7 @@ inline constexpr LogUnit kCustomEvent{"index_mgr", 1000};
 inline constexpr LogUnit kServices{"index_mgr", 2000};
 inline constexpr LogUnit kShareOperations{"index_mgr", 3000};
 inline constexpr LogUnit kSteps{"index_mgr", 4000};
+inline constexpr LogUnit kShareMoves{"index_mgr", 5000};
 
 }  // namespace unit
 
@@ -42,9 +43,6 @@ std::string ComposeQueuePath(const std::string& share_path);
 /// Deletes a share's queue, working copy and index from the disk, and forgets its flags. What
 /// cannot be deleted is logged.
 void RemoveShareIndexData(const std::string& share, const std::string& share_path);
-
-/// Throws Error 120 with `reason`, logged as `condition`, when the argument is empty.
-void RequireArgument(const std::string& argument, const char* condition, const char* reason);
 
 /// Starts or stops the services that indexing needs; what fails is logged.
 void SwitchServices(bool enable);

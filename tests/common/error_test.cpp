@@ -34,7 +34,7 @@ TEST(LogTest, FailureLineShowsErrnoOnceAndNoTextIsAFormat) {
 TEST(LogTest, ACompiledMarkIsTheLineItself) {
     constexpr LogUnit kUnit{"known", 3000};
     fake::ResetLibc();
-    LogError(LogSite(), "here");
+    LogError(LogSite::Here(), "here");
     const int line = __LINE__ - 1;
     EXPECT_THROW(QUIVRA_FAIL_IF(kUnit, 1 + 1 == 2, Error(120, "why")), Error);
     QUIVRA_FAIL_IF(kUnit, false, Error(120, "not this"));

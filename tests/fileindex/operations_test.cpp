@@ -204,7 +204,7 @@ TEST_F(OperationsTest, AListReadsEachQueueOnceAndGoesOnWithoutAShareThatIsGone) 
     EXPECT_EQ(states, "/a:processing /a/x:processing /a/y:finished /b:finished /gone:error ");
     EXPECT_EQ(fake::CallsOf("FILEIDXQueuePathCompose").size(), 2U);
 
-    // A bad line is no reason to believe that nothing is pending; what was found before it holds.
+    // A bad line does not mean that nothing is pending; what was found before it holds.
     WriteFile(QueuePath("/volume1/a"), R"({"event":2,"path":"/volume1/a/x/f"})"
                                        "\nbad\n");
     FolderList(result, 1, 1, "path", "", Parse(R"(["status"])"));

@@ -89,7 +89,7 @@ TEST_F(StatusMgrTest, MembersOfWrongTypesCountAsAbsentAndAreReplaced) {
         EXPECT_FALSE(Stored()["share"].isMember("s")) << text;
     }
     Store("{");
-    EXPECT_EQ(ErrorOf([] { StatusMgr(); }).code, 504) << "a broken file is no empty one";
+    EXPECT_EQ(ErrorOf([] { StatusMgr(); }).code, 504) << "a broken file is not an empty one";
 }
 
 }  // namespace
