@@ -34,10 +34,12 @@ class QUIVRA_EXPORT Error : public std::runtime_error {
         kPathLookupFailed = 9999,   ///< a path is not a canonical absolute path
     };
 
+    /// what() becomes "Quivra error, code=CODE" and, unless the reason is empty, ",
+    /// reason=[REASON]".
     explicit Error(ErrorCode code, const std::string& reason = std::string());
     explicit Error(int code, const std::string& reason = std::string());
 
-    ErrorCode code;
+    ErrorCode code;      ///< may be any integer, see above
     std::string reason;  ///< empty when the thrower gave none
 };
 

@@ -35,6 +35,7 @@ class Builder {
     bool Null() { return Put(Json::Value()); }
     bool Bool(bool value) { return Put(value); }
     bool Int(int value) { return Put(value); }
+    // Members come in any order and any number; of equal keys the last counts, as everywhere.
     bool Int64(std::int64_t value) { return Put(Json::Int64{value}); }
     bool Uint(unsigned int value) { return Put(Json::Int64{value}); }
     bool Uint64(std::uint64_t value) {
@@ -148,6 +149,7 @@ void Write(Writer& writer, const Json::Value& value) {
     }
 }
 
+/// An administrator may have closed the file to others; a save must not open it again.
 mode_t ModeForReplacement(const std::string& path) {
     struct stat status {};
     return stat(path.c_str(), &status) == 0 ? status.st_mode & 07777 : 0644;
@@ -208,6 +210,7 @@ bool isJsonType<unsigned int>(const Json::Value& value) {
 }
 template <>
 bool isJsonType<long long>(const Json::Value& value) {
+    // Not "convertible" as the others: 1.5 seconds or true must not pass for a time.
     return (value.type() == Json::intValue || value.type() == Json::uintValue) && value.isInt64();
 }
 template <>
@@ -253,6 +256,7 @@ const Json::Value* FindJsonMember(const Json::Value& json, const std::string& ke
     }
     const Json::Value* member = json.find(key.data(), key.data() + key.size());
     if (member == nullptr && required) {
+        // Without a log line: only the caller knows what was read.
         throw Error(Error::kBadArgument, "Missing property: " + key + AppendData(json));
     }
     return member;

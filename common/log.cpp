@@ -19,6 +19,7 @@ std::int32_t log_level = kLogLevelDebug;
 namespace {
 
 std::string Format(const char* format, va_list arguments) {
+    // Measured first, because lines hold whole requests; a fixed buffer would cut them.
     va_list measured;
     va_copy(measured, arguments);
     const int length = std::vsnprintf(nullptr, 0, format, measured);
@@ -44,7 +45,7 @@ void LogError(LogSite site, const char* format, ...) {
     // A user's file name may hold line breaks: it must not pass for a line of its own.
     syslog(LOG_ERR, "%s:%d (%d, %u) %s", site.unit, site.line, getpid(), geteuid(),
            base::EscapeControl(text + tail).c_str());
-    errno = 0;
+    errno = 0;  // so that the next failure does not show this one's cause
 }
 
 void LogTrace(LogSite site, const char* format, ...) {
@@ -67,6 +68,7 @@ void Fail(LogSite site, const char* condition, const Error& error) {
 }
 
 std::string SystemErrorText(int error_number) {
+    // strerror is not safe for threads, and strerror_r exists in two kinds.
     return std::generic_category().message(error_number);
 }
 

@@ -25,8 +25,8 @@ inline constexpr std::int32_t kLogLevelDebug = 7;
 /// Where a log line comes from, "UNIT:LINE": a mark that leads to one place. Support tools search
 /// for some of them; those are written out and keep their number when the code around them moves.
 struct LogSite {
-    const char* unit;
-    int line;
+    const char* unit;  ///< the name of the source as it appears in the log
+    int line;          ///< the line of the source, or a number that is fixed
 
     /// The source file and line of the call itself: LogError(LogSite::Here(), ...).
     static constexpr LogSite Here(const char* file = __builtin_FILE(),
@@ -43,9 +43,10 @@ struct LogSite {
 /// know another one. Files that share a name begin at different thousands, so that a mark still
 /// leads to one place.
 struct LogUnit {
-    const char* name;
-    int base;  ///< is added to the number of the line
+    const char* name;  ///< LogSite::unit
+    int base;          ///< is added to the number of the line
 
+    /// The place of the call itself.
     constexpr LogSite Here(int line = __builtin_LINE()) const { return {name, base + line}; }
 };
 

@@ -2,6 +2,7 @@
 
 namespace quivra {
 
+// POSIX and not std::mutex, because callers see whether a call succeeded.
 Mutex::Mutex() {
     pthread_mutex_init(&mutex_, nullptr);
 }

@@ -16,8 +16,8 @@ class QUIVRA_EXPORT Mutex {
 
     /// Each returns whether the underlying call succeeded.
     bool Lock();
-    bool TryLock();
-    bool Unlock();
+    bool TryLock();  ///< does not wait
+    bool Unlock();   ///< by the thread that holds it
 
   private:
     pthread_mutex_t mutex_;
@@ -26,6 +26,7 @@ class QUIVRA_EXPORT Mutex {
 /// Holds a mutex for a scope. The mutex must outlive it.
 class QUIVRA_EXPORT LockMutex {
   public:
+    /// Waits for the mutex.
     explicit LockMutex(Mutex& mutex);
     ~LockMutex();
     LockMutex(const LockMutex&) = delete;

@@ -31,11 +31,12 @@ bool IsDirExist(const std::string& path, bool follow_link) {
             !links_seen.emplace(status.st_dev, status.st_ino).second) {
             return false;
         }
+        // Zeroed and one byte short, because readlink ends its text by nothing.
         std::array<char, 4096> target{};
         if (readlink(current.c_str(), target.data(), target.size() - 1) < 0) {
             return false;
         }
-        current = target.data();
+        current = target.data();  // as it is stored, so from the current directory where relative
     }
 }
 
@@ -53,6 +54,7 @@ std::string Basename(const std::string& path) {
 }
 
 std::string Dirname(const std::string& path) {
+    // Never ".": a parent is stored and compared as text, and joined by "/" again.
     return path.substr(0, path.rfind('/'));
 }
 

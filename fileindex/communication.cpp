@@ -124,6 +124,7 @@ void BufferWrite(int fd, unsigned int size, const unsigned char* buf) {
 }
 
 void SendCommandToDaemon(const std::string& type, const Json::Value& data) {
+    // For the whole process and for good: a daemon that goes away must not end its client.
     signal(SIGPIPE, SIG_IGN);
     const base::UniqueFd fd_socket(socket(PF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
     if (!fd_socket.IsValid()) {

@@ -36,6 +36,7 @@ const std::string& Folder::GetShare() const {
 }
 
 void Folder::SetShare(const std::string& share) {
+    // The full path stays what it was: who moves a share still needs to know where it came from.
     path_ = ReplacePathShare(path_, share, GetShare());
     share_ = share;
 }
@@ -47,6 +48,7 @@ const std::string& Folder::GetFullPath() const {
     return full_path_;
 }
 
+// On disk, so every member is written, those that hold their defaults included.
 Json::Value Folder::GetData() const {
     Json::Value data;
     data["path"] = path_;

@@ -21,14 +21,18 @@ class QUIVRA_EXPORT Folder {
     /// Throws Error 120 ("Missing property: ...", "Not a string...", "Not an object...").
     explicit Folder(const Json::Value& data);
 
+    /// The share path, as it is stored.
     const std::string& GetPath() const { return path_; }
+    /// What the entry is called in lists.
     const std::string& GetName() const { return name_; }
     /// The volume whose index data is still to be cleaned for this folder; empty for none.
     const std::string& GetVolumeToBeClean() const { return volume_to_be_clean_; }
+    /// Which kinds of content are indexed; names and attributes of all files are.
     bool GetDocument() const { return document_; }
     bool GetAudio() const { return audio_; }
     bool GetVideo() const { return video_; }
     bool GetPhoto() const { return photo_; }
+    /// Whether the folder's share is paused. The pause of all indexing is StatusMgr's.
     bool GetPaused() const { return paused_; }
     void SetPaused(bool paused) { paused_ = paused; }
 

@@ -62,6 +62,7 @@ FolderMgr::FolderMgr() {
     // null and {} hold nothing that could be lost; anything else is not ours to overwrite.
     QUIVRA_FAIL_IF(kLog, !folders.isArray() && !folders.empty(),
                    Error(Error::kBadArgument, "Not an array" + AppendData(folders)));
+    // More than the limit load, too: refusing them would take the settings away that are there.
     folders_.reserve(folders.size());
     for (const Json::Value& folder : folders) {
         folders_.push_back(std::make_shared<Folder>(folder));
@@ -73,6 +74,7 @@ void FolderMgr::Save() const {
     for (const FolderPtr& folder : folders_) {
         folders.append(folder->GetData());
     }
+    // The front end may run as an administrator who may not write below /var/packages.
     const sdk::SDKCredentials as_root("root");
     if (!toFile(folders, kFileIndexFoldersCfgPath)) {
         Fail({"folder_mgr.cpp", 229}, "!folders.toFile(kFileIndexFoldersCfgPath)",
@@ -102,6 +104,7 @@ bool FolderMgr::HasFolder(const std::string& path) const {
 }
 
 void FolderMgr::Upsert(FolderPtr& diff, FolderPtr folder) {
+    // Before the old entry goes: what governed the place is what the index holds now.
     diff = DiffCfg(folder, GetMostSuitableCfg(folder->GetFullPath()));
     RemovePath(folder->GetPath());
     folders_.push_back(std::move(folder));
@@ -172,6 +175,7 @@ const std::string* FolderMgr::FindFullPath(const Folder& folder) const {
 }
 
 FolderPtr FolderMgr::GetMostSuitableCfg(const std::string& full_path) const {
+    // A plain walk: a thousand folders are 30 us, and no order of theirs has to be kept up.
     const FolderPtr* best = nullptr;
     std::size_t best_size = 0;
     for (const FolderPtr& folder : folders_) {
@@ -218,6 +222,7 @@ bool FolderMgr::IsFullPathIndexed(const std::string& full_path) const {
 }
 
 bool FolderMgr::IsShareIndexed(const std::string& share) const {
+    // By the path alone, so that it also holds for a share that is gone.
     return std::any_of(folders_.begin(), folders_.end(), [&](const FolderPtr& folder) {
         std::string name;
         GetShareNameByPath(name, folder->GetPath());

@@ -11,6 +11,7 @@
 
 namespace quivra::fileindex {
 
+/// The file of the set, and the LockFile of those who change it.
 inline constexpr const char* kFileIndexFoldersCfgPath =
     "/var/packages/Quivra/etc/fileindex.folders";
 inline constexpr const char* kFileIndexFoldersLockPath = "/tmp/quivra_cfg_folder.lock";
@@ -50,6 +51,7 @@ class QUIVRA_EXPORT FolderMgr {
     /// The folder with exactly this share path. Throws Error 902 when there is none; `out` is left
     /// as it was.
     void Get(FolderPtr& out, const std::string& path) const;
+    /// Whether there is a folder with exactly this share path.
     bool HasFolder(const std::string& path) const;
 
     /// Puts the folder at the end, in place of one of the same path. `diff` tells which kinds of

@@ -28,6 +28,7 @@ namespace quivra::fileindex {
 /// FIFO in the place of a file counts as no file and is never followed or waited for.
 class QUIVRA_EXPORT QueueMgr {
   public:
+    /// Nothing is opened; the working copy is `queue_path` with ".tmp" behind it.
     explicit QueueMgr(const std::string& queue_path);
 
     /// Moves the queue to the working copy, unless there is no queue or still a working copy.

@@ -39,6 +39,7 @@ StatusMgr::StatusMgr() {
 }
 
 void StatusMgr::Load() {
+    // Aside, so that a file that cannot be read leaves this object as it was.
     Json::Value data;
     if (IsFileExist(kFileIndexStatusCfgPath) && !fromFile(data, kFileIndexStatusCfgPath)) {
         Fail(
@@ -68,6 +69,7 @@ void StatusMgr::Pause(int hours) {
     QUIVRA_FAIL_IF(kLog, 0 > hours,
                    Error(Error::kBadArgument, "Pause length should NOT be negative"));
     Load();
+    // Saved before the daemon is told: it reads the file when it starts, and may be starting now.
     const std::int64_t resume_time = ResumeTimeIn(hours);
     SetResumeTime(resume_time);
     Json::Value data;

@@ -9,6 +9,7 @@
 
 namespace quivra::fileindex {
 
+/// The status file, and the LockFile that changes of it hold.
 inline constexpr const char* kFileIndexStatusCfgPath = "/var/packages/Quivra/etc/fileindex.status";
 inline constexpr const char* kFileIndexStatusLockPath = "/tmp/quivra_cfg_fi_status.lock";
 
@@ -54,6 +55,7 @@ class QUIVRA_EXPORT StatusMgr {
     /// Ends the pause and tells the indexing daemon. Throws as Pause does.
     void Resume();
 
+    /// Set and end one flag of a share; its other flags stay.
     void SetShareStatus(const std::string& share, ShareStatus flag);
     /// A share without flags left stays in the file, with 0.
     void UnsetShareStatus(const std::string& share, ShareStatus flag);

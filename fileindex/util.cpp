@@ -54,6 +54,7 @@ bool IsHomeRecyclePath(const std::string& share_name, const std::string& full_pa
            KLIBCSzListFind(recycle.list, full_path.c_str()) >= 0;
 }
 
+/// Asked only for paths that have the name in them: the platform looks the share up once more.
 bool IsShareRecyclePath(const std::string& full_path) {
     const LockMutex lock(sdk::SDKMutex());
     return KESTOShareIsShareRecycle(full_path.c_str()) == 1;
@@ -73,6 +74,7 @@ void GetFullPath(std::string& full_path, const std::string& share_path) {
     std::string share_name;
     GetShareNameByPath(share_name, share_path);
     const sdk::SDKShare share(share_name);
+    // Beside the share's root, not below it: the share path begins with the share's own name.
     full_path = Dirname(share.GetPath()) + share_path;
 }
 
@@ -117,6 +119,7 @@ bool CanPathBeIndexed(const std::string& share_path) {
 
 std::string ReplacePathShare(const std::string& path, const std::string& new_share,
                              const std::string& old_share) {
+    // With a "/" at both ends, so that photo is not found in photos.
     const std::size_t pos = (path + "/").find("/" + old_share + "/");
     if (pos == std::string::npos) {
         Fail(kLog.Here(), "string::npos == pos",

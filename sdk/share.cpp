@@ -41,12 +41,14 @@ std::string SDKShare::GetPath() const {
 }
 
 bool SDKShare::IsHideUnReadable() const {
+    // Without the mutex, as the privileges below: these read the record alone.
     int is_hidden = 0;
     return 0 <= KLIBShareHideUnreadableGet(share_info_, &is_hidden) && is_hidden == 1;
 }
 
 bool SDKShare::IsSpaceEnough() const {
     const LockMutex lock(SDKMutex());
+    // In doubt there is space: a quota that cannot be asked must not stop all indexing.
     if (KESTOQuotaIsEnough(0, share_info_->szPath, kSpaceNeeded) != 0) {
         return true;
     }

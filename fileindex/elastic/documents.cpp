@@ -36,6 +36,7 @@ Json::Value ExtractDocument(const std::string& full_path, bool need_meta) {
         Fail(unit::kDocuments.Here(), "!ParseFile(full_path, cfg, file_data)",
              Error(Error::kParseFailed, "Parse failed, path=" + full_path));
     }
+    // The name twice: once as it is, once for the n-grams that find its parts.
     file_data[field::kSearchFileName] = Json::Value(std::as_const(file_data)[field::kFSName]);
     return file_data;
 }
@@ -131,6 +132,8 @@ void IndexRename(const std::string& share, const std::string& new_path,
 }
 
 void IndexCommit(const std::string& share) {
+    // A full volume makes the daemon fail in many ways. Asked afterwards, because asking before
+    // each commit would cost more and prove nothing.
     try {
         SendRequestNoResult(DocumentRequest(command::kCommit, share));
         return;

@@ -36,6 +36,7 @@ QUIVRA_EXPORT std::span<const std::string_view> GetMetadataKeys();
 /// the share cannot be looked up; nothing is sent then.
 QUIVRA_EXPORT void ShareIndexCreate(const std::string& share);
 
+/// Deletes the share's index with all documents; one that does not exist is not an error.
 QUIVRA_EXPORT void ShareIndexDelete(const std::string& share);
 
 /// Makes the index refuse changes and let go of its files, and takes it back into service.

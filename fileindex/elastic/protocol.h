@@ -7,8 +7,10 @@
 /// values are the wire's: they never change, and what was given once is given to nothing else.
 namespace quivra::fileindex::elastic {
 
+/// Where the daemon listens; root only.
 inline constexpr const char* kSearchDaemonSocketPath = "/var/run/kestoelasticd.sock";
 
+/// What a request can ask for; docs/search-daemon.md tells what each does.
 namespace command {
 
 inline constexpr const char* kIndexCreate = "index_create";

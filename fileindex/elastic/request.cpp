@@ -133,6 +133,8 @@ void SendRequestWithRetry(Json::Value& response, const Json::Value& request) {
             NotifyLackOfMemory();
             notified = true;
         }
+        // Long, because a daemon short of memory stays so for a while, and at random, so that all
+        // workers do not come back at once.
         unsigned int left =
             static_cast<unsigned int>(std::rand() % kRetrySteps) * kRetryStepSeconds +
             kRetryBaseSeconds;

@@ -64,6 +64,8 @@ void SharePause(const std::string& share_name) {
     if (!folder_mgr.IsShareIndexed(share_name)) {
         return;
     }
+    // The worker first, or it would meet a paused index; the mark last, so that a failure leaves a
+    // share that is not called paused and can be paused again.
     DeleteWorker(share_name);
     DeleteMonitorQueue(share_name);
     elastic::ShareIndexPause(share_name);
@@ -127,6 +129,7 @@ void VolumeClearPaused(const std::string& mount_point) {
         }
     }
     for (const std::string& share : shares) {
+        // Nothing else: the volume is gone, and with it queues and indexes.
         status_mgr.ClearShareStatus(share);
         folder_mgr.DeleteByShare(share);
     }

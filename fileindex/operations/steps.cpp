@@ -32,6 +32,7 @@ void SendWorkerCommand(const char* command, const std::string& share) {
 }
 
 Json::Value DescribeMonitorQueue(const std::string& share) {
+    // As saved, not as the caller holds it: the monitor watches what the next start would read.
     const FolderMgr folder_mgr;
     Json::Value config;
     config["path"] = Json::Value(Json::arrayValue);
