@@ -42,7 +42,8 @@ QUIVRA_EXPORT void FolderSet(const Json::Value& folder_list, bool updater_mode);
 QUIVRA_EXPORT void FolderDelete(const Json::Value& path_list);
 
 /// One page of the folders: {"folder": [Folder::GetDataWithAdditional...], "total": number of all
-/// folders, "offset": as asked}. For the order see FolderMgr::List. Takes no lock.
+/// folders, "offset": as asked}. For the order see FolderMgr::List. With the status, each share's
+/// queue is read once. Takes no lock.
 QUIVRA_EXPORT void FolderList(Json::Value& result, unsigned int offset, unsigned int limit,
                               const std::string& sort_by, const std::string& sort_direction,
                               const Json::Value& additional);
@@ -66,8 +67,8 @@ QUIVRA_EXPORT void SharePause(const std::string& share_name);
 QUIVRA_EXPORT void ShareResume(const std::string& share_name);
 
 /// The same for every share with a folder whose full path begins with the text `mount_point` (a
-/// plain prefix: /volume1 takes /volume10 in). The folders are marked first. Error 120 "Missing
-/// mount point".
+/// plain prefix: /volume1 takes /volume10 in). The folders are marked first. A folder whose share
+/// is gone lies on no volume and stays as it is. Error 120 "Missing mount point".
 QUIVRA_EXPORT void VolumePause(const std::string& mount_point);
 QUIVRA_EXPORT void VolumeResume(const std::string& mount_point);
 

@@ -98,6 +98,24 @@ TEST_F(FolderMgrTest, AShareThatIsGoneStopsNothingOfTheOthers) {
     EXPECT_EQ(status, Parse(R"({"text":"error","desc":"invalid_path"})"));
 }
 
+TEST_F(FolderMgrTest, PagesAreCutFromTheSortedList) {
+    SetFolders("[" + Stored("/s/2") +
+               R"(,{"path":"/s/1","name":"z","document":false,"audio":true,)"
+               R"("video":false,"photo":true}])");
+    const FolderMgr folder_mgr;
+    for (const char* key : {"document", "video", "path", "photo desc", "audio desc", "name desc"}) {
+        const std::string text = key;
+        const bool descends = text.ends_with(" desc");
+        std::vector<FolderPtr> page;
+        unsigned int total = 0;
+        folder_mgr.List(page, total, 0, 1, text.substr(0, text.find(' ')), descends ? "desc" : "");
+        ASSERT_EQ(page.size(), 1U);
+        EXPECT_EQ(page[0]->GetPath(), "/s/1") << key;
+        folder_mgr.List(page, total, 2, 5, text, "");
+        EXPECT_TRUE(page.empty() && total == 2U);
+    }
+}
+
 TEST_F(FolderMgrTest, TheDeepestFolderGoverns) {
     SetFolders("[" + Stored("/s") + "," + Stored("/s/a") + "," +
                Stored("/s/a", R"(,"paused":true)") + "]");

@@ -6,6 +6,7 @@
 
 #include <array>
 
+#include "common/lock_file.h"
 #include "fileindex/index_mgr.h"
 #include "tests/fileindex/management_fixture.h"
 
@@ -122,6 +123,42 @@ TEST_F(OperationsTest, ARefusedRequestChangesNothing) {
     EXPECT_EQ(Folders().size(), 2U);
 }
 
+TEST_F(OperationsTest, WhatCannotBeginTouchesNothing) {
+    EXPECT_TRUE(toFile(List({"/a"}), kFileIndexFoldersCfgPath));
+    const std::pair<std::function<void()>, const char*> rows[] = {
+        {[] { SharePause(""); }, "Missing share name"},
+        {[] { ShareResume(""); }, "Missing share name"},
+        {[] { VolumePause(""); }, "Missing mount point"},
+        {[] { VolumeResume(""); }, "Missing mount point"},
+        {[] { ShareClearPaused("", "/volume1/a"); }, "Missing share name"},
+        {[] { ShareClearPaused("a", ""); }, "Missing share path"},
+        {[] { VolumeClearPaused(""); }, "Missing mount point"},
+        {[] { ShareRename("", "a"); }, "Missing share_from"},
+        {[] { ShareRename("a", ""); }, "Missing share_to"},
+        {[] { ShareMigrate("", "/volume1/a"); }, "Missing share name"},
+        {[] { ShareMigrate("a", ""); }, "Missing share path"},
+        {[] { ShareCheckRecycle(""); }, "Missing share name"},
+        {[] { FolderAdd(Json::objectValue, false); }, "Not an array, data={}"},
+        {[] { FolderDelete(Json::objectValue); }, "Not an array, data={}"},
+        {[] { FolderDelete(Parse("[7]")); }, "Not a string, data=7"},
+        {[] { FolderReindex(Json::objectValue); }, "Not an array, data={}"},
+    };
+    for (const auto& [run, reason] : rows) {
+        const Error error = ErrorOf(run);
+        EXPECT_EQ(error.code, 120) << reason;
+        EXPECT_EQ(error.reason, reason);
+    }
+    // Not even beside somebody who only reads.
+    const LockFile held(kFileIndexFoldersLockPath, false);
+    for (const std::function<void()>& run : std::initializer_list<std::function<void()>>{
+             [] { FolderAdd(List({"/b"}), false); }, [] { FolderDelete(Paths({"/a"})); },
+             [] { ShareRename("a", "b"); }, [] { ShareMigrate("a", "/volume9/a"); }}) {
+        EXPECT_EQ(ErrorOf(run).code, 506);
+    }
+    EXPECT_TRUE(Steps().empty());
+    EXPECT_EQ(Folders(), List({"/a"}));
+}
+
 TEST_F(OperationsTest, AReindexIsQueuedAndEndsTheNeedForOne) {
     FolderAdd(List({"/a/x"}), false);
     std::filesystem::remove(QueuePath("/volume1/a"));
@@ -218,7 +255,6 @@ TEST_F(OperationsTest, AVolumeIsAPlainPrefixAndIsSavedFirst) {
     AddShare("c", "/volume10");
     EXPECT_TRUE(toFile(List({"/b", "/a", "/gone", "/a/x", "/c"}), kFileIndexFoldersCfgPath));
     SharePause("unindexed");
-    EXPECT_EQ(ErrorOf([] { VolumePause(""); }).code, 120) << "a prefix of all";
     EXPECT_TRUE(Steps().empty());
     VolumePause("/volume1");
     std::vector<std::string> expected = {"save"};

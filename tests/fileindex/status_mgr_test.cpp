@@ -63,7 +63,7 @@ TEST_F(StatusMgrTest, FlagsAreSetClearedAndForgottenUnderTheLock) {
     EXPECT_EQ(Stored(), Parse(R"({"resume_time":0,"share":{"new":0,"x":1,"y":1},"other":[1]})"));
     EXPECT_EQ(second.GetPauseInfo(), 0);
 
-    const LockFile held(kFileIndexStatusLockPath, true);
+    const LockFile held(kFileIndexStatusLockPath, false);
     const std::function<void()> changes[] = {
         [&] { status.Resume(); },
         [&] { status.SetShareStatus("s", kShareNeedReindex); },

@@ -4,6 +4,7 @@
 
 #include <functional>
 
+#include "fileindex/elastic/elastic_control.h"
 #include "fileindex/path_rules.h"
 #include "tests/fileindex/library_fixture.h"
 
@@ -91,6 +92,32 @@ TEST_F(PathTest, AnExaminedPathNamesTheRulesUpToTheFirstThatFails) {
         EXPECT_EQ(findings.back().rule, row.last) << row.path;
         EXPECT_EQ(findings.back().passed, row.passed) << row.path << findings.back().detail;
     }
+}
+
+/// FNV-1a: says that a table has changed, without a second copy of it.
+std::uint64_t Digest(const std::string& text) {
+    std::uint64_t hash = 0xcbf29ce484222325;
+    for (const char c : text) {
+        hash = (hash ^ static_cast<unsigned char>(c)) * 0x100000001b3;
+    }
+    return hash;
+}
+
+TEST(TablesTest, WhatOthersReadIsFixed) {
+    std::string types;
+    for (const auto& [extension, type] : GetFileTypes()) {
+        types += std::string(extension) + ":" + std::to_string(static_cast<int>(type)) + " ";
+    }
+    std::string keys;
+    for (const std::string_view key : elastic::GetMetadataKeys()) {
+        keys += std::string(key) + " ";
+    }
+    EXPECT_EQ(Digest(types), 0x5e08e8994848fcb3U);
+    EXPECT_EQ(Digest(keys), 0x302a655ffdf11b52U);
+    EXPECT_EQ(Digest(toString(elastic::GetFileIndexMappings())), 0xc6b44b2fe3f02866U);
+    EXPECT_EQ(Digest(GetCategoryQuery("document") + GetCategoryQuery("audio") +
+                     GetCategoryQuery("video") + GetCategoryQuery("image")),
+              0x5a3e927dee073181U);
 }
 
 TEST_F(PathTest, HomesHaveRecycleBinsOfTheirOwn) {

@@ -4,6 +4,7 @@
 
 #include <map>
 
+#include "common/error.h"
 #include "sdk/credentials.h"
 #include "tests/fake/fake_libc.h"
 #include "tests/fake/fake_platform.h"
@@ -29,6 +30,19 @@ TEST_F(ShareTest, OnlyAStatedLackOfSpaceCounts) {
     for (const auto& [code, enough] : rows) {
         fake::Platform()->space_code = code;
         EXPECT_EQ(share.IsSpaceEnough(), enough) << code;
+    }
+}
+
+TEST_F(ShareTest, FlagsAreRead) {
+    fake::Platform()->shares.at("photo").hide_unreadable = 1;
+    const SDKShare share("photo");
+    EXPECT_TRUE(share.IsHideUnReadable());
+    EXPECT_FALSE(share.IsEncryption());
+    fake::FailNext("KLIBShareHideUnreadableGet");
+    EXPECT_FALSE(share.IsHideUnReadable());
+    for (const char* call : {"KLIBShareIsEncryptedGet", "KLIBShareIsReadOnlyGet"}) {
+        fake::FailNext(call);
+        EXPECT_THROW(share.CanBeIndexed(), quivra::Error) << call;
     }
 }
 
