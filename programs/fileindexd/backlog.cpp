@@ -7,6 +7,7 @@
 #include <cerrno>
 #include <chrono>
 #include <cstdlib>
+#include <utility>
 
 #include "base/path.h"
 #include "common/log.h"
@@ -29,18 +30,20 @@ constexpr std::int64_t kLastWait = 24 * 60 * 60;
 /// Paths are blobs: bytes in no encoding, compared one by one. The version is the file's
 /// user_version; another one means that the store is made anew, with a reindex.
 constexpr const char* kTables = R"(
-PRAGMA user_version = 1;
-CREATE TABLE meta(key TEXT PRIMARY KEY, value BLOB NOT NULL) WITHOUT ROWID;
+PRAGMA user_version = 2;
+CREATE TABLE meta(key TEXT PRIMARY KEY, value BLOB NOT NULL) STRICT, WITHOUT ROWID;
 CREATE TABLE trees(id INTEGER PRIMARY KEY, path BLOB NOT NULL UNIQUE, again INTEGER NOT NULL,
-                   listed BLOB NOT NULL);
+                   listed BLOB NOT NULL) STRICT;
 CREATE TABLE directories(id INTEGER PRIMARY KEY, path BLOB NOT NULL UNIQUE,
-                         again INTEGER NOT NULL);
+                         again INTEGER NOT NULL) STRICT;
 CREATE TABLE files(path BLOB NOT NULL UNIQUE, size INTEGER NOT NULL, due INTEGER NOT NULL,
-                   tries INTEGER NOT NULL, since INTEGER NOT NULL, reason BLOB);
+                   tries INTEGER NOT NULL, since INTEGER NOT NULL, reason BLOB,
+                   named INTEGER NOT NULL) STRICT;
 CREATE INDEX files_due ON files(due) WHERE due >= 0;
+CREATE INDEX files_unnamed ON files(named) WHERE named = 0;
 CREATE INDEX files_failed ON files(path) WHERE reason IS NOT NULL;
 )";
-constexpr std::int64_t kVersion = 1;
+constexpr std::int64_t kVersion = 2;
 
 constexpr const char* kTablesOfPaths[] = {"trees", "directories", "files"};
 
@@ -94,6 +97,7 @@ void Backlog::Open(const base::PrivateDirectory& directory) {
     if (version == 0) {
         CreateTables();
     }
+    CheckWhole();
     is_new_ = Meta("state") == "new";
 }
 
@@ -104,6 +108,15 @@ Statement& Backlog::Prepared(const std::string& sql) {
         found = statements_.emplace(sql, Statement(*database_, sql)).first;
     }
     return found->second;
+}
+
+/// Where an index and its table disagree, or a number is no number, the same work would come again
+/// and again. A second or two for a million entries, when a worker starts.
+void Backlog::CheckWhole() {
+    Statement check(*database_, "PRAGMA integrity_check(1)");
+    if (!check.Step() || check.Bytes(0) != "ok") {
+        throw sqlite::Error(SQLITE_CORRUPT, "the backlog is not whole");
+    }
 }
 
 /// An entry that was read can be changed, unless table and index disagree: then the same work would
@@ -169,6 +182,11 @@ void Backlog::BeginEmpty(const std::string& rules) {
     is_new_ = false;
 }
 
+bool Backlog::HasChangedElsewhere() {
+    const std::int64_t version = Number("PRAGMA data_version");
+    return std::exchange(data_version_, version) != version;
+}
+
 std::size_t Backlog::Steps(const WorkingCopy& copy) {
     return Meta("copy") == copy.Identity() ? std::strtoull(Meta("steps").c_str(), nullptr, 10) : 0;
 }
@@ -206,6 +224,9 @@ void Backlog::Merge(const Addition& addition, const WorkingCopy& copy, const std
     for (const File& file : addition.files) {
         AddFile(file);
     }
+    for (const File& file : addition.unnamed) {
+        AddFile(file, false);
+    }
     for (const Problem& problem : addition.failures) {
         AddFailure(problem, now);
     }
@@ -229,7 +250,7 @@ void Backlog::MovePaths(const char* table, const Addition::Move& move) {
     const bool is_files = std::string_view(table) == "files";
     const std::string moved = "CAST(?2 || substr(path, length(?1) + 1) AS BLOB)";
     const std::string which = " WHERE path = ?1 OR (path >= ?3 AND path < ?4)";
-    const std::string columns = is_files ? "size, due, tries, since, reason"
+    const std::string columns = is_files ? "size, due, tries, since, reason, named"
                                 : std::string_view(table) == "trees" ? "again, x''"
                                                                      : "again";
     const std::string names = is_files                             ? columns
@@ -307,9 +328,9 @@ void Backlog::AddDirectory(Directory& directory) {
     }
 }
 
-void Backlog::AddFile(const File& file) {
-    Statement& add = Prepared("INSERT OR REPLACE INTO files VALUES(?1, ?2, 0, 0, 0, NULL)");
-    add.BindBlob(1, file.path).Bind(2, file.size).Run();
+void Backlog::AddFile(const File& file, bool is_named) {
+    Statement& add = Prepared("INSERT OR REPLACE INTO files VALUES(?1, ?2, 0, 0, 0, NULL, ?3)");
+    add.BindBlob(1, file.path).Bind(2, file.size).Bind(3, std::int64_t{is_named}).Run();
 }
 
 void Backlog::AddFailure(const Problem& problem, std::int64_t now) {
@@ -329,7 +350,7 @@ void Backlog::AddFailure(const Problem& problem, std::int64_t now) {
     // 2^20 seconds are more than kLastWait.
     const std::int64_t wait =
         std::min(kFirstWait << std::clamp<std::int64_t>(tries, 0, 20), kLastWait);
-    Statement& add = Prepared("INSERT OR REPLACE INTO files VALUES(?1, ?2, ?3, ?4, ?5, ?6)");
+    Statement& add = Prepared("INSERT OR REPLACE INTO files VALUES(?1, ?2, ?3, ?4, ?5, ?6, 1)");
     add.BindBlob(1, problem.path).Bind(2, size).Bind(3, problem.can_pass ? now + wait : kNever);
     add.Bind(4, tries + 1).Bind(5, since).BindBlob(6, problem.reason).Run();
 }
@@ -398,6 +419,36 @@ void Backlog::RemoveDirectories(const std::vector<std::int64_t>& ids) {
     transaction.Commit();
 }
 
+std::vector<Backlog::File> Backlog::UnnamedFiles(std::size_t limit) {
+    Statement& get =
+        Prepared("SELECT path, size FROM files WHERE named = 0 ORDER BY rowid LIMIT ?1");
+    const sqlite::ResetAtEnd reset(get);
+    get.Bind(1, static_cast<std::int64_t>(limit));
+    std::vector<File> files;
+    while (get.Step()) {
+        files.push_back({std::string(get.Bytes(0)), get.Int(1)});
+    }
+    return files;
+}
+
+void Backlog::NoteNamed(const std::vector<std::string>& named, const std::vector<std::string>& done,
+                        const std::vector<Directory>& trees) {
+    Transaction transaction(*database_);
+    Statement& set = Prepared("UPDATE files SET named = 1 WHERE path = ?1");
+    for (const std::string& path : named) {
+        set.BindBlob(1, path).Run();
+        CheckChanged();
+    }
+    for (const std::string& path : done) {
+        RemoveFile(path);
+        CheckChanged();
+    }
+    for (const Directory& tree : trees) {
+        AddTree(tree);
+    }
+    transaction.Commit();
+}
+
 std::vector<Backlog::File> Backlog::DueFiles(std::int64_t now, std::size_t limit) {
     Statement& get = Prepared(
         "SELECT path, size FROM files WHERE due >= 0 AND due <= ?1 ORDER "
@@ -439,7 +490,8 @@ std::optional<std::int64_t> Backlog::NextDue() {
 Backlog::Totals Backlog::GetTotals() {
     Statement& get = Prepared(
         "SELECT count(*), total(size), (SELECT count(*) FROM trees) + (SELECT count(*) "
-        "FROM directories), (SELECT count(*) FROM files WHERE reason IS NOT NULL) FROM "
+        "FROM directories) + (SELECT count(*) FROM files WHERE named = 0), (SELECT count(*) FROM "
+        "files WHERE reason IS NOT NULL) FROM "
         "files WHERE reason IS NULL");
     const sqlite::ResetAtEnd reset(get);
     get.Step();

@@ -51,7 +51,7 @@ class Backlog {
     static constexpr std::int64_t kNever = -1;
 
     struct Totals {
-        std::uint64_t places = 0;  ///< trees and directories
+        std::uint64_t places = 0;  ///< trees, directories and files to be added by name
         std::uint64_t files = 0;   ///< to be extracted for the first time
         std::uint64_t bytes = 0;   ///< their sizes
         std::uint64_t failed = 0;
@@ -67,7 +67,8 @@ class Backlog {
         std::vector<Move> moves;           ///< carried out first, in this order
         std::vector<std::string> dropped;  ///< nothing stands at or below these paths any more
         std::vector<Directory> trees;
-        std::vector<File> files;
+        std::vector<File> files;        ///< to be extracted
+        std::vector<File> unnamed;      ///< to be added by name first
         std::vector<std::string> done;  ///< files that have been extracted
         std::vector<Problem> failures;
     };
@@ -88,6 +89,9 @@ class Backlog {
     void BeginEmpty(const std::string& rules);
     /// Everything of the share is to be looked at and extracted; replaces what was waiting.
     void AddReindex(const std::string& root, const std::string& rules);
+
+    /// Whether another process has worked on the store since the last call.
+    bool HasChangedElsewhere();
 
     /// How many steps of the pass over this working copy the committed index holds: repeating a
     /// rename after later steps could move newer documents.
@@ -117,6 +121,12 @@ class Backlog {
     void AddFound(const std::vector<File>& files, std::vector<Directory*> found);
     void RemoveDirectories(const std::vector<std::int64_t>& ids);
 
+    /// The first files that are to be added by name.
+    std::vector<File> UnnamedFiles(std::size_t limit);
+    /// They have been added, and wait for their extraction; or they need none.
+    void NoteNamed(const std::vector<std::string>& named, const std::vector<std::string>& done,
+                   const std::vector<Directory>& trees);
+
     /// Files whose time has come by `now`, in seconds since the epoch.
     std::vector<File> DueFiles(std::int64_t now, std::size_t limit);
     /// They have been extracted, or need not be.
@@ -141,6 +151,7 @@ class Backlog {
     void Close();
     void CreateTables();
     void CheckChanged();
+    void CheckWhole();
     sqlite::Statement& Prepared(const std::string& sql);
     std::string Meta(const char* key);
     void SetMeta(const char* key, const std::string& value);
@@ -150,12 +161,13 @@ class Backlog {
     void DropPaths(const std::string& path);
     void AddTree(const Directory& tree);
     void AddDirectory(Directory& directory);
-    void AddFile(const File& file);
+    void AddFile(const File& file, bool is_named = true);
     void AddFailure(const Problem& problem, std::int64_t now);
     void RemoveFile(const std::string& path);
 
     std::optional<sqlite::Database> database_;
     std::unordered_map<std::string, sqlite::Statement> statements_;
+    std::int64_t data_version_ = 0;
     bool is_new_ = false;
 };
 

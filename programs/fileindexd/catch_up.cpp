@@ -45,9 +45,10 @@ class CatchUp::Work {
         do {
             if (const auto tree = backlog_.FirstTree()) {
                 ListTree(*tree);
-            } else if (!WalkDirectories() && !ExtractFiles()) {
+            } else if (!WalkDirectories() && !NameFiles() && !ExtractFiles()) {
                 break;
             }
+            slice_.has_worked = true;
         } while (Clock::now() < until_);
         slice_.counts = batch_.GetCounts();
         return slice_;
@@ -66,6 +67,7 @@ class CatchUp::Work {
     void Flush();
     void Sort(const Entry& entry, const std::unordered_map<std::string, Attributes>& indexed);
 
+    bool NameFiles();
     bool ExtractFiles();
     bool IsToBeExtracted(const Backlog::File& file, Extraction& job);
     void TakeOutcome(const Extraction& job, const Backlog::File& file);
@@ -314,6 +316,38 @@ void CatchUp::Work::Sort(const Entry& entry,
     if (!is_known || !needs_content) {
         names_.emplace_back(entry.path, false);
     }
+}
+
+/// Files of a pass that had too many. False when none is waiting for its name.
+bool CatchUp::Work::NameFiles() {
+    const std::vector<Backlog::File> files = backlog_.UnnamedFiles(kFindChunk);
+    std::vector<Extraction> jobs;
+    std::vector<std::string> paths;
+    for (const Backlog::File& file : files) {
+        Extraction job;
+        if (IsToBeExtracted(file, job)) {
+            paths.push_back(job.path);
+            jobs.push_back(std::move(job));
+        }
+    }
+    std::unordered_set<std::string> known;
+    for (Document& document : share_.index.Find(paths)) {
+        known.insert(std::move(document.path));
+    }
+    std::vector<std::string> named;
+    for (const Extraction& job : jobs) {
+        if (!job.need_meta || !known.contains(job.path)) {
+            batch_.Upsert(job.path, false, true);
+        }
+        (job.need_meta ? named : done_).push_back(job.path);
+    }
+    batch_.Commit();
+    if (!files.empty()) {
+        backlog_.NoteNamed(named, std::exchange(done_, {}), std::exchange(trees_, {}));
+        backlog_.NoteFiles({}, std::exchange(failures_, {}), {}, now_);
+        NoteProblems();
+    }
+    return !files.empty();
 }
 
 /// False when no file is due.

@@ -33,6 +33,7 @@ class CatchUp {
     };
     /// What a slice did.
     struct Slice {
+        bool has_worked = false;  ///< there was something to do
         Counts counts;
         std::uint64_t files = 0;  ///< whose content was extracted
         std::uint64_t bytes = 0;  ///< their sizes

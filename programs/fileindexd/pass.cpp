@@ -24,10 +24,6 @@ constexpr const char* kUnit = "pass";
 /// With more changes than this at once, none is the one of a file that is too busy.
 constexpr std::size_t kMaxChanged = 1000;
 
-/// How long a pass extracts content itself: a person who saves a file is served at once, and nobody
-/// waits for the ten thousand that are being copied.
-constexpr std::chrono::milliseconds kContentTime{300};
-
 constexpr ContentClasses kAllClasses{true, true, true, true};
 
 ContentClasses ClassesOf(const Json::Value& settings) {
@@ -51,7 +47,7 @@ Pass::Pass(Share share, Index& index, const Scope& scope, PassListener listener)
       scope_(scope),
       listener_(std::move(listener)),
       rules_(scope_.Describe(share_.root)),
-      content_until_(std::chrono::steady_clock::now() + kContentTime) {}
+      until_(std::chrono::steady_clock::now() + share_.files_time) {}
 
 PassResult Pass::Run() {
     PassResult result;
@@ -258,15 +254,12 @@ void Pass::RunSingle(const OP& op) {
     }
 }
 
-/// The content of a few files now, that of many by and by, so that a pass stays short.
+/// A few files now, many by and by, so that a pass stays short.
 void Pass::UpsertFile(const std::string& path, std::int64_t size) {
-    if (std::chrono::steady_clock::now() < content_until_ || !scope_.NeedsMeta(path)) {
+    if (std::chrono::steady_clock::now() < until_) {
         batch_->Upsert(path, false);
-        return;
-    }
-    addition_.files.push_back({path, size});
-    if (index_.Find({path}).empty()) {
-        batch_->Upsert(path, false, true);
+    } else {
+        addition_.unnamed.push_back({path, size});
     }
 }
 

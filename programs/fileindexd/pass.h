@@ -38,6 +38,9 @@ class Pass {
         std::string queue_path;
         std::string root;
         Backlog& backlog;
+        /// How long a pass takes files in itself: a person who saves a file is served at once, and
+        /// nobody waits for the ten thousand that are being copied.
+        std::chrono::milliseconds files_time{300};
     };
 
     /// All references must outlive the object.
@@ -79,7 +82,7 @@ class Pass {
     const Scope& scope_;
     const PassListener listener_;
     const std::string rules_;
-    const std::chrono::steady_clock::time_point content_until_;
+    const std::chrono::steady_clock::time_point until_;  ///< files are taken in; then they are left
 
     // Of the pass at work.
     WorkingCopy copy_;

@@ -27,6 +27,9 @@ constexpr const char* kUnit = "queue_watch";
 /// More new lines than this are a burst that is no busy file's alone.
 constexpr std::size_t kReadAtMost = 64 * 1024;
 
+/// A queue that cannot be read may hold lines: the pass will find out.
+constexpr std::chrono::seconds kLookAgain{1};
+
 std::string NewText(int fd, off_t offset) {
     std::string text(kReadAtMost, '\0');
     ssize_t size;
@@ -114,7 +117,10 @@ void QueueWatch::ReadNewLines(Schedule& schedule, const ChangeRates& rates, Cloc
     const quivra::base::UniqueFd fd = quivra::base::OpenRegular(directory_.Fd(), queue_, O_RDONLY);
     struct stat info {};
     if (!fd.IsValid() || fstat(fd.Get(), &info) != 0) {
-        return;  // a pass, perhaps of another process, has taken it
+        if (errno != ENOENT) {
+            schedule.QueueChangedLater(now + kLookAgain);  // out of descriptors, for instance
+        }
+        return;  // else a pass, perhaps of another process, has taken it
     }
     if (info.st_ino != inode_ || info.st_size < offset_) {
         inode_ = info.st_ino;

@@ -94,6 +94,17 @@ PrivateDirectory OpenPlace(const std::string& path) {
                 "Cannot open " + path + ": " + quivra::SystemErrorText(errno));
 }
 
+/// Where the place is not right, the platform tells no path; then it is where it has always been,
+/// and opening it tells what is wrong.
+std::string QueuePath(const std::string& share) {
+    const quivra::sdk::SDKShare record(share);
+    try {
+        return record.GetQueuePath();
+    } catch (const Error&) {
+        return record.GetPath() + "/@eaDir/fileindex/queue";
+    }
+}
+
 }  // namespace
 
 ShareWorker::ShareWorker(std::string share)
@@ -105,7 +116,7 @@ std::string ShareWorker::QueueName() const {
 
 void ShareWorker::Open() {
     try {
-        const std::string queue = quivra::sdk::SDKShare(share_).GetQueuePath();
+        const std::string queue = QueuePath(share_);
         if (!place_) {
             PrivateDirectory directory = OpenPlace(std::string(quivra::base::Directory(queue)));
             CheckFiles(directory, std::string(quivra::base::Name(queue)));
@@ -133,6 +144,9 @@ auto ShareWorker::Guard(const std::function<void()>& between, Function work) {
     const quivra::base::UniqueFd lock = LockShare(share_, between);
     try {
         Open();
+        if (place_->backlog.HasChangedElsewhere()) {
+            place_->catch_up.ForgetAll();  // the directory at work may have been read by `--once`
+        }
         return work();
     } catch (const Stopped&) {
         throw;

@@ -214,8 +214,14 @@ class Worker {
 
     /// One that failed waits as a pass does; fresh changes need not wait for it.
     void RunSlice() {
-        if (Try([this] { work_.RunSlice(StopWhenAsked); })) {
+        bool has_worked = false;
+        if (Try([&] { has_worked = work_.RunSlice(StopWhenAsked).has_worked; })) {
             slice_failures_ = 0;
+            if (!has_worked) {
+                // Another process has left a working copy, which comes first.
+                slices_again_ = Clock::now() + Schedule::kFirstRetry;
+                schedule_.QueueChangedLater(slices_again_);
+            }
         } else {
             slices_again_ = Clock::now() + Schedule::RetryAfter(slice_failures_++);
         }

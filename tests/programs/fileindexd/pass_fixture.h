@@ -131,8 +131,8 @@ class PassTest : public testing::Test {
     }
 
     PassResult RunPass(PassListener listener = {}) {
-        Pass pass({directory_, directory_.Path() + "/queue", Root(), *backlog_}, *index_, scope_,
-                  std::move(listener));
+        Pass pass({directory_, directory_.Path() + "/queue", Root(), *backlog_, files_time_},
+                  *index_, scope_, std::move(listener));
         const PassResult result = pass.Run();
         catch_up_->Forget(result.left);
         return result;
@@ -182,6 +182,7 @@ class PassTest : public testing::Test {
 
     const std::string root_ = "/volume1/share";
     const std::string queue_ = root_ + "/@eaDir/fileindex/queue";
+    std::chrono::milliseconds files_time_{300};
     quivra::base::PrivateDirectory directory_;
     std::unique_ptr<Backlog> backlog_;
     std::unique_ptr<CatchUp> catch_up_;
