@@ -1,9 +1,12 @@
 // How much the way through library, socket and daemon costs: documents a second by IndexUpsert and
-// IndexCommit, against the same documents added to a Xapian database in this process. Run it in the
-// sandbox: scripts/sandbox build/release/bench/document_path [FILES]
+// IndexCommit, against the same texts added to a bare FTS5 table (tokenizer unicode61) by one
+// thread of this process. CPU time, and what was written, of the daemon are told apart. Run it in
+// the sandbox: scripts/sandbox build/release/bench/document_path [FILES]
 
 #include <kesto/content_extract.h>
-#include <xapian.h>
+#include <sqlite3.h>
+#include <sys/resource.h>
+#include <unistd.h>
 
 #include <chrono>
 #include <cstdio>
@@ -11,7 +14,10 @@
 #include <filesystem>
 #include <fstream>
 #include <functional>
+#include <iterator>
 #include <random>
+#include <sstream>
+#include <string>
 #include <vector>
 
 #include "common/json.h"
@@ -65,63 +71,103 @@ double SecondsOf(const std::function<void()>& work) {
     return std::chrono::duration<double>(Clock::now() - start).count();
 }
 
-/// The terms that a search of the kind the daemon offers needs: words of every searched field, by
-/// field and over all, parts of the name, ancestors of the path, values of numbers and dates.
-Xapian::Document MakeDocument(const Json::Value& fields, Xapian::TermGenerator& generator) {
-    Xapian::Document document;
-    generator.set_document(document);
-    unsigned int slot = 0;
-    for (auto it = fields.begin(); it != fields.end(); ++it) {
-        const std::string prefix = "X" + std::to_string(slot) + ":";
-        if (it->isString()) {
-            generator.index_text(it->asString(), 1, prefix);
-            generator.index_text_without_positions(it->asString());
-        } else {
-            document.add_value(slot, Xapian::sortable_serialise(it->asDouble()));
-        }
-        ++slot;
-    }
-    const std::string name = fields["KESTOMDFSName"].asString();
-    for (std::size_t size = 1; size <= 3; ++size) {
-        for (std::size_t i = 0; i + size <= name.size(); ++i) {
-            document.add_boolean_term("XN" + name.substr(i, size));
-        }
-    }
-    const std::string path = fields["KESTOMDPath"].asString();
-    document.add_boolean_term("Q" + path);
-    for (std::size_t i = path.find('/', 1); i != std::string::npos; i = path.find('/', i + 1)) {
-        document.add_boolean_term("XA" + path.substr(0, i));
-    }
-    document.set_data(quivra::toString(fields));
-    return document;
+/// Seconds of CPU of this process so far.
+double OwnCpu() {
+    rusage usage{};
+    getrusage(RUSAGE_SELF, &usage);
+    const auto seconds = [](const timeval& time) {
+        return static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_usec) / 1e6;
+    };
+    return seconds(usage.ru_utime) + seconds(usage.ru_stime);
 }
 
-double FloorSeconds(const std::vector<std::string>& paths) {
-    std::vector<Json::Value> documents(paths.size());
-    Json::Value cfg;
-    cfg["need_meta"] = true;
-    for (std::size_t i = 0; i < paths.size(); ++i) {
-        KESTO::CONTENT_EXTRACT::ParseFile(paths[i], cfg, documents[i]);
+/// Of another process.
+double CpuOf(pid_t pid) {
+    std::ifstream stat("/proc/" + std::to_string(pid) + "/stat");
+    std::string text;
+    std::getline(stat, text);
+    std::istringstream rest(text.substr(text.rfind(')') + 2));
+    std::string skipped;
+    for (int field = 3; field < 14; ++field) {
+        rest >> skipped;
     }
-    return SecondsOf([&] {
-        Xapian::WritableDatabase database("/volume1/floor", Xapian::DB_CREATE_OR_OVERWRITE);
-        Xapian::TermGenerator generator;
-        for (const Json::Value& fields : documents) {
-            const std::string id = "Q" + fields["KESTOMDPath"].asString();
-            database.replace_document(id, MakeDocument(fields, generator));
+    double user = 0;
+    double system = 0;
+    rest >> user >> system;
+    return (user + system) / static_cast<double>(sysconf(_SC_CLK_TCK));
+}
+
+/// The number behind `name` in a file of /proc/PID.
+double ProcNumber(pid_t pid, const char* file, const std::string& name) {
+    std::ifstream in("/proc/" + std::to_string(pid) + "/" + file);
+    for (std::string line; std::getline(in, line);) {
+        if (line.starts_with(name)) {
+            return std::atof(line.substr(name.size()).c_str());
         }
-        database.commit();
+    }
+    return 0;
+}
+
+struct Cost {
+    double wall = 0;
+    double cpu = 0;
+};
+
+Cost CostOf(const std::function<double()>& cpu, const std::function<void()>& work) {
+    const double before = cpu();
+    Cost cost;
+    cost.wall = SecondsOf(work);
+    cost.cpu = cpu() - before;
+    return cost;
+}
+
+Cost Floor(const std::vector<std::string>& paths) {
+    std::vector<std::string> texts;
+    for (const std::string& path : paths) {
+        std::ifstream file(path);
+        texts.emplace_back(std::istreambuf_iterator<char>(file), std::istreambuf_iterator<char>());
+    }
+    sqlite3* database = nullptr;
+    sqlite3_open("/volume1/floor", &database);
+    const Cost cost = CostOf(OwnCpu, [&] {
+        sqlite3_exec(database,
+                     "PRAGMA journal_mode=WAL; CREATE VIRTUAL TABLE t USING fts5(text, content='');"
+                     "BEGIN",
+                     nullptr, nullptr, nullptr);
+        sqlite3_stmt* insert = nullptr;
+        sqlite3_prepare_v2(database, "INSERT INTO t(rowid, text) VALUES(?, ?)", -1, &insert,
+                           nullptr);
+        for (std::size_t i = 0; i < texts.size(); ++i) {
+            sqlite3_bind_int64(insert, 1, static_cast<sqlite3_int64>(i) + 1);
+            sqlite3_bind_text(insert, 2, texts[i].data(), static_cast<int>(texts[i].size()),
+                              SQLITE_STATIC);
+            sqlite3_step(insert);
+            sqlite3_reset(insert);
+        }
+        sqlite3_finalize(insert);
+        sqlite3_exec(database, "COMMIT", nullptr, nullptr, nullptr);
     });
+    sqlite3_close(database);
+    return cost;
 }
 
-double UpsertSeconds(const std::vector<std::string>& paths) {
+Cost Upsert(const std::vector<std::string>& paths, pid_t daemon) {
     elastic::ShareIndexCreate("bench");
-    return SecondsOf([&] {
-        for (const std::string& path : paths) {
-            elastic::IndexUpsert("bench", path, true);
-        }
-        elastic::IndexCommit("bench");
-    });
+    return CostOf([&] { return OwnCpu() + CpuOf(daemon); },
+                  [&] {
+                      for (const std::string& path : paths) {
+                          elastic::IndexUpsert("bench", path, true);
+                      }
+                      elastic::IndexCommit("bench");
+                  });
+}
+
+double SizeOf(const std::string& directory) {
+    double size = 0;
+    for (const fs::directory_entry& entry : fs::recursive_directory_iterator(directory)) {
+        size += entry.is_regular_file() ? static_cast<double>(entry.file_size()) : 0;
+    }
+    return size;
 }
 
 }  // namespace
@@ -138,12 +184,22 @@ int main(int argc, char** argv) {
     const support::Program engine =
         support::StartDaemon("kestoelasticd", "/var/run/kestoelasticd.sock");
 
-    const double floor = FloorSeconds(paths);
-    const double seconds = UpsertSeconds(paths);
+    const Cost floor = Floor(paths);
+    const Cost cost = Upsert(paths, engine.Pid());
     const auto count = static_cast<double>(paths.size());
-    std::printf("documents                        %10.0f\n", count);
-    std::printf("floor, Xapian in one process     %10.0f documents/s\n", count / floor);
-    std::printf("library, socket and daemon       %10.0f documents/s\n", count / seconds);
-    std::printf("ratio to the floor               %10.2f\n", seconds / floor);
+    const double texts = SizeOf(kRoot) - SizeOf(kRoot + "/@eaDir");
+    const double index = SizeOf(kRoot + "/@eaDir");
+    std::printf("documents, MB of text            %10.0f %9.1f\n", count, texts / 1e6);
+    std::printf("floor, bare FTS5: wall, CPU s    %10.2f %9.2f\n", floor.wall, floor.cpu);
+    std::printf("library, socket, daemon          %10.2f %9.2f\n", cost.wall, cost.cpu);
+    std::printf("of that, CPU s of the daemon     %20.2f\n", CpuOf(engine.Pid()));
+    std::printf("ratio to the floor               %10.2f %9.2f\n", cost.wall / floor.wall,
+                cost.cpu / floor.cpu);
+    std::printf("index and log: MB, to the text   %10.1f %9.2f\n", index / 1e6, index / texts);
+    std::printf("daemon wrote: MB, to the index   %10.1f %9.2f\n",
+                ProcNumber(engine.Pid(), "io", "write_bytes: ") / 1e6,
+                ProcNumber(engine.Pid(), "io", "write_bytes: ") / index);
+    std::printf("daemon's memory, highest: MB     %10.1f\n",
+                ProcNumber(engine.Pid(), "status", "VmHWM:") / 1024);
     return 0;
 }

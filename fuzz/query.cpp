@@ -1,36 +1,40 @@
+#include <unistd.h>
+
 #include <cstdint>
+#include <memory>
 #include <string>
 
+#include "base/private_directory.h"
 #include "common/error.h"
 #include "common/json.h"
-#include "programs/kestoelasticd/document_editor.h"
-#include "programs/kestoelasticd/record.h"
+#include "programs/kestoelasticd/codes.h"
+#include "programs/kestoelasticd/engine/sqlite/sqlite_index.h"
+#include "programs/kestoelasticd/json_values.h"
+#include "programs/kestoelasticd/mapping.h"
 #include "programs/kestoelasticd/search.h"
 
 namespace {
 
-using elasticd::FieldTable;
-using elasticd::Mapping;
+using quivra::base::PrivateDirectory;
 
-/// A database in memory with a field of each kind.
+/// An index with a field of each kind.
 struct Fixture {
     Fixture() {
+        std::string path = "/tmp/fuzz_query_XXXXXX";
+        directory = PrivateDirectory::Open(mkdtemp(path.data()));
+        elasticd::engine::sqlite::Create(directory, *schema);
+        index = elasticd::engine::sqlite::Open(directory, schema);
         Json::Value fields;
         quivra::fromString(fields, R"({"size": 5, "length": 1.5, "dir": true, "name": "A b.txt",
                                        "title": "Some words", "KESTOMDTextContent": "body"})");
         for (const std::string id : {"/a/b", "/a/c", "/d\xff"}) {
-            Xapian::Document document;
-            elasticd::DocumentEditor editor(mapping, table, document);
-            elasticd::Record record;
-            editor.AddId(id);
+            elasticd::engine::Document document{id, {}};
             for (auto it = fields.begin(); it != fields.end(); ++it) {
-                editor.AddField(it.name(), *it);
-                elasticd::AppendJson(record[table.FindOrAdd(it.name())], *it);
+                document.fields.push_back({it.name(), elasticd::ToValue(*it)});
             }
-            editor.Finish();
-            document.set_data(elasticd::EncodeRecord(record));
-            database.add_document(document);
+            index->Upsert(document);
         }
+        index->Commit();
     }
 
     static Json::Value Mappings() {
@@ -42,9 +46,10 @@ struct Fixture {
         return mappings;
     }
 
-    Mapping mapping{Mappings()};
-    FieldTable table;
-    Xapian::WritableDatabase database{std::string(), Xapian::DB_BACKEND_INMEMORY};
+    std::shared_ptr<const elasticd::engine::Schema> schema =
+        std::make_shared<elasticd::engine::Schema>(elasticd::ReadMapping(Mappings()));
+    PrivateDirectory directory;
+    std::unique_ptr<elasticd::engine::Index> index;
 };
 
 }  // namespace
@@ -57,13 +62,18 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
         return 0;
     }
     try {
+        const elasticd::Search search(query, *fixture.schema);
         const elasticd::SearchResult found =
-            elasticd::Search(query, fixture.mapping, fixture.table, fixture.database);
+            elasticd::RunSearch(search, *fixture.schema, *fixture.index);
         Json::Value hits;
         if (!quivra::fromString(hits, found.data) || !hits.isArray() || hits.size() > found.total) {
             __builtin_trap();
         }
-    } catch (const quivra::Error&) {
+    } catch (const quivra::Error& error) {
+        // The engine must understand what the front has let through.
+        if (static_cast<int>(error.code) == elasticd::kEngineFailed) {
+            __builtin_trap();
+        }
     }
     return 0;
 }

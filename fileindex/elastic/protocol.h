@@ -53,6 +53,7 @@ enum Code : int {
     kReplyTooLarge = 1416,     ///< the result exceeds what one reply may hold: use "limit"
     kIndexMadeAnew = 1417,     ///< the index was found damaged or missing and is empty now: queue a
                                ///< reindex of the share, send "index_accept", then write
+    kTooSlow = 1418,           ///< the query took longer than its "timeout", or the default
 };
 
 /// The fields of a document that code names. GetFileIndexMappings has all that are indexed in a way

@@ -5,11 +5,13 @@
 #include <algorithm>
 #include <utility>
 
+#include "base/path.h"
 #include "common/error.h"
 #include "common/log.h"
-#include "common/util.h"
 #include "programs/kestoelasticd/codes.h"
+#include "programs/kestoelasticd/engine/sqlite/sqlite_index.h"
 #include "programs/kestoelasticd/index_directory.h"
+#include "programs/kestoelasticd/mapping.h"
 
 namespace elasticd {
 namespace {
@@ -25,8 +27,7 @@ std::string MakeUuid() {
 
 /// Whether one of the directories lies within the other, or they are the same.
 bool Overlap(const std::string& one, const std::string& other) {
-    return quivra::StringStartWith(one + "/", other + "/") ||
-           quivra::StringStartWith(other + "/", one + "/");
+    return quivra::base::IsAtOrBelow(one, other) || quivra::base::IsAtOrBelow(other, one);
 }
 
 }  // namespace
@@ -113,9 +114,10 @@ std::shared_ptr<Index> Catalog::Use(const std::string& id) {
     if (entry->second.move) {
         throw Error(kIndexUnavailable, "The index was being moved, and is at neither place: " + id);
     }
-    auto index = std::make_shared<Index>(entry->second.path,
-                                         std::make_shared<Mapping>(entry->second.mappings),
-                                         entry->second.paused, min_free_);
+    auto index = std::make_shared<Index>(
+        Index::Place{entry->second.path, entry->second.uuid},
+        std::make_shared<const engine::Schema>(ReadMapping(entry->second.mappings)),
+        entry->second.paused, entry->second.fresh, min_free_);
     in_use_.emplace(id, index);
     return index;
 }
@@ -172,11 +174,11 @@ void Catalog::CheckPathIsFree(const std::string& path, const std::string& own_id
     }
 }
 
-void Catalog::MakeFiles(const IndexEntry& entry) const {
-    const Mapping mapping(entry.mappings);
-    MakeIndexDirectory(entry.path, entry.uuid);
+void Catalog::MakeFiles(const IndexEntry& entry) {
+    const engine::Schema schema = ReadMapping(entry.mappings);
+    const quivra::base::PrivateDirectory directory = MakeIndexDirectory(entry.path, entry.uuid);
     try {
-        IndexWriter::Create(DatabasePath(entry.path), mapping);
+        engine::sqlite::Create(directory, schema);
     } catch (...) {
         RemoveIndexDirectory(entry.path, entry.uuid);
         throw;
@@ -187,12 +189,12 @@ void Catalog::Create(const std::string& id, const std::string& path, const Json:
     std::unique_lock lock(mutex_);
     const auto found = registry_.entries.find(id);
     if (found != registry_.entries.end()) {
-        CheckIsThere(id, found->second, path);
+        CheckIsThere(lock, id, path);
         return;
     }
     CheckIdIsFree(id);
     CheckPathIsFree(path, std::string());
-    const Mapping checked(mappings);
+    ReadMapping(mappings);  // throws where it cannot be followed
     IndexEntry entry;
     entry.path = path;
     entry.uuid = MakeUuid();
@@ -215,15 +217,127 @@ void Catalog::Create(const std::string& id, const std::string& path, const Json:
     }
 }
 
-void Catalog::CheckIsThere(const std::string& id, const IndexEntry& entry,
+/// An index that has vanished is made anew; one that is only damaged is found out when it is used.
+void Catalog::CheckIsThere(std::unique_lock<std::mutex>& lock, const std::string& id,
                            const std::string& path) {
+    const IndexEntry& entry = registry_.entries.at(id);
     if (entry.path != path) {
         throw Error(kIndexExists, "The index has another path: " + entry.path);
     }
     Use(id);  // busy?
     if (!entry.move && !IsIndexDirectory(path, entry.uuid)) {
-        in_use_.erase(id);
+        lock.unlock();
+        MakeAnew(id, path + " is gone");
+    }
+}
+
+void Catalog::MakeAnew(const std::string& id, const std::string& why) {
+    std::unique_lock lock(mutex_);
+    const std::shared_ptr<Index> index = Use(id);
+    if (!index->BeginMove()) {
+        throw Error(kBusy, "The index is being moved: " + id);
+    }
+    const IndexEntry entry = registry_.entries.at(id);
+    lock.unlock();
+    struct End {
+        Index& index;
+        const std::string& path;
+        ~End() { index.EndMove(path); }
+    } end{*index, entry.path};
+    index->Close();
+    std::string aside;
+    try {
+        aside = SetAside(entry.path);
+        // Before the files: an empty index that nobody knows to be empty would stay so.
+        lock.lock();
+        registry_.entries.at(id).fresh = true;
+        registry_.Save();
+        lock.unlock();
+        index->SetFresh(true);
         MakeFiles(entry);
+    } catch (const Error& error) {
+        const int code = error.code;
+        throw Error(code == kNoSpace ? kNoSpace : kIndexUnavailable,
+                    "The index " + id + " cannot be made anew: " + error.reason);
+    }
+    quivra::LogError({"catalog", __LINE__}, "The index %s was made anew: %s%s%s", id.c_str(),
+                     why.c_str(), aside.empty() ? "" : "; what was left of it is ", aside.c_str());
+}
+
+void Catalog::Accept(const std::string& id) {
+    const std::lock_guard lock(mutex_);
+    const std::shared_ptr<Index> index = Use(id);
+    IndexEntry& entry = registry_.entries.at(id);
+    if (std::exchange(entry.fresh, false)) {
+        try {
+            registry_.Save();
+        } catch (...) {
+            entry.fresh = true;
+            throw;
+        }
+    }
+    index->SetFresh(false);
+}
+
+Json::Value Catalog::GetStates() {
+    std::vector<std::string> ids;
+    {
+        const std::lock_guard lock(mutex_);
+        for (const auto& [id, entry] : registry_.entries) {
+            ids.push_back(id);
+        }
+    }
+    Json::Value states;
+    states["indexes"] = Json::arrayValue;
+    for (const std::string& id : ids) {
+        states["indexes"].append(GetState(id));
+    }
+    return states;
+}
+
+/// Twice at most: what was damaged is new then.
+Json::Value Catalog::GetState(const std::string& id) {
+    Json::Value json;
+    json["id"] = id;
+    json["problem"] = "";
+    for (int attempt = 0; attempt < 2; ++attempt) {
+        try {
+            const engine::State state = Find(id)->GetState();
+            json["documents"] = Json::UInt64{state.documents};
+            json["bytes"] = Json::UInt64{state.bytes};
+            json["reclaimable"] = Json::UInt64{state.reclaimable};
+            break;
+        } catch (const engine::Damaged& damage) {
+            try {
+                MakeAnew(id, damage.reason);
+            } catch (const Error& error) {
+                json["problem"] = error.reason;
+                break;
+            }
+        } catch (const Error& error) {
+            json["problem"] = error.reason;
+            break;
+        }
+    }
+    const std::lock_guard lock(mutex_);
+    const auto entry = registry_.entries.find(id);
+    json["fresh"] = entry != registry_.entries.end() && entry->second.fresh;
+    return json;
+}
+
+void Catalog::Maintain() {
+    std::vector<std::shared_ptr<Index>> indexes;
+    {
+        const std::lock_guard lock(mutex_);
+        for (const auto& [id, index] : in_use_) {
+            indexes.push_back(index);
+        }
+    }
+    for (const std::shared_ptr<Index>& index : indexes) {
+        try {
+            index->Maintain();
+        } catch (const Error&) {  // whoever uses it next is told
+        }
     }
 }
 

@@ -7,6 +7,7 @@
 #include <memory>
 #include <mutex>
 #include <string>
+#include <vector>
 
 #include "programs/kestoelasticd/index.h"
 #include "programs/kestoelasticd/registry.h"
@@ -32,6 +33,17 @@ class Catalog {
     /// Also succeeds when there is no such index.
     void Delete(const std::string& id);
     void SetPaused(const std::string& id, bool paused);
+    /// Takes an index that was made anew into service again.
+    void Accept(const std::string& id);
+
+    /// Sets aside what is left of an index that was found damaged or missing, and makes it anew,
+    /// empty and fresh. Throws Error 1401 while it is being moved, 1413 where its place is missing.
+    void MakeAnew(const std::string& id, const std::string& why);
+    /// How each index is; opens those that are not in use. One that is damaged is made anew.
+    Json::Value GetStates();
+    /// Gives space back where nothing happens.
+    void Maintain();
+
     /// Gives the index a new id, a new path, or both; an empty text leaves that one as it is. Other
     /// requests for the index are answered with 1401 meanwhile. Succeeds when it has been done
     /// before. Throws Error 1404, 1405, 1413, 1414, 1412; then the index is as it was.
@@ -48,11 +60,13 @@ class Catalog {
     Entries::iterator FindSettled(const std::string& id);
     Entries::iterator FindMovingTo(const std::string& id);
     std::shared_ptr<Index> Use(const std::string& id);
-    void MakeFiles(const IndexEntry& entry) const;
+    static void MakeFiles(const IndexEntry& entry);
+    Json::Value GetState(const std::string& id);
     Entries::iterator Rekey(Entries::iterator entry, const std::string& new_id);
     void Move(std::unique_lock<std::mutex>& lock, const std::string& id,
               const IndexEntry::Move& target);
-    void CheckIsThere(const std::string& id, const IndexEntry& entry, const std::string& path);
+    void CheckIsThere(std::unique_lock<std::mutex>& lock, const std::string& id,
+                      const std::string& path);
     void GiveUpMove(Index& index, const std::string& id, const std::string& old_path,
                     const std::string& new_path);
     void Switch(const std::string& id, const std::string& leftover);

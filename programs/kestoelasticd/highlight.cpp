@@ -4,7 +4,7 @@
 #include <utility>
 #include <vector>
 
-#include "programs/kestoelasticd/analyzer.h"
+#include "programs/kestoelasticd/engine/words.h"
 
 namespace elasticd {
 namespace {
@@ -12,33 +12,47 @@ namespace {
 /// Bytes of the text: [first, second).
 using Span = std::pair<std::size_t, std::size_t>;
 
-/// The standard words of the text that are asked for, up to one excerpt behind the first.
-std::vector<Span> FindWords(const std::string& text, const std::set<std::string>& words,
-                            std::size_t length) {
-    std::vector<Span> found;
-    Analyze(Analyzer::kStandard, Purpose::kIndex, text, [&](const Token& token) {
-        if (words.contains(std::string(token.text))) {
-            found.emplace_back(token.begin, token.end);
+/// Where the word ends that is asked for; 0 where it is not. Of a pair of characters of which only
+/// the first was asked for, only that one counts.
+std::size_t EndOfAsked(const engine::Word& word, const std::string& text, const AskedWords& words) {
+    if (words.whole.contains(std::string(word.text))) {
+        return word.end;
+    }
+    for (const std::string& beginning : words.beginnings) {
+        if (word.text.starts_with(beginning)) {
+            const bool pair = word.kind == engine::Word::Kind::kPair;
+            return pair ? word.begin + engine::CharacterSize(text, word.begin) : word.end;
         }
-        return found.empty() || token.begin < found.front().first + length;
+    }
+    return 0;
+}
+
+/// The words of the text that are asked for, up to one excerpt behind the first.
+std::vector<Span> FindWords(const std::string& text, const AskedWords& words, std::size_t length) {
+    std::vector<Span> found;
+    engine::CutWords(text, engine::Purpose::kIndex, [&](const engine::Word& word) {
+        if (const std::size_t end = EndOfAsked(word, text, words)) {
+            found.emplace_back(word.begin, end);
+        }
+        return found.empty() || word.begin < found.front().first + length;
     });
     return found;
 }
 
 /// The parts of the text that are asked for. Folding changes sizes, so the place of each folded
 /// byte is kept.
-std::vector<Span> FindParts(const std::string& text, const std::set<std::string>& words) {
+std::vector<Span> FindParts(const std::string& text, const AskedWords& words) {
     std::string folded;
     std::vector<std::size_t> places;
     for (std::size_t pos = 0; pos < text.size();) {
-        const std::size_t size = CharacterSize(text, pos);
-        folded += Fold(std::string_view(text).substr(pos, size));
+        const std::size_t size = engine::CharacterSize(text, pos);
+        folded += engine::Fold(std::string_view(text).substr(pos, size));
         places.resize(folded.size(), pos);
         pos += size;
     }
     places.push_back(text.size());
     std::vector<Span> found;
-    for (const std::string& word : words) {
+    for (const std::string& word : words.whole) {
         for (std::size_t at = folded.find(word); at != std::string::npos && !word.empty();
              at = folded.find(word, at + word.size())) {
             found.emplace_back(places[at], places[at + word.size()]);
@@ -67,8 +81,8 @@ bool IsInsideCharacter(const std::string& text, std::size_t pos) {
 
 }  // namespace
 
-std::string Highlight(const FieldSettings& settings, const std::string& text,
-                      const std::set<std::string>& words, const HighlightStyle& style) {
+std::string Highlight(const engine::FieldSettings& settings, const std::string& text,
+                      const AskedWords& words, const HighlightStyle& style) {
     const std::vector<Span> spans =
         Merged(settings.ngram ? FindParts(text, words) : FindWords(text, words, style.length));
     if (spans.empty()) {

@@ -1,9 +1,9 @@
 #pragma once
 
-#include <set>
 #include <string>
 
-#include "programs/kestoelasticd/mapping.h"
+#include "programs/kestoelasticd/engine/schema.h"
+#include "programs/kestoelasticd/query.h"
 
 namespace elasticd {
 
@@ -13,9 +13,9 @@ struct HighlightStyle {
     std::size_t length = 160;  ///< of the excerpt, in bytes, without the marks
 };
 
-/// An excerpt of `text` around the first of the folded `words` in it, with each of them marked;
-/// empty when there is none. The excerpt is cut between characters.
-std::string Highlight(const FieldSettings& settings, const std::string& text,
-                      const std::set<std::string>& words, const HighlightStyle& style);
+/// An excerpt of `text` around the first of the asked words in it, with each of them marked; empty
+/// when there is none. The excerpt is cut between characters.
+std::string Highlight(const engine::FieldSettings& settings, const std::string& text,
+                      const AskedWords& words, const HighlightStyle& style);
 
 }  // namespace elasticd

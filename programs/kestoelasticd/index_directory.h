@@ -2,26 +2,46 @@
 
 #include <string>
 
-/// The directory of an index on disk: the search engine's database in "glass" and a marker file
-/// that says whose it is. Nothing without the right marker is ever removed.
+#include "base/private_directory.h"
+
+/// The directory of an index on disk: the engine's files and a marker that says whose they are.
+/// Nothing without a marker is ever removed. Everything goes by descriptors: the directory lies
+/// where users may rename what is above it.
 namespace elasticd {
 
-std::string DatabasePath(const std::string& directory);
+/// What lies at the path of an index.
+enum class Found {
+    kIndex,      ///< the index, in the format that we write
+    kOldFormat,  ///< the index as an earlier release wrote it
+    kNothing,    ///< no directory, or an empty one, below a root that is there
+    kRemains,    ///< parts of an index, or another one
+    kForeign,    ///< something else, which is not ours to touch
+    kNoRoot,     ///< the place that should hold it is missing, as a disk may be
+    kRefused,    ///< `problem` says what somebody has to remove
+};
 
-/// Throws Error 1414 unless an index may be put there: an absolute path without "." and "..", whose
-/// parent is a directory that only root, or this user, can have put there. Symbolic links of other
-/// users on the way are refused.
-void CheckIndexPath(const std::string& directory);
+struct Look {
+    Found found = Found::kNoRoot;
+    quivra::base::PrivateDirectory directory;  ///< valid where there is one
+    std::string problem;                       ///< in one sentence, for all that is not an index
+};
+
+/// Looks for the index `uuid`; with an empty one, for any.
+Look LookAt(const std::string& path, const std::string& uuid);
 
 /// Makes the directory (its parent exists) with the marker. What an earlier index left there is
 /// removed first. Throws Error 1414 when something else is there, 1412 or 1415 when it fails.
-void MakeIndexDirectory(const std::string& directory, const std::string& uuid);
+quivra::base::PrivateDirectory MakeIndexDirectory(const std::string& path, const std::string& uuid);
 
-/// Whether the index `uuid` lies there. With an empty uuid: any index.
-bool IsIndexDirectory(const std::string& directory, const std::string& uuid);
+/// Renames what is left of an index to a name that says when, and returns that; what was set aside
+/// before goes. An empty text when there is nothing to set aside.
+std::string SetAside(const std::string& path);
+
+/// Whether the index `uuid` lies there, in whichever format.
+bool IsIndexDirectory(const std::string& path, const std::string& uuid);
 
 /// Removes the index `uuid` with all its files, if it lies there; whether nothing of it is left.
-bool RemoveIndexDirectory(const std::string& directory, const std::string& uuid);
+bool RemoveIndexDirectory(const std::string& path, const std::string& uuid);
 
 enum class Moved {
     kWhole,   ///< the files are at the new path only

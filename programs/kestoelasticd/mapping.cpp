@@ -8,20 +8,26 @@
 namespace elasticd {
 namespace {
 
+using engine::Analyzer;
+using engine::FieldSettings;
+using engine::FieldType;
+using engine::kAllField;
+using engine::kTextField;
+
 [[noreturn]] void Refuse(const std::string& what) {
     throw quivra::Error(kBadMapping, "Bad mapping: " + what);
 }
 
 std::string ReadName(const Json::Value& value, const std::string& what) {
     if (!value.isString()) {
-        Refuse(what + " is no string");
+        Refuse(what + " is not a string");
     }
     return value.asString();
 }
 
 bool ReadFlag(const Json::Value& value, const std::string& what) {
     if (!value.isBool()) {
-        Refuse(what + " is no bool");
+        Refuse(what + " is not a bool");
     }
     return value.asBool();
 }
@@ -40,7 +46,7 @@ T ReadChoice(const Json::Value& value, const std::string& what,
 
 void ReadPreprocess(FieldSettings& settings, const Json::Value& value, const std::string& what) {
     if (!value.isArray()) {
-        Refuse(what + " is no array");
+        Refuse(what + " is not an array");
     }
     settings.fold = settings.ngram = false;
     for (const Json::Value& step : value) {
@@ -79,7 +85,7 @@ void ReadMember(FieldSettings& settings, const std::string& name, const Json::Va
 FieldSettings ReadSettings(FieldSettings settings, const Json::Value& members,
                            const std::string& field) {
     if (!members.isObject()) {
-        Refuse(field + " is no object");
+        Refuse(field + " is not an object");
     }
     for (auto it = members.begin(); it != members.end(); ++it) {
         ReadMember(settings, it.name(), *it, field + "." + it.name());
@@ -92,39 +98,35 @@ FieldSettings ReadSettings(FieldSettings settings, const Json::Value& members,
 
 }  // namespace
 
-Mapping::Mapping(const Json::Value& document) {
+engine::Schema ReadMapping(const Json::Value& document) {
     if (!document.isObject()) {
-        Refuse("no object");
+        Refuse("not an object");
     }
-    id_field_ = ReadName(document["property_id"], "property_id");
+    const std::string id_field = ReadName(document["property_id"], "property_id");
+    FieldSettings otherwise;
     if (document.isMember("default")) {
-        default_ = ReadSettings(default_, document["default"], "default");
+        otherwise = ReadSettings(otherwise, document["default"], "default");
     }
     const Json::Value& properties = document["properties"];
     if (!properties.isNull() && !properties.isObject()) {
-        Refuse("properties is no object");
+        Refuse("properties is not an object");
     }
+    std::map<std::string, FieldSettings> listed;
     for (auto it = properties.begin(); it != properties.end(); ++it) {
         if (it.name().empty() || it.name() == kAllField) {
             Refuse("a field cannot be called \"" + it.name() + "\"");
         }
-        listed_[it.name()] = ReadSettings(default_, *it, it.name());
+        listed[it.name()] = ReadSettings(otherwise, *it, it.name());
     }
-    const FieldSettings& id = Of(id_field_);
-    if (id_field_.empty() || id.IsNumeric() || id.ngram || !id.stored ||
-        id.analyzer != Analyzer::kKeyword) {
+    engine::Schema schema(id_field, otherwise, std::move(listed));
+    const FieldSettings& id = schema.Of(id_field);
+    if (id_field.empty() || !id.IsKeyword() || !id.stored) {
         Refuse("the field that identifies a document must be a stored keyword");
     }
-    for (const auto& [field, settings] : listed_) {
-        if (settings.required && field != id_field_) {
-            required_.push_back(field);
-        }
+    if (schema.Of(kTextField).IsNumeric()) {
+        Refuse(std::string(kTextField) + " must be a text");
     }
-}
-
-const FieldSettings& Mapping::Of(const std::string& field) const {
-    const auto found = listed_.find(field);
-    return found == listed_.end() ? default_ : found->second;
+    return schema;
 }
 
 }  // namespace elasticd

@@ -21,6 +21,7 @@ IndexEntry ReadEntry(const Json::Value& json) {
     GetJsonValue(entry.uuid, json, "uuid", true);
     GetJsonValue(entry.mappings, json, "mappings", true);
     GetJsonValue(entry.paused, json, "paused", false);
+    GetJsonValue(entry.fresh, json, "fresh", false);
     GetJsonValue(entry.deleting, json, "deleting", false);
     GetJsonValue(entry.leftover, json, "leftover", false);
     if (json.isMember("move")) {
@@ -37,6 +38,9 @@ Json::Value WriteEntry(const IndexEntry& entry) {
     json["uuid"] = entry.uuid;
     json["mappings"] = entry.mappings;
     json["paused"] = entry.paused;
+    if (entry.fresh) {
+        json["fresh"] = true;
+    }
     if (entry.deleting) {
         json["deleting"] = true;
     }

@@ -14,6 +14,8 @@ struct IndexEntry {
     std::string uuid;  ///< in the marker of its directory, too
     Json::Value mappings;
     bool paused = false;
+    /// It was found damaged or missing and made anew: empty, until its client has taken note.
+    bool fresh = false;
 
     // Work that an interruption must not leave half done.
     bool deleting = false;

@@ -1,23 +1,16 @@
 #include "programs/kestoelasticd/search.h"
 
+#include <algorithm>
 #include <map>
-#include <memory>
-#include <optional>
-#include <set>
-#include <vector>
 
 #include "common/error.h"
-#include "common/json.h"
-#include "programs/kestoelasticd/analyzer.h"
 #include "programs/kestoelasticd/codes.h"
-#include "programs/kestoelasticd/document_editor.h"
-#include "programs/kestoelasticd/highlight.h"
-#include "programs/kestoelasticd/index_writer.h"
-#include "programs/kestoelasticd/query.h"
-#include "programs/kestoelasticd/record.h"
+#include "programs/kestoelasticd/json_values.h"
 
 namespace elasticd {
 namespace {
+
+using engine::kTextField;
 
 constexpr std::size_t kMaxData = (std::size_t{1} << 30) - (1 << 20);
 constexpr std::size_t kMaxSortKeys = 8;
@@ -26,310 +19,245 @@ constexpr std::size_t kMaxSortKeys = 8;
     throw quivra::Error(kBadQuery, "Bad query: " + what);
 }
 
-/// One key of the order: a value, or a stored field, which costs a look at every match.
-struct SortField {
-    std::optional<unsigned int> slot;
-    std::optional<unsigned int> stored;
-    bool descending = false;
-};
+std::size_t ReadCount(const Json::Value& query, const char* name, std::size_t otherwise) {
+    if (!query.isMember(name)) {
+        return otherwise;
+    }
+    if (!query[name].isUInt64()) {
+        Refuse(std::string("\"") + name + "\" must be a count");
+    }
+    return query[name].asUInt64();
+}
 
-/// Orders by several keys. Documents without a value come last, whatever the direction.
-class SortKeys : public Xapian::KeyMaker {
+std::string ReadName(const Json::Value& value, const char* what) {
+    if (!value.isString()) {
+        Refuse(std::string(what) + " must be a text");
+    }
+    return value.asString();
+}
+
+void CheckArray(const Json::Value& value, const char* what) {
+    if (!value.isArray()) {
+        Refuse(std::string(what) + " must be an array");
+    }
+}
+
+/// Cursors are bytes; JSON holds texts.
+std::string ToHex(std::string_view bytes) {
+    constexpr char kDigits[] = "0123456789abcdef";
+    std::string hex;
+    for (const char c : bytes) {
+        hex += kDigits[static_cast<unsigned char>(c) >> 4];
+        hex += kDigits[static_cast<unsigned char>(c) & 0xf];
+    }
+    return hex;
+}
+
+std::string FromHex(const std::string& hex) {
+    std::string bytes;
+    const auto digit = [](char c) { return c <= '9' ? c - '0' : c - 'a' + 10; };
+    if (hex.size() % 2 != 0 || hex.find_first_not_of("0123456789abcdef") != hex.npos) {
+        Refuse("\"after\" must be what an earlier reply had as \"next\"");
+    }
+    for (std::size_t i = 0; i < hex.size(); i += 2) {
+        bytes += static_cast<char>(digit(hex[i]) << 4 | digit(hex[i + 1]));
+    }
+    return bytes;
+}
+
+/// Makes the JSON text of hits.
+class HitWriter {
   public:
-    explicit SortKeys(std::vector<SortField> fields) : fields_(std::move(fields)) {}
+    HitWriter(const Search& search, const engine::Schema& schema, std::string& out)
+        : search_(search), schema_(schema), out_(out) {}
 
-    std::string operator()(const Xapian::Document& document) const override {
-        std::string key;
-        for (const SortField& field : fields_) {
-            const std::string value = field.slot     ? document.get_value(*field.slot)
-                                      : field.stored ? StoredText(document, *field.stored)
-                                                     : std::string();
-            key += value.empty() ? '\1' : '\0';
-            AppendOrdered(key, value, field.descending);
+    void Append(const engine::Hit& hit) {
+        out_ += out_.size() > 1 ? ",{" : "{";
+        start_ = out_.size();
+        marked_.clear();
+        if (search_.with_id) {
+            AppendName(schema_.IdField());
+            AppendJsonText(out_, hit.id);
         }
-        return key;
+        Mark(schema_.IdField(), hit.id);
+        for (const engine::Field& field : hit.fields) {
+            const bool wanted = field.name == kTextField
+                                    ? search_.with_text
+                                    : !search_.fields || search_.fields->contains(field.name);
+            if (wanted) {
+                AppendName(field.name);
+                AppendValue(out_, field.value);
+            }
+            Mark(field.name, field.value);
+        }
+        AppendMarked();
+        out_ += '}';
     }
 
   private:
-    static std::string StoredText(const Xapian::Document& document, unsigned int wanted) {
-        std::string text;
-        WalkRecord(document.get_data(), [&](unsigned int number, std::string_view json) {
-            Json::Value value;
-            if (number == wanted && quivra::fromString(value, std::string(json))) {
-                text = GramText(value);
-            }
-        });
-        return text;
+    void AppendName(const std::string& name) {
+        if (out_.size() > start_) {
+            out_ += ',';
+        }
+        AppendJsonText(out_, name);
+        out_ += ':';
     }
 
-    /// Ends each value with a mark below everything that may follow within one.
-    static void AppendOrdered(std::string& key, const std::string& value, bool descending) {
-        const char flip = descending ? '\xff' : '\0';
-        for (const char c : value) {
-            key += static_cast<char>(c ^ flip);
-            if (c == '\0') {
-                key += static_cast<char>('\xff' ^ flip);
-            }
-        }
-        key += flip;
-        key += flip;
-    }
-
-    const std::vector<SortField> fields_;
-};
-
-class Searcher {
-  public:
-    Searcher(const Json::Value& query, const Mapping& mapping, const FieldTable& fields,
-             const Xapian::Database& database)
-        : mapping_(mapping), fields_(fields), database_(database) {
-        if (!query.isObject()) {
-            Refuse("no object");
-        }
-        parsed_ = ParseQuery(query["qsl"], mapping, fields);
-        offset_ = ReadCount(query, "offset", 0);
-        limit_ = ReadCount(query, "limit", database.get_doccount());
-        ReadSort(query["sort"]);
-        ReadFields(query["fields"]);
-        ReadHighlight(query["highlight"]);
-    }
-
-    SearchResult Run() {
-        Xapian::Enquire enquire(database_);
-        enquire.set_query(parsed_.query);
-        std::unique_ptr<SortKeys> keys;
-        // The weights are not used for a sort, but a scheme that does without them (BoolWeight)
-        // makes Xapian 1.4.22 take a long posting list for corrupt once a document was deleted.
-        if (!sort_.empty()) {
-            keys = std::make_unique<SortKeys>(sort_);
-            enquire.set_sort_by_key(keys.get(), false);
-        } else if (parsed_.has_words) {
-            enquire.set_sort_by_relevance_then_value(kIdSlot, false);
-        } else {
-            enquire.set_sort_by_value(kIdSlot, false);
-        }
-        // Looking at every match is what makes the total exact.
-        const Xapian::doccount all = database_.get_doccount();
-        const Xapian::MSet hits = enquire.get_mset(offset_, limit_, std::max(all, 1U));
-        SearchResult result;
-        result.total = hits.get_matches_estimated();
-        result.data += '[';
-        for (Xapian::MSetIterator hit = hits.begin(); hit != hits.end(); ++hit) {
-            AppendHit(result.data, hit.get_document());
-            if (result.data.size() > kMaxData) {
-                throw quivra::Error(kReplyTooLarge, "Too many hits for one reply; use \"limit\"");
-            }
-        }
-        result.data += ']';
-        return result;
-    }
-
-  private:
-    static Xapian::doccount ReadCount(const Json::Value& query, const char* name,
-                                      Xapian::doccount otherwise) {
-        if (!query.isMember(name)) {
-            return otherwise;
-        }
-        if (!query[name].isUInt64()) {
-            Refuse(std::string("\"") + name + "\" must be a count");
-        }
-        return static_cast<Xapian::doccount>(
-            std::min<Json::UInt64>(query[name].asUInt64(), 0x7fffffff));
-    }
-
-    static std::string ReadName(const Json::Value& value, const char* what) {
-        if (!value.isString()) {
-            Refuse(std::string(what) + " must be a text");
-        }
-        return value.asString();
-    }
-
-    static void CheckArray(const Json::Value& value, const char* what) {
-        if (!value.isArray()) {
-            Refuse(std::string(what) + " must be an array");
-        }
-    }
-
-    void ReadSort(const Json::Value& sort) {
-        if (sort.isNull()) {
+    void Mark(const std::string& name, const engine::Value& value) {
+        const auto words = search_.highlighted.find(name);
+        if (words == search_.highlighted.end()) {
             return;
         }
-        CheckArray(sort, "\"sort\"");
-        if (sort.size() > kMaxSortKeys) {
-            Refuse("too many keys in \"sort\"");
-        }
-        for (const Json::Value& key : sort) {
-            if (!key.isObject()) {
-                Refuse("a key of \"sort\" must be an object");
-            }
-            const std::string order =
-                key.isMember("order") ? ReadName(key["order"], "\"order\"") : "asc";
-            if (order != "asc" && order != "desc") {
-                Refuse("unknown order \"" + order + "\"");
-            }
-            sort_.push_back(MakeSortField(ReadName(key["field"], "\"field\""), order == "desc"));
-        }
-    }
-
-    SortField MakeSortField(const std::string& name, bool descending) const {
-        SortField field{std::nullopt, std::nullopt, descending};
-        const FieldSettings& settings = mapping_.Of(name);
-        if (name == kAllField || name == kTextField) {
-            Refuse("no sorting by " + name);
-        }
-        if (name == mapping_.IdField()) {
-            field.slot = kIdSlot;
-        } else if (const std::optional<unsigned int> number = fields_.Find(name)) {
-            if (settings.IsNumeric() || settings.ngram) {
-                field.slot = FieldSlot(*number);
-            } else {
-                field.stored = *number;
-            }
-        }
-        return field;
-    }
-
-    void ReadFields(const Json::Value& fields) {
-        with_id_ = true;
-        if (fields.isNull()) {
-            return;
-        }
-        CheckArray(fields, "\"fields\"");
-        wanted_.emplace();
-        with_id_ = false;
-        for (const Json::Value& field : fields) {
-            const std::string name = ReadName(field, "a field");
-            with_id_ |= name == mapping_.IdField();
-            with_text_ |= name == kTextField && mapping_.Of(name).stored;
-            if (const std::optional<unsigned int> number = fields_.Find(name)) {
-                wanted_->insert(*number);
-            }
-        }
-    }
-
-    void ReadHighlight(const Json::Value& highlight) {
-        if (highlight.isNull()) {
-            return;
-        }
-        if (!highlight.isObject()) {
-            Refuse("\"highlight\" must be an object");
-        }
-        if (highlight.isMember("pre")) {
-            style_.pre = ReadName(highlight["pre"], "\"pre\"");
-        }
-        if (highlight.isMember("post")) {
-            style_.post = ReadName(highlight["post"], "\"post\"");
-        }
-        style_.length = ReadCount(highlight, "length", static_cast<unsigned int>(style_.length));
-        CheckArray(highlight["fields"], "\"fields\" of \"highlight\"");
-        for (const Json::Value& field : highlight["fields"]) {
-            const std::string name = ReadName(field, "a field");
-            std::set<std::string> words = parsed_.words[kAllField];
-            words.merge(parsed_.words[name]);
-            if (!words.empty()) {
-                highlighted_[name] = std::move(words);
-            }
-        }
-    }
-
-    void AppendHit(std::string& out, const Xapian::Document& document) const {
-        out += out.size() > 1 ? ",{" : "{";
-        const std::size_t start = out.size();
-        const std::string id = document.get_value(kIdSlot);
-        if (with_id_) {
-            AppendName(out, start, mapping_.IdField());
-            AppendJsonText(out, id);
-        }
-        std::map<std::string, std::string> marked;
-        WalkRecord(document.get_data(), [&](unsigned int number, std::string_view json) {
-            const std::string& name = fields_.NameOf(number);
-            if (!mapping_.Of(name).stored) {
-                return;
-            }
-            if (!wanted_ || wanted_->contains(number)) {
-                AppendName(out, start, name);
-                out += json;
-            }
-            Mark(marked, name, json);
-        });
-        const bool marks_text = highlighted_.contains(kTextField) && mapping_.Of(kTextField).stored;
-        if (with_text_ || marks_text) {
-            const std::string json =
-                UnpackText(database_.get_metadata(TextKey(document.get_docid())));
-            if (with_text_ && !json.empty()) {
-                AppendName(out, start, kTextField);
-                out += json;
-            }
-            Mark(marked, kTextField, json);
-        }
-        if (highlighted_.contains(mapping_.IdField())) {
-            std::string json;
-            AppendJsonText(json, id);
-            Mark(marked, mapping_.IdField(), json);
-        }
-        AppendMarked(out, start, marked);
-        out += '}';
-    }
-
-    static void AppendName(std::string& out, std::size_t start, const std::string& name) {
-        if (out.size() > start) {
-            out += ',';
-        }
-        AppendJsonText(out, name);
-        out += ':';
-    }
-
-    void Mark(std::map<std::string, std::string>& marked, const std::string& name,
-              std::string_view json) const {
-        const auto words = highlighted_.find(name);
-        Json::Value value;
-        if (words == highlighted_.end() || !quivra::fromString(value, std::string(json))) {
-            return;
-        }
-        WalkTexts(value, [&](const std::string& text) {
-            if (!marked.contains(name)) {
-                std::string excerpt = Highlight(mapping_.Of(name), text, words->second, style_);
+        engine::ForEachText(value, [&](std::string_view text) {
+            if (!marked_.contains(name)) {
+                std::string excerpt =
+                    Highlight(schema_.Of(name), std::string(text), words->second, search_.style);
                 if (!excerpt.empty()) {
-                    marked.emplace(name, std::move(excerpt));
+                    marked_.emplace(name, std::move(excerpt));
                 }
             }
         });
     }
 
-    static void AppendMarked(std::string& out, std::size_t start,
-                             const std::map<std::string, std::string>& marked) {
-        if (marked.empty()) {
+    void AppendMarked() {
+        if (marked_.empty()) {
             return;
         }
-        AppendName(out, start, "highlight");
-        out += '{';
-        const std::size_t first = out.size();
-        for (const auto& [name, excerpt] : marked) {
-            AppendName(out, first, name);
-            AppendJsonText(out, excerpt);
+        AppendName("highlight");
+        out_ += '{';
+        start_ = out_.size();
+        for (const auto& [name, excerpt] : marked_) {
+            AppendName(name);
+            AppendJsonText(out_, excerpt);
         }
-        out += '}';
+        out_ += '}';
     }
 
-    const Mapping& mapping_;
-    const FieldTable& fields_;
-    const Xapian::Database& database_;
-    ParsedQuery parsed_;
-    Xapian::doccount offset_ = 0;
-    Xapian::doccount limit_ = 0;
-    std::vector<SortField> sort_;
-    std::optional<std::set<unsigned int>> wanted_;  ///< none: all
-    bool with_id_ = true;
-    bool with_text_ = false;
-    HighlightStyle style_;
-    std::map<std::string, std::set<std::string>> highlighted_;  ///< field -> words
+    const Search& search_;
+    const engine::Schema& schema_;
+    std::string& out_;
+    std::size_t start_ = 0;
+    std::map<std::string, std::string> marked_;
 };
 
 }  // namespace
 
-SearchResult Search(const Json::Value& query, const Mapping& mapping, const FieldTable& fields,
-                    const Xapian::Database& database) {
-    return Searcher(query, mapping, fields, database).Run();
+Search::Search(const Json::Value& query, const engine::Schema& schema) {
+    if (!query.isObject()) {
+        Refuse("not an object");
+    }
+    ParsedQuery parsed = ParseQuery(query["qsl"], schema);
+    request.query = std::move(parsed.query);
+    request.by_relevance = parsed.has_words;
+    request.offset = ReadCount(query, "offset", 0);
+    request.limit = ReadCount(query, "limit", SIZE_MAX);
+    timeout =
+        std::min(timeout, std::chrono::milliseconds(static_cast<std::int64_t>(
+                              std::min<std::size_t>(ReadCount(query, "timeout", 5000), 5000))));
+    if (query.isMember("after")) {
+        request.after = FromHex(ReadName(query["after"], "\"after\""));
+    }
+    if (query.isMember("count") && !query["count"].isBool()) {
+        Refuse("\"count\" must be a bool");
+    }
+    request.count = !query.isMember("count") || query["count"].asBool();
+    ReadSort(query["sort"]);
+    ReadFields(query["fields"], schema);
+    ReadHighlight(query["highlight"], parsed, schema);
+    request.with_text =
+        with_text || (highlighted.contains(kTextField) && schema.Of(kTextField).stored);
+    if (highlighted.empty()) {
+        request.fields = fields;
+    }
+}
+
+void Search::ReadSort(const Json::Value& sort) {
+    if (sort.isNull()) {
+        return;
+    }
+    CheckArray(sort, "\"sort\"");
+    if (sort.size() > kMaxSortKeys) {
+        Refuse("too many keys in \"sort\"");
+    }
+    for (const Json::Value& key : sort) {
+        if (!key.isObject()) {
+            Refuse("a key of \"sort\" must be an object");
+        }
+        const std::string order =
+            key.isMember("order") ? ReadName(key["order"], "\"order\"") : "asc";
+        if (order != "asc" && order != "desc") {
+            Refuse("unknown order \"" + order + "\"");
+        }
+        request.sort.push_back({ReadName(key["field"], "\"field\""), order == "desc"});
+    }
+}
+
+void Search::ReadFields(const Json::Value& names, const engine::Schema& schema) {
+    if (names.isNull()) {
+        return;
+    }
+    CheckArray(names, "\"fields\"");
+    fields.emplace();
+    with_id = false;
+    for (const Json::Value& field : names) {
+        const std::string name = ReadName(field, "a field");
+        with_id |= name == schema.IdField();
+        with_text |= name == kTextField && schema.Of(kTextField).stored;
+        fields->insert(name);
+    }
+}
+
+void Search::ReadHighlight(const Json::Value& highlight, ParsedQuery& parsed,
+                           const engine::Schema& schema) {
+    if (highlight.isNull()) {
+        return;
+    }
+    if (!highlight.isObject()) {
+        Refuse("\"highlight\" must be an object");
+    }
+    if (highlight.isMember("pre")) {
+        style.pre = ReadName(highlight["pre"], "\"pre\"");
+    }
+    if (highlight.isMember("post")) {
+        style.post = ReadName(highlight["post"], "\"post\"");
+    }
+    style.length = std::min<std::size_t>(ReadCount(highlight, "length", style.length), 1 << 20);
+    CheckArray(highlight["fields"], "\"fields\" of \"highlight\"");
+    for (const Json::Value& field : highlight["fields"]) {
+        const std::string name = ReadName(field, "a field");
+        AskedWords words = parsed.words[engine::kAllField];
+        words.Merge(parsed.words[name]);
+        if (!words.IsEmpty() && schema.Of(name).stored) {
+            highlighted[name] = std::move(words);
+        }
+    }
+}
+
+std::string SearchResult::Members() const {
+    std::string members = ",\"data\":" + data;
+    if (counted) {
+        members = ",\"total\":" + std::to_string(total) + members;
+    }
+    return next.empty() ? members : members + ",\"next\":\"" + ToHex(next) + "\"";
+}
+
+SearchResult RunSearch(const Search& search, const engine::Schema& schema, engine::Index& index) {
+    SearchResult result;
+    HitWriter writer(search, schema, result.data);
+    std::size_t hits = 0;
+    engine::SearchRequest request = search.request;
+    request.deadline = engine::SearchRequest::Clock::now() + search.timeout;
+    const engine::SearchResult found = index.Search(request, [&](engine::Hit&& hit) {
+        writer.Append(hit);
+        result.next = ++hits == request.limit ? std::move(hit.cursor) : std::string();
+        if (result.data.size() > kMaxData) {
+            throw quivra::Error(kReplyTooLarge, "Too many hits for one reply; use \"limit\"");
+        }
+    });
+    result.data += ']';
+    result.total = found.total;
+    result.counted = request.count;
+    return result;
 }
 
 }  // namespace elasticd

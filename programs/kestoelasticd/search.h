@@ -1,25 +1,50 @@
 #pragma once
 
 #include <json/json.h>
-#include <xapian.h>
 
+#include <chrono>
+#include <optional>
+#include <set>
 #include <string>
 
-#include "programs/kestoelasticd/mapping.h"
-#include "programs/kestoelasticd/terms.h"
+#include "programs/kestoelasticd/engine/engine.h"
+#include "programs/kestoelasticd/highlight.h"
+#include "programs/kestoelasticd/query.h"
 
 namespace elasticd {
 
-/// What one query found, as the JSON text of the reply's members.
-struct SearchResult {
-    std::string data;  ///< an array of hits
-    unsigned int total = 0;
+/// A query's "data" member, read: {"qsl", "offset", "limit", "sort", "after", "count", "timeout",
+/// "fields", "highlight"}. Throws Error 1410 for what cannot be followed.
+struct Search {
+    Search(const Json::Value& query, const engine::Schema& schema);
+
+    engine::SearchRequest request;
+    bool with_id = true;
+    bool with_text = false;  ///< asked for itself, not only for its highlight
+    std::optional<std::set<std::string>> fields;
+    std::map<std::string, AskedWords> highlighted;
+    HighlightStyle style;
+    std::chrono::milliseconds timeout{5000};
+
+  private:
+    void ReadSort(const Json::Value& sort);
+    void ReadFields(const Json::Value& names, const engine::Schema& schema);
+    void ReadHighlight(const Json::Value& highlight, ParsedQuery& parsed,
+                       const engine::Schema& schema);
 };
 
-/// Carries out {"qsl", "offset", "limit", "sort", "fields", "highlight"} on a database. Throws
-/// Error 1410 for a query that cannot be followed, 1416 for a result that no reply can hold.
-/// Exceptions of the engine pass: the caller knows which of them are worth a retry.
-SearchResult Search(const Json::Value& query, const Mapping& mapping, const FieldTable& fields,
-                    const Xapian::Database& database);
+/// What one query found, as the JSON text of the reply's members behind "success".
+struct SearchResult {
+    std::string data = "[";  ///< an array of hits
+    std::uint64_t total = 0;
+    bool counted = true;
+    std::string next;  ///< the cursor behind the last hit, where there may be more
+
+    std::string Members() const;
+};
+
+/// Carries it out. Throws Error 1416 for a result that no reply can hold, 1418 at the deadline, and
+/// what the engine throws.
+SearchResult RunSearch(const Search& search, const engine::Schema& schema, engine::Index& index);
 
 }  // namespace elasticd

@@ -2,10 +2,12 @@
 
 #include <sodium.h>
 
+#include <condition_variable>
 #include <cstdio>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <mutex>
 #include <new>
 #include <system_error>
 
@@ -14,19 +16,19 @@
 #include "common/log.h"
 #include "programs/daemon/instance_lock.h"
 #include "programs/kestoelasticd/codes.h"
-#include "programs/kestoelasticd/engine_error.h"
-#include "programs/kestoelasticd/record.h"
+#include "programs/kestoelasticd/json_values.h"
 
 namespace elasticd {
 namespace {
 
+namespace command = quivra::fileindex::elastic::command;
 using quivra::Error;
 
 constexpr std::chrono::milliseconds kMemoryCheckInterval{250};
-/// Changes after which the engine writes its buffers out; memory grows with it.
-constexpr char kFlushThreshold[] = "2000";
 
 constexpr char kSuccess[] = "{\"success\":true}";
+constexpr char kSuccessWithData[] = "{\"success\":true,\"data\":";
+constexpr std::chrono::seconds kMaintenanceInterval{2};
 
 std::string ErrorReply(int code, const std::string& message) {
     std::string reply =
@@ -39,9 +41,13 @@ std::string ErrorReply(int code, const std::string& message) {
 template <typename Action>
 std::string Reply(const Action& action) {
     try {
-        return TranslateEngineErrors(action);
+        return action();
     } catch (const Error& error) {
         return ErrorReply(error.code, error.reason);
+    } catch (const std::bad_alloc&) {
+        return ErrorReply(kOutOfMemory, "Out of memory");
+    } catch (const std::exception& error) {
+        return ErrorReply(kEngineFailed, error.what());
     }
 }
 
@@ -90,8 +96,6 @@ quivra::base::UniqueFd PrepareState(const ServiceOptions& options) {
     if (sodium_init() < 0) {
         throw Error(Error::kSystemCallFailed, "libsodium cannot be used");
     }
-    // The engine reads it whenever it opens a database for writing.
-    setenv("XAPIAN_FLUSH_THRESHOLD", kFlushThreshold, 1);
     std::error_code error;
     std::filesystem::create_directories(options.state_directory, error);
     if (error) {
@@ -106,14 +110,15 @@ quivra::base::UniqueFd PrepareState(const ServiceOptions& options) {
 Service::Service(const ServiceOptions& options)
     : options_(options),
       lock_(PrepareState(options)),
-      catalog_(options.state_directory + "/indexes.json", options.min_free_space) {}
+      catalog_(options.state_directory + "/indexes.json", options.min_free_space),
+      maintenance_([this](const std::stop_token& stop) { MaintainIndexes(stop); }) {}
 
 std::string Service::Handle(const std::string& request_text) {
     return Reply([&] {
         CheckMemory();
         Json::Value request;
         if (!quivra::fromString(request, request_text) || !request.isObject()) {
-            throw Error(kBadRequest, "The request is no JSON object");
+            throw Error(kBadRequest, "The request is not a JSON object");
         }
         return request.isMember("compound") ? Compound(request["compound"])
                                             : RunCommand(request, false);
@@ -150,6 +155,9 @@ std::string Service::Compound(const Json::Value& elements) {
 
 std::string Service::RunCommand(const Json::Value& request, bool in_compound) {
     const std::string command = TextMember(request, "command");
+    if (command == command::kState && !in_compound) {
+        return std::string(kSuccessWithData) + quivra::toString(catalog_.GetStates()) + "}";
+    }
     const Json::Value& data = ObjectMember(request, "data");
     const std::string id = TextMember(data, "id");
     if (command.starts_with("document_")) {
@@ -162,26 +170,39 @@ std::string Service::RunCommand(const Json::Value& request, bool in_compound) {
     return kSuccess;
 }
 
+/// An index that turns out to be damaged or missing is made anew. Then a change is refused, because
+/// it is fresh, and a query finds nothing.
+void Service::UseIndex(const std::string& id, const std::function<void(Index&)>& use) {
+    try {
+        use(*catalog_.Find(id));
+        return;
+    } catch (const engine::Damaged& damage) {
+        catalog_.MakeAnew(id, damage.reason);
+    }
+    use(*catalog_.Find(id));
+}
+
 std::string Service::RunDocumentCommand(const std::string& command, const std::string& id,
                                         const Json::Value& data) {
-    if (command == "document_get_by_query") {
-        const SearchResult found = catalog_.Find(id)->Query(ObjectMember(data, "query"));
-        std::string reply = "{\"success\":true,\"total\":" + std::to_string(found.total);
-        return reply.append(",\"data\":").append(found.data).append("}");
+    if (command == command::kDocumentGetByQuery) {
+        std::string reply = "{\"success\":true";
+        const Json::Value& query = ObjectMember(data, "query");
+        UseIndex(id, [&](Index& index) { reply += index.Query(query).Members(); });
+        return reply + "}";
     }
-    if (command == "document_upsert_by_id" || command == "document_set_by_id") {
-        const bool whole = command == "document_upsert_by_id";
+    if (command == command::kDocumentUpsertById || command == command::kDocumentSetById) {
+        const bool whole = command == command::kDocumentUpsertById;
         const std::string document = TextMember(data, "doc_id");
         const Json::Value& fields = ObjectMember(data, "data");
-        catalog_.Find(id)->Write([&](IndexWriter& writer) {
-            whole ? writer.Upsert(document, fields) : writer.Set(document, fields);
+        UseIndex(id, [&](Index& index) {
+            whole ? index.Upsert(document, fields) : index.Set(document, fields);
         });
-    } else if (command == "document_del_by_id") {
+    } else if (command == command::kDocumentDelById) {
         const std::string document = TextMember(data, "doc_id");
-        catalog_.Find(id)->Reduce([&](IndexWriter& writer) { writer.Delete(document); });
-    } else if (command == "document_del_by_query") {
+        UseIndex(id, [&](Index& index) { index.Delete(document); });
+    } else if (command == command::kDocumentDelByQuery) {
         const Json::Value& qsl = Member(ObjectMember(data, "query"), "qsl");
-        catalog_.Find(id)->Reduce([&](IndexWriter& writer) { writer.DeleteByQuery(qsl); });
+        UseIndex(id, [&](Index& index) { index.DeleteByQuery(qsl); });
     } else {
         throw Error(kUnknownCommand, "Unknown command: " + command);
     }
@@ -190,19 +211,34 @@ std::string Service::RunDocumentCommand(const std::string& command, const std::s
 
 void Service::RunIndexCommand(const std::string& command, const std::string& id,
                               const Json::Value& data) {
-    if (command == "commit") {
-        catalog_.Find(id)->Reduce([](IndexWriter& writer) { writer.Commit(); });
-    } else if (command == "index_create") {
+    if (command == command::kCommit) {
+        UseIndex(id, [](Index& index) { index.Commit(); });
+    } else if (command == command::kIndexCreate) {
         catalog_.Create(id, TextMember(data, "path"), ObjectMember(data, "mappings"));
-    } else if (command == "index_delete") {
+    } else if (command == command::kIndexDelete) {
         catalog_.Delete(id);
-    } else if (command == "index_pause" || command == "index_resume") {
-        catalog_.SetPaused(id, command == "index_pause");
-    } else if (command == "index_config_set") {
+    } else if (command == command::kIndexPause || command == command::kIndexResume) {
+        catalog_.SetPaused(id, command == command::kIndexPause);
+    } else if (command == command::kIndexAccept) {
+        catalog_.Accept(id);
+    } else if (command == command::kIndexConfigSet) {
         const Json::Value& changes = ObjectMember(data, "data");
         catalog_.Configure(id, OptionalText(changes, "id"), OptionalText(changes, "path"));
     } else {
         throw Error(kUnknownCommand, "Unknown command: " + command);
+    }
+}
+
+/// Gives space back and shortens logs while nothing else happens.
+void Service::MaintainIndexes(const std::stop_token& stop) {
+    std::mutex mutex;
+    std::condition_variable_any wake;
+    std::unique_lock lock(mutex);
+    while (!stop.stop_requested()) {
+        wake.wait_for(lock, stop, kMaintenanceInterval, [] { return false; });
+        if (!stop.stop_requested()) {
+            catalog_.Maintain();
+        }
     }
 }
 

@@ -5,7 +5,10 @@
 #include <atomic>
 #include <chrono>
 #include <cstdint>
+#include <functional>
+#include <stop_token>
 #include <string>
+#include <thread>
 
 #include "base/unique_fd.h"
 #include "programs/kestoelasticd/catalog.h"
@@ -37,12 +40,15 @@ class Service {
                                    const Json::Value& data);
     void RunIndexCommand(const std::string& command, const std::string& id,
                          const Json::Value& data);
+    void UseIndex(const std::string& id, const std::function<void(Index&)>& use);
     void CheckMemory();
+    void MaintainIndexes(const std::stop_token& stop);
 
     const ServiceOptions options_;
     quivra::base::UniqueFd lock_;
     Catalog catalog_;
     std::atomic<std::chrono::steady_clock::rep> memory_checked_ = 0;
+    std::jthread maintenance_;
 };
 
 }  // namespace elasticd

@@ -101,7 +101,9 @@ Database::Database(int directory, const std::string& name, const Options& option
         Execute(kPragmas);
         Execute("PRAGMA cache_size=-" + std::to_string(options.cache_kib));
         if (!options.read_only) {
-            Execute("PRAGMA journal_mode=WAL");
+            // Of a new file only, and before its first page is written: freed pages can be given
+            // back then ("PRAGMA incremental_vacuum") without copying all others.
+            Execute("PRAGMA auto_vacuum=INCREMENTAL; PRAGMA journal_mode=WAL");
         }
     } catch (...) {
         sqlite3_close_v2(handle_);  // also where opening failed
