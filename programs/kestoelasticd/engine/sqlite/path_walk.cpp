@@ -12,20 +12,20 @@ constexpr std::size_t kBatch = 256;
 
 void PathWalk::Run(std::int64_t top, std::string prefix, std::string_view after) {
     path_ = std::move(prefix);
-    if (after.starts_with(path_)) {
+    if (!after.empty() && after.starts_with(path_)) {
         Directory(top, after.substr(path_.size()));
-    } else if (after < path_) {
-        Directory(top, {});
+    } else if (after < path_ || after.empty()) {
+        Directory(top, std::nullopt);
     }
 }
 
 /// Children of `parent` with all that is below them, as far as they come behind `after`.
-bool PathWalk::Directory(std::int64_t parent, std::string_view after) {
+bool PathWalk::Directory(std::int64_t parent, std::optional<std::string_view> after) {
     std::vector<Waiting> waiting;
-    std::string from(after);
-    bool skip_from = !after.empty();  // the name itself has been, or is no name
-    if (!after.empty()) {
-        WaitForBegun(parent, after, waiting);
+    std::string from(after.value_or(""));
+    bool skip_from = after.has_value();  // the name itself has been; it may be the empty one
+    if (after) {
+        WaitForBegun(parent, *after, waiting);
     }
     for (bool more = true; more;) {
         std::vector<std::pair<std::string, Node>> batch;
@@ -44,7 +44,7 @@ bool PathWalk::Directory(std::int64_t parent, std::string_view after) {
                 return false;
             }
             if (node.has_children) {
-                waiting.push_back({node.id, name, {}});
+                waiting.push_back({node.id, name, std::nullopt});
             }
         }
         if (more) {
@@ -85,8 +85,11 @@ void PathWalk::WaitForBegun(std::int64_t parent, std::string_view after,
         const std::optional<Node> node = tree_.FindChild(parent, name);
         if (node && node->has_children) {
             const bool itself = size == first.size() && slash != std::string_view::npos;
-            waiting.push_back(
-                {node->id, std::string(name), std::string(itself ? after.substr(slash + 1) : "")});
+            std::optional<std::string> rest;
+            if (itself) {
+                rest = after.substr(slash + 1);
+            }
+            waiting.push_back({node->id, std::string(name), std::move(rest)});
         }
     }
 }

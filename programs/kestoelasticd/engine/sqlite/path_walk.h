@@ -1,6 +1,7 @@
 #pragma once
 
 #include <functional>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -27,10 +28,10 @@ class PathWalk {
     struct Waiting {
         std::int64_t id;
         std::string name;
-        std::string after;  ///< within that directory; empty: all of it
+        std::optional<std::string> after;  ///< within that directory; none: all of it
     };
 
-    bool Directory(std::int64_t parent, std::string_view after);
+    bool Directory(std::int64_t parent, std::optional<std::string_view> after);
     bool TakeWaiting(std::vector<Waiting>& waiting, std::string_view next_name);
     void WaitForBegun(std::int64_t parent, std::string_view after, std::vector<Waiting>& waiting);
 
