@@ -3,14 +3,12 @@
 #include <algorithm>
 #include <system_error>
 #include <unordered_map>
-#include <unordered_set>
 #include <utility>
 
 #include "base/path.h"
 #include "common/log.h"
 #include "fileindex/util.h"
-#include "programs/fileindexd/extract.h"
-#include "programs/fileindexd/failures.h"
+#include "programs/fileindexd/file_work.h"
 #include "programs/fileindexd/settle.h"
 
 namespace fileindexd {
@@ -25,7 +23,6 @@ constexpr const char* kUnit = "catch_up";
 constexpr std::size_t kListPage = 2000;   // documents looked at between two commits
 constexpr std::size_t kFindChunk = 500;   // entries compared and committed together
 constexpr std::size_t kDirectories = 64;  // taken from the store at once
-constexpr std::size_t kFiles = 500;       // extracted between two commits
 
 }  // namespace
 
@@ -39,18 +36,22 @@ class CatchUp::Work {
           share_(share),
           batch_(share.index, share.tree, share.scope, listener),
           until_(until),
-          now_(now) {}
+          now_(now),
+          files_({backlog_, batch_, share.index, share.tree, share.scope, until, now}) {}
 
     Slice Run() {
         do {
             if (const auto tree = backlog_.FirstTree()) {
                 ListTree(*tree);
-            } else if (!WalkDirectories() && !NameFiles() && !ExtractFiles()) {
+            } else if (!WalkDirectories() && !files_.Name() && !files_.Extract()) {
                 break;
             }
             slice_.has_worked = true;
         } while (Clock::now() < until_);
+        NoteProblems();
         slice_.counts = batch_.GetCounts();
+        slice_.files = files_.Files();
+        slice_.bytes = files_.Bytes();
         return slice_;
     }
 
@@ -67,10 +68,6 @@ class CatchUp::Work {
     void Flush();
     void Sort(const Entry& entry, const std::unordered_map<std::string, Attributes>& indexed);
 
-    bool NameFiles();
-    bool ExtractFiles();
-    bool IsToBeExtracted(const Backlog::File& file, Extraction& job);
-    void TakeOutcome(const Extraction& job, const Backlog::File& file);
     void NoteProblems();
 
     CatchUp& owner_;
@@ -79,6 +76,7 @@ class CatchUp::Work {
     Batch batch_;
     const Clock::time_point until_;
     const std::int64_t now_;
+    FileWork files_;
     Slice slice_;
 
     // Of a tree's listing.
@@ -90,11 +88,6 @@ class CatchUp::Work {
     std::vector<std::int64_t> finished_;  ///< to be removed once their entries are committed
     std::vector<Backlog::File> contents_;
     std::vector<std::pair<std::string, bool>> names_;  ///< and whether it is a directory
-
-    // Of extraction.
-    std::vector<std::string> done_;
-    std::vector<Problem> failures_;
-    std::vector<Backlog::Directory> trees_;
 };
 
 /// One page of the tree's documents, or its end.
@@ -315,120 +308,6 @@ void CatchUp::Work::Sort(const Entry& entry,
     // A changed file keeps its older content until the newer one is there.
     if (!is_known || !needs_content) {
         names_.emplace_back(entry.path, false);
-    }
-}
-
-/// Files of a pass that had too many. False when none is waiting for its name.
-bool CatchUp::Work::NameFiles() {
-    const std::vector<Backlog::File> files = backlog_.UnnamedFiles(kFindChunk);
-    std::vector<Extraction> jobs;
-    std::vector<std::string> paths;
-    for (const Backlog::File& file : files) {
-        Extraction job;
-        if (IsToBeExtracted(file, job)) {
-            paths.push_back(job.path);
-            jobs.push_back(std::move(job));
-        }
-    }
-    std::unordered_set<std::string> known;
-    for (Document& document : share_.index.Find(paths)) {
-        known.insert(std::move(document.path));
-    }
-    std::vector<std::string> named;
-    for (const Extraction& job : jobs) {
-        if (!job.need_meta || !known.contains(job.path)) {
-            batch_.Upsert(job.path, false, true);
-        }
-        (job.need_meta ? named : done_).push_back(job.path);
-    }
-    batch_.Commit();
-    if (!files.empty()) {
-        backlog_.NoteNamed(named, std::exchange(done_, {}), std::exchange(trees_, {}));
-        backlog_.NoteFiles({}, std::exchange(failures_, {}), {}, now_);
-        NoteProblems();
-    }
-    return !files.empty();
-}
-
-/// False when no file is due.
-bool CatchUp::Work::ExtractFiles() {
-    const std::vector<Backlog::File> files = backlog_.DueFiles(now_, kFiles);
-    if (files.empty()) {
-        return false;
-    }
-    std::vector<Extraction> jobs;
-    std::vector<const Backlog::File*> of_jobs;
-    for (const Backlog::File& file : files) {
-        Extraction job;
-        if (IsToBeExtracted(file, job)) {
-            jobs.push_back(std::move(job));
-            of_jobs.push_back(&file);
-        }
-    }
-    Extract(share_.index, jobs, until_);
-    for (std::size_t i = 0; i < jobs.size(); ++i) {
-        TakeOutcome(jobs[i], *of_jobs[i]);
-    }
-    batch_.Commit();
-    std::vector<std::string> extracted;
-    for (const Extraction& job : jobs) {
-        if (job.outcome == Extraction::Outcome::kDone && job.need_meta) {
-            extracted.push_back(job.path);
-        }
-    }
-    std::vector<Problem> unread = ReadProblems(share_.index, extracted);
-    std::unordered_set<std::string> failed;
-    for (const Problem& problem : unread) {
-        failed.insert(problem.path);
-    }
-    std::erase_if(done_, [&](const std::string& path) { return failed.contains(path); });
-    unread.insert(unread.end(), failures_.begin(), failures_.end());
-    backlog_.NoteFiles(std::exchange(done_, {}), unread, std::exchange(trees_, {}), now_);
-    failures_.clear();
-    return true;
-}
-
-/// What stands at the path decides.
-bool CatchUp::Work::IsToBeExtracted(const Backlog::File& file, Extraction& job) {
-    std::optional<Attributes> there;
-    batch_.Announce(file.path);
-    if (!IsAtOrBelow(file.path, share_.tree.Root())) {
-        done_.push_back(file.path);
-        return false;
-    }
-    try {
-        there = share_.tree.Look(file.path);
-    } catch (const std::system_error& error) {
-        failures_.push_back({file.path, error.what(), true});
-        return false;
-    }
-    if (there && there->is_dir) {
-        trees_.push_back({0, file.path, {}});
-    }
-    if (!there || there->is_dir || !share_.scope.Covers(file.path, false)) {
-        done_.push_back(file.path);  // whoever took it away sees to its documents
-        return false;
-    }
-    job.path = file.path;
-    job.need_meta = share_.scope.NeedsMeta(file.path);
-    return true;
-}
-
-void CatchUp::Work::TakeOutcome(const Extraction& job, const Backlog::File& file) {
-    switch (job.outcome) {
-        case Extraction::Outcome::kNotTried:
-            return;
-        case Extraction::Outcome::kDone:
-            batch_.NoteIndexed();
-            done_.push_back(job.path);
-            ++slice_.files;
-            slice_.bytes += static_cast<std::uint64_t>(file.size);
-            return;
-        case Extraction::Outcome::kRefused:
-            batch_.Upsert(job.path, false, true);  // by its name, at least
-            batch_.TakeProblems();                 // the reason is known
-            failures_.push_back({job.path, job.reason, job.can_pass});
-            return;
     }
 }
 

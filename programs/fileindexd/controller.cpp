@@ -1,6 +1,7 @@
 #include "programs/fileindexd/controller.h"
 
 #include <algorithm>
+#include <cerrno>
 #include <chrono>
 #include <climits>
 #include <csignal>
@@ -9,12 +10,16 @@
 #include <utility>
 #include <vector>
 
+#include "base/path.h"
+#include "base/private_directory.h"
 #include "common/error.h"
 #include "common/log.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/status_mgr.h"
+#include "programs/fileindexd/backlog.h"
 #include "programs/fileindexd/state_file.h"
 #include "programs/fileindexd/worker.h"
+#include "sdk/share.h"
 
 namespace fileindexd {
 
@@ -27,6 +32,21 @@ constexpr std::chrono::seconds kPauseCheck{30};
 
 /// A killed worker ends, unless the kernel itself waits for a disk on its behalf.
 constexpr std::chrono::seconds kLongestStop{10};
+
+/// What waits for a share goes with it. Where its place cannot be reached, there is nothing to
+/// drop.
+void DropBacklog(const std::string& share) {
+    try {
+        const std::string queue = quivra::sdk::SDKShare(share).GetQueuePath();
+        const auto directory =
+            quivra::base::PrivateDirectory::Open(std::string(quivra::base::Directory(queue)));
+        if (directory.IsValid()) {
+            Backlog::Remove(directory);
+        }
+    } catch (const quivra::Error&) {
+        errno = 0;
+    }
+}
 
 }  // namespace
 
@@ -54,6 +74,7 @@ std::set<std::string> Controller::ReadShares() {
         }
     }
     std::erase_if(commanded_, [&](const auto& entry) { return !all.contains(entry.first); });
+    known_ = std::move(all);
     return unpaused;
 }
 
@@ -123,7 +144,9 @@ void Controller::Execute(const Command& command, Reply reply, Clock::time_point 
                            command.type == Command::Type::kSettingChanged;
     if (must_stop && !supervisor_.IsWanted(command.share)) {
         // Its queue and its index may be taken away next.
-        waiting_.push_back({command.share, std::move(reply), now + kLongestStop});
+        waiting_.push_back(
+            {command.share, std::move(reply), now + kLongestStop,
+             command.type == Command::Type::kSettingChanged && !known_.contains(command.share)});
         AnswerWaiting(now);
     } else {
         reply(SuccessReply());
@@ -184,6 +207,9 @@ void Controller::AnswerWaiting(Clock::time_point now) {
                                      " does not end: it waits for a disk, perhaps"));
             it = waiting_.erase(it);
         } else {
+            if (it->is_dropped) {
+                DropBacklog(it->share);
+            }
             it->reply(SuccessReply());
             it = waiting_.erase(it);
         }

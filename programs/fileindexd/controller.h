@@ -47,6 +47,7 @@ class Controller {
         std::string share;
         Reply reply;
         Clock::time_point until;
+        bool is_dropped;  ///< the share has no folder left
     };
 
     bool IsPaused() const;
@@ -62,6 +63,7 @@ class Controller {
     std::int64_t resume_time_;
     std::map<std::string, bool> commanded_;  ///< created or deleted by command
     std::set<std::string> indexed_;          ///< as the folder set said last
+    std::set<std::string> known_;            ///< the same with shares whose folders are paused
     std::set<std::string> paused_;           ///< by the global pause
     std::list<Waiting> waiting_;
     bool was_paused_ = false;

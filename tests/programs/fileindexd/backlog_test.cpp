@@ -76,6 +76,22 @@ TEST_F(BacklogTest, RenamesAndDeletesTakeTheBacklogAlong) {
     EXPECT_EQ(index_->extracted, 99) << "each file once";
 }
 
+TEST_F(BacklogTest, ARenamedShareTakesItAlong) {
+    PutMany("/d", 20);
+    Queue(EVENT_REINDEX, "");
+    ReadNames();
+    const std::string renamed = "/volume1/renamed";
+    fs::rename(root_, renamed);
+    std::ofstream(renamed + "/@eaDir/fileindex/queue")
+        << R"({"event":256,"is_dir":true,"path":"/volume1/renamed","path_old":"/volume1/share"})"
+        << "\n";
+    Open(renamed);
+    Run();
+    EXPECT_EQ(index_->Committed().at(renamed + "/d/7.txt").text, "/d7");
+    EXPECT_EQ(index_->extracted, 20);
+    fs::remove_all(renamed);
+}
+
 TEST_F(BacklogTest, APassLeavesWhatIsTooMuchForIt) {
     for (int i = 0; i < 30; ++i) {
         Write("/" + std::to_string(i) + ".txt", "text");
