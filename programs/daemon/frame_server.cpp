@@ -144,6 +144,7 @@ void FrameServer::Run() {
 }
 
 void FrameServer::RunMain(const Signals& signals, ServiceManager& manager) {
+    // One loop for clients, signals and the service manager: what it tells is true of all.
     signals_ = &signals;
     manager_ = &manager;
     Watch(EPOLL_CTL_ADD, signals.Fd(), EPOLLIN);

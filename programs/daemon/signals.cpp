@@ -20,6 +20,7 @@ Signals::Signals(std::initializer_list<int> also) {
     for (const int signal : also) {
         sigaddset(&signals, signal);
     }
+    // A signal that is not blocked would be delivered, and a descriptor would never tell of it.
     pthread_sigmask(SIG_BLOCK, &signals, nullptr);
     fd_.Reset(signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK));
     if (!fd_.IsValid()) {

@@ -70,6 +70,7 @@ Backlog::Backlog(const base::PrivateDirectory& directory) {
 }
 
 void Backlog::Open(const base::PrivateDirectory& directory) {
+    // A front end that lists failures, or `--once`, may hold the lock for a moment.
     database_.emplace(directory.Fd(), kFileName,
                       sqlite::Options{.busy_timeout = std::chrono::seconds(5)});
     const std::int64_t version = Number("PRAGMA user_version");
@@ -124,6 +125,7 @@ void Backlog::Close() {
 }
 
 void Backlog::Remove(const base::PrivateDirectory& directory) {
+    // The log must go too: it would be played back into the next database of that name.
     for (const char* suffix : {"", "-wal", "-shm"}) {
         unlinkat(directory.Fd(), (std::string(kFileName) + suffix).c_str(), 0);
     }
@@ -150,6 +152,7 @@ std::int64_t Backlog::Number(const char* sql) {
 
 void Backlog::AddReindex(const std::string& root, const std::string& rules) {
     Transaction transaction(*database_);
+    // The tree at the root says all of it.
     database_->Execute("DELETE FROM trees; DELETE FROM directories; DELETE FROM files;");
     AddTree({0, root, {true, true, true, true}});
     SetMeta("rules", rules);
@@ -193,6 +196,7 @@ std::string Backlog::Rules() {
 void Backlog::Merge(const Addition& addition, const WorkingCopy& copy, const std::string& rules,
                     std::int64_t now) {
     Transaction transaction(*database_);
+    // What was waiting moves first: what the pass adds is about places after the renames.
     for (const Addition::Move& move : addition.moves) {
         Apply(move);
     }
@@ -214,6 +218,7 @@ void Backlog::Merge(const Addition& addition, const WorkingCopy& copy, const std
     for (const Problem& problem : addition.failures) {
         AddFailure(problem, now);
     }
+    // In the same transaction: applied a second time, the moves of an exchange would undo it.
     SetMeta("merged", copy.Identity());
     SetMeta("rules", rules);
     transaction.Commit();

@@ -77,6 +77,7 @@ void Backlog::AddDirectory(Directory& directory) {
 }
 
 void Backlog::AddFile(const File& file, bool is_named) {
+    // The file has changed since it failed, if it did: it begins again.
     Statement& add = Prepared("INSERT OR REPLACE INTO files VALUES(?1, ?2, 0, 0, 0, NULL, ?3)");
     add.BindBlob(1, file.path).Bind(2, file.size).Bind(3, std::int64_t{is_named}).Run();
 }

@@ -102,6 +102,8 @@ void CatchUp::Work::ListTree(const Backlog::Tree& tree) {
     for (const Document& document : page) {
         DropIfStale(document);
     }
+    // Committed before the place is noted: a page that is looked at twice costs a little, one that
+    // is not looked at leaves documents for ever.
     batch_.Commit();
     NoteProblems();
     if (page.size() == kListPage) {
@@ -176,6 +178,7 @@ void CatchUp::Work::TakeRoots(const std::vector<Backlog::Directory>& roots) {
 bool CatchUp::Work::WalkDirectories() {
     stack_ = backlog_.LastDirectories(kDirectories);
     std::reverse(stack_.begin(), stack_.end());  // the last one is taken first
+    // The directory that is open is still in the store, until its last entry is committed.
     if (owner_.reader_) {
         std::erase_if(stack_, [&](const auto& other) { return other.id == owner_.reading_.id; });
     }
@@ -258,6 +261,8 @@ void CatchUp::Work::Flush() {
     for (const Entry& entry : entries) {
         Sort(entry, indexed);
     }
+    // A directory that was found and read since the last flush never gets into the store: a chain
+    // of a thousand directories costs a few transactions, not a thousand.
     std::vector<Backlog::Directory*> found;
     for (Backlog::Directory& directory : stack_) {
         if (directory.id == 0) {

@@ -209,6 +209,7 @@ std::vector<Document> ElasticIndex::ListBelow(const std::string& directory,
                                               const std::string& after, std::size_t limit) {
     const std::size_t begin = after.empty() ? 0 : PositionBehind(directory, after);
     std::vector<Document> page = PageBelow(directory, begin, limit);
+    // Where the next page begins, unless something changes before it.
     if (!page.empty()) {
         last_page_ = {directory, page.back().path, begin + page.size()};
     }

@@ -42,7 +42,7 @@ class Crew {
         } catch (...) {
             const std::lock_guard lock(mutex_);
             failure_ = std::current_exception();
-            next_ = files_.size();
+            next_ = files_.size();  // the others come to rest after the file they are at
         }
     }
 

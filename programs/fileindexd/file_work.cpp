@@ -75,6 +75,7 @@ bool FileWork::Extract() {
             extracted.push_back(job.path);
         }
     }
+    // The platform says in the document why it has no content; the command itself succeeded.
     std::vector<Problem> unread = ReadProblems(index_, extracted);
     std::unordered_set<std::string> failed;
     for (const Problem& problem : unread) {
@@ -101,6 +102,7 @@ bool FileWork::IsToBeExtracted(const Backlog::File& file, Extraction& job) {
         failures_.push_back({file.path, error.what(), true});
         return false;
     }
+    // A directory that could not be read is tried again as a tree.
     if (there && there->is_dir) {
         trees_.push_back({0, file.path, {}});
     }

@@ -64,6 +64,7 @@ PassResult Pass::Run() {
     }
     result.had_work = true;
     copy_ = *copy;
+    // Merged, but killed before the copy was deleted: everything in it is done, or in the backlog.
     if (!share_.backlog.IsMerged(copy_)) {
         CheckShare(tree);
         CarryOut(tree, ops);
@@ -88,6 +89,7 @@ void Pass::CarryOut(const ShareTree& tree, const std::vector<std::shared_ptr<OP>
     RunSingles();
     RunRoots();
     batch_->Commit();
+    // Commit looks only when there was something to commit.
     tree.CheckMounted();
     Leave();
 }
@@ -205,6 +207,7 @@ void Pass::RunRenames(const ShareTree& tree) {
     for (std::size_t i = 0; i < renames_.size(); ++i) {
         const Rename& rename = renames_[i];
         roots_.push_back({rename.from, {}, false});
+        // What was to be extracted again at the old place is owed at the new one.
         roots_.push_back({rename.to, share_.backlog.AgainAt(rename.from), moved[i]});
         if (rename.from != rename.to) {
             addition_.moves.push_back({rename.from, rename.to, !moved[i]});

@@ -76,6 +76,7 @@ bool RenameBelow(const Rename& rename, Batch& batch, Index& index) {
     for (;;) {
         const std::vector<Document> page = index.ListBelow(rename.from, last, kListPage);
         for (const Document& document : page) {
+            // What lies below it has moved along.
             if (top.empty() || !quivra::base::IsBelow(document.path, top)) {
                 top = document.path;
                 moved |= batch.Rename(quivra::base::Moved(top, rename.from, rename.to), top);

@@ -141,6 +141,7 @@ void ShareWorker::Open() {
 
 template <typename Function>
 auto ShareWorker::Guard(const std::function<void()>& between, Function work) {
+    // Before the place is opened, so that two processes do not make a new store at once.
     const quivra::base::UniqueFd lock = LockShare(share_, between);
     try {
         Open();
@@ -157,6 +158,7 @@ auto ShareWorker::Guard(const std::function<void()>& between, Function work) {
         if (error.IsDamage() && place_) {
             Backlog::Remove(place_->directory);  // a new one begins with everything
         }
+        // Opened again for the next try: a statement that failed may leave its connection unusable.
         place_.reset();
         NoteFailure(error.what());
         throw;
@@ -290,7 +292,8 @@ void ShareWorker::ReindexAll(const std::string& why) {
 
 void ShareWorker::NoteRate(const CatchUp::Slice& slice, CatchUp::Clock::time_point begin) {
     const auto now = CatchUp::Clock::now();
-    // The passes in between take their share of the time.
+    // The passes in between take their share of the time, which the estimate must not forget; after
+    // a long pause they do not.
     const auto since = now - last_slice_ < 4 * kSlice ? last_slice_ : begin;
     last_slice_ = now;
     if (slice.files > 0) {

@@ -30,6 +30,7 @@ pid_t Spawn(const std::vector<std::string>& command) {
     if (pid == 0) {
         // Only what is safe beside other threads, which hold locks that nobody will release here.
         prctl(PR_SET_PDEATHSIG, SIGTERM);
+        // The daemon may have died before that took effect.
         if (getppid() == parent) {
             sigprocmask(SIG_SETMASK, &none, nullptr);
             execv(arguments[0], arguments.data());
@@ -112,6 +113,7 @@ void Supervisor::NoteEnd(const std::string& share, Worker& worker, int status,
     if (!worker.wanted && on_end_) {
         on_end_(share);
     }
+    // Whoever was told to stop and is wanted again starts at once: it has not failed.
     if (was_told) {
         return;
     }

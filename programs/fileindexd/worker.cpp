@@ -273,7 +273,8 @@ class Worker {
         if (!has_succeeded) {
             schedule_.PassFailed(Clock::now());
         }
-        // What came during the pass, or stood behind the copy of an interrupted one.
+        // What came during the pass, or stood behind the copy of an interrupted one: the events
+        // about it may have been read before the pass began.
         if (watch_) {
             watch_->ReadNewLines(schedule_, rates_, Clock::now());
         }
