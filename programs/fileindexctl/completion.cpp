@@ -42,6 +42,7 @@ Place Follow(CLI::App& root, const std::vector<std::string>& words) {
     Place place{&root};
     for (const std::string& word : words) {
         CLI::App* command = FindCommand(*place.app, word);
+        // First: the value of an option may look like a command.
         if (place.pending != nullptr) {
             place.pending = nullptr;
         } else if (word.starts_with("-")) {
@@ -139,6 +140,7 @@ Candidates FindCandidates(CommandLine& line, const std::vector<std::string>& bef
     if (current.starts_with("-")) {
         return OptionsOf(*place.app);
     }
+    // A group has commands and no arguments of its own, a command the other way round.
     Candidates commands = CommandsOf(*place.app);
     return commands.empty() ? ArgumentsOf(line, place) : commands;
 }

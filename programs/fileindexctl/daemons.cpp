@@ -50,6 +50,7 @@ DaemonState AskDaemon(const Daemon& daemon, const std::string& request, const Js
     Json::Value message(Json::objectValue);
     message[daemon.member] = request;
     message["data"] = data;
+    // One deadline for the whole exchange: a daemon that sends a byte a second is silent, too.
     const base::Deadline deadline = std::chrono::steady_clock::now() + kReplyLimit;
     DaemonState state;
     const base::UniqueFd socket = base::ConnectUnix(daemon.socket, deadline);

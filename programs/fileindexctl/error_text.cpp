@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <array>
+#include <charconv>
 #include <string_view>
 
 #include "fileindex/elastic/protocol.h"
@@ -146,6 +147,22 @@ std::string Code(const Error& error) {
 
 std::string DescribeCause(const Error& error) {
     return Cause(Find(error), error) + Code(error);
+}
+
+std::string Reworded(const std::string& text) {
+    constexpr std::string_view kBegin = "Quivra error, code=";
+    constexpr std::string_view kReason = ", reason=[";
+    int code = 0;
+    if (!text.starts_with(kBegin)) {
+        return text;
+    }
+    const char* const end = text.data() + text.size();
+    const auto parsed = std::from_chars(text.data() + kBegin.size(), end, code);
+    std::string reason(parsed.ptr, end);
+    if (reason.starts_with(kReason) && reason.ends_with("]")) {
+        reason = reason.substr(kReason.size(), reason.size() - kReason.size() - 1);
+    }
+    return DescribeCause(Error(code, reason));
 }
 
 std::string DescribeError(const std::string& doing, const Error& error) {

@@ -10,6 +10,10 @@ namespace quivra::ctl {
 /// the text that the library made for its log.
 std::string DescribeCause(const Error& error);
 
+/// What a daemon tells of an error in the library's log form ("Quivra error, code=800,
+/// reason=[x]"), as DescribeCause words it; any other text as it is.
+std::string Reworded(const std::string& text);
+
 /// The sentence for a failure: "cannot add /photo: it is already indexed; use ... [901]". `doing`
 /// names the attempt and its object. A code that only a daemon knows is told in its own words. One
 /// line, whatever the names in it hold; not escaped.

@@ -92,6 +92,8 @@ int Add(const Options& options, Session& session) {
     const std::string queue = sdk::SDKShare(share).GetQueuePath();
     const Json::Value event = MakeEvent(options, path, from);
     session.doing = "append the change to " + queue;
+    // Not as a custom event of the library: that one is dropped where a reindex is pending, and a
+    // failure would flag the share instead of being told.
     fileindex::QueueMgr(queue).Append(event);
     return Report(session, share, queue, event, options.kind);
 }

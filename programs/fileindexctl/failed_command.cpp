@@ -59,6 +59,7 @@ int List(const std::vector<std::string>& shares, Session& session) {
     std::vector<std::vector<std::string>> rows = {{"PATH", "SINCE", "NEXT TRY", "REASON"}};
     for (const std::string& share : shares) {
         const Json::Value files = AskIndexer("failed", share);
+        // The list comes from a store on the share's disk: nothing in it is taken for granted.
         for (const Json::Value& file : files.isArray() ? files : Json::Value(Json::arrayValue)) {
             if (!file.isObject()) {
                 continue;

@@ -98,6 +98,7 @@ int Add(const Options& options, Session& session) {
     Json::Value folder =
         fileindex::Folder(path, Basename(path), true, true, true, true, false).GetData();
     Apply(folder, options);
+    // Afterwards the set alone does not tell a failure before the save from one behind it.
     const bool existed = fileindex::FolderMgr().HasFolder(path);
     try {
         const Silence silence;
@@ -175,6 +176,7 @@ int List(const ListOptions& options, Session& session) {
     fileindex::FolderList(list, options.offset, options.limit,
                           options.sort.substr(descending ? 1 : 0), descending ? "desc" : "asc",
                           Json::Value(Json::arrayValue));
+    // Once for all folders: each daemon is asked once, however many folders there are.
     const Status status = TakeStatus();
     for (Json::Value& folder : list["folder"]) {
         folder["additional"]["status"] = status.OfFolder(folder["path"].asString());

@@ -8,7 +8,7 @@
 namespace quivra::ctl {
 
 /// A buffered stream to a descriptor that remembers why writing failed, which the standard streams
-/// do not: a closed pipe is no failure worth a message, a full disk is. Borrows the descriptor.
+/// do not: a closed pipe is not a failure worth a message, a full disk is. Borrows the descriptor.
 class DescriptorBuffer : public std::streambuf {
   public:
     explicit DescriptorBuffer(int fd);

@@ -60,6 +60,7 @@ Place FindPlace(const std::string& path) {
     if (path[0] != '/') {
         throw Error(Error::kNoSuchShare, absolute);
     }
+    // A full path goes first: a share may be called like a directory at the top.
     // Not below any root, so its first component can only be the name of a share.
     place.share_path = absolute;
     fileindex::GetShareNameByPath(place.share, absolute);

@@ -34,13 +34,13 @@ struct SearchResults {
 /// IndexQuery.
 std::uint64_t CountDocuments(const std::string& share, const std::string& full_path);
 
-/// Asks the index of each share and merges the answers into one list: by the sort field, hits
+/// Asks the index of each share and merges the replies into one list: by the sort field, hits
 /// without it last; else the best of each share come first, then the second best, because relevance
-/// is no number that could be compared between indexes. `query` holds everything but offset and
+/// is not a number that could be compared between indexes. `query` holds everything but offset and
 /// limit.
 ///
 /// A share whose index fails or is not there (yet) does not hide what the others hold. Throws the
-/// Error when the search daemon is away (913), answers nonsense (916), or no share could be
+/// Error when the search daemon is away (913), replies nonsense (916), or no share could be
 /// searched.
 SearchResults SearchShares(const std::vector<std::string>& shares, const Json::Value& query,
                            const Page& page, const SortOrder& order, Session& session);

@@ -166,7 +166,7 @@ int SearchCommand(Options options, const std::vector<std::string>& words, Sessio
             PrintHit(hit, options, session);
         }
     }
-    session.out.flush();
+    session.out.flush();  // on a terminal, notes come behind the hits
     TellAbout(results, options, session);
     return results.hits.empty() ? kFailure : kSuccess;
 }

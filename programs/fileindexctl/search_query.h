@@ -15,7 +15,7 @@ namespace quivra::ctl {
 ///   size:>10M       numbers and dates by comparison: > >= < <= or LOW..HIGH
 ///   -word           must not match; goes before each of the forms
 /// Throws WrongCall when there is no word, or a field that holds numbers or dates gets a value
-/// that is none.
+/// that is not one.
 Json::Value MakeQuery(const std::vector<std::string>& arguments);
 
 /// How a field's values are compared.

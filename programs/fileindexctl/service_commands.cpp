@@ -57,6 +57,7 @@ std::string Untold(const std::string& doing) {
 template <typename Change>
 int ChangePause(Session& session, Change change) {
     const std::string doing = session.doing;
+    // In advance, for a daemon that goes in the middle of the exchange: the save comes before it.
     session.doing = Untold(doing);
     try {
         WaitFor(session, Needs::kIndexingDaemon, [change] {

@@ -63,6 +63,7 @@ void NeedsFoldersToClean(const std::string& mount_point) {
 
 /// The last component of a share's root is its name.
 void RequireRootName(const std::string& share, const std::string& root) {
+    // Typed wrong, the path would lead to another share's queue and index, which are removed.
     if (base::Name(root) != share) {
         throw Failure("the root of share " + share + " ends in /" + share + ", so it was not " +
                       root);
@@ -108,6 +109,7 @@ void ClearShare(const std::string& share, const std::string& path) {
         throw Failure("cannot clear share " + share + " at " + root + ": its root is " +
                       present_root);
     }
+    // A worker at work would make its files anew, and the monitor the queue.
     if (fileindex::FolderMgr().IsShareIndexed(share)) {
         present_root.empty() ? Detach(share, root) : fileindex::SharePause(share);
     } else if (!IsDirExist(root + kIndexDirectory, false)) {
@@ -119,6 +121,7 @@ void ClearShare(const std::string& share, const std::string& path) {
 
 void RenameShare(const std::string& from, const std::string& to) {
     NeedsFoldersOfEither(from, to);
+    // The library would carry the folders over, and leave a share that looks as if never indexed.
     if (!RootOf(from).empty()) {
         throw Failure("cannot rename share " + from + " to " + to + ": share " + from +
                       " still has its old name; rename it in /etc/kesto/shares.conf first");

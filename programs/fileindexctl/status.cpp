@@ -24,7 +24,8 @@ namespace {
 
 /// 0 for a file that is not there, and for what is not a file.
 std::uint64_t CountLines(const std::string& path) {
-    const base::UniqueFd fd(open(path.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC));
+    // Users may have put anything there: opening a FIFO must not wait for its other end.
+    const base::UniqueFd fd(open(path.c_str(), O_RDONLY | O_NONBLOCK | O_NOFOLLOW | O_CLOEXEC));
     std::array<char, 65536> buffer{};
     std::uint64_t lines = 0;
     char last = '\n';
@@ -70,10 +71,12 @@ Json::Value FolderStatus(const fileindex::Folder& folder) {
     Json::Value status(Json::objectValue);
     try {
         folder.GetStatus(status);
+        if (status["text"] == "error" && RootOf(folder.GetShare()).empty()) {
+            status["desc"] = "its share is gone";
+        }
     } catch (const Error& error) {
         status["text"] = "error";
-        status["desc"] =
-            error.code == Error::kNoSuchShare ? "its share is gone" : DescribeCause(error);
+        status["desc"] = DescribeCause(error);
     }
     return status;
 }
@@ -96,13 +99,13 @@ void TakeFromIndexer(ShareLine& share, bool is_paused, const DaemonState& indexe
     share.total = Count(told, "total");
     share.current = Text(told, "current");
     share.last_pass = Number(told, "last_pass", 0);
-    share.last_error = Text(told, "last_error");
+    share.last_error = Reworded(Text(told, "last_error"));
     share.waiting = Count(told, "waiting");
     share.waiting_bytes = Count(told, "waiting_bytes");
     share.phase = Text(told, "phase");
     share.eta = Number(told, "eta", -1);
     share.failed = Count(told, "failed");
-    AddProblem(share, Text(told, "problem"));
+    AddProblem(share, Reworded(Text(told, "problem")));
     if (indexer.reach == DaemonState::Reach::kReplied && !share.has_worker && !is_paused) {
         AddProblem(share, std::string("fileindexd does not work on it; ") + kRegisterAgain);
     }
@@ -115,7 +118,7 @@ void TakeFromSearch(ShareLine& share, const DaemonState& search) {
     }
     const Json::Value told = Find(search.data["indexes"], "id", "fileindex_" + share.name);
     share.made_anew = told["fresh"] == true;
-    AddProblem(share, Text(told, "problem"));
+    AddProblem(share, Reworded(Text(told, "problem")));
     share.documents = Number(told, "documents", -1);
     if (share.documents < 0) {
         share.documents = static_cast<std::int64_t>(CountDocuments(share.name, share.path));
@@ -154,6 +157,7 @@ std::string FirstProblem(const ShareLine& share, const Status& status) {
 /// The library sees the queue alone: an empty one is "finished" to it, whoever should fill it.
 void Correct(FolderLine& folder, const ShareLine& share, const Status& status) {
     const std::string text = folder.status["text"].asString();
+    // Nothing is to be done there, and nothing will be: neither "processing" nor "finished".
     if (folder.paused && text != "error") {
         folder.status["text"] = "paused";
         folder.status["desc"] = "with its share";
@@ -250,6 +254,7 @@ ShareLine TakeShareLine(const std::string& name, bool is_paused, const Status& s
         }
         TakeFromSearch(share, status.search);
     } catch (const Error& error) {
+        // What was found above is the cause, and says it better.
         if (share.problems.empty()) {
             AddProblem(share, DescribeCause(error));
         }
@@ -277,6 +282,7 @@ bool Status::HasProblem() const {
 
 Status TakeDaemons() {
     Status status;
+    // One after the other: only a daemon that hangs takes time, and then its two seconds.
     status.search = AskState(kSearchDaemon);
     status.indexer = AskState(kIndexer);
     status.monitor = AskState(kMonitor);
@@ -294,6 +300,7 @@ Status TakeStatus() {
         const auto entry = paused.emplace(folder->GetShare(), true).first;
         entry->second = entry->second && folder->GetPaused();
     }
+    // The index, not the address: the vector grows.
     std::map<std::string, std::size_t> lines;
     for (const auto& [share, is_paused] : paused) {
         lines[share] = status.shares.size();

@@ -178,6 +178,7 @@ class Patience {
   public:
     /// To be asked at each look, kInterval apart.
     bool IsOver(const Status& status) {
+        // Where nothing is indexed, nothing has to run.
         if (status.folders.empty()) {
             return false;
         }
@@ -185,6 +186,8 @@ class Patience {
         were_up_ = were_up_ || daemons_up;
         const bool is_stuck = !daemons_up || (status.IsFinished() && status.HasProblem());
         looks_ = is_stuck ? looks_ + 1 : 0;
+        // Three looks are a second and more: a problem that a daemon is about to mend, such as a
+        // folder that it has just been told of, has passed by then.
         return looks_ > (were_up_ ? 2 : 10);
     }
 
@@ -225,6 +228,7 @@ int StatusCommand(const Options& options, Session& session) {
         if (options.until_finished && patience.IsOver(status)) {
             throw Failure(WhyUnfinished(status));
         }
+        // Only after the checks: a reader that has gone must not hide how it ended.
         if (!session.out) {
             return kSuccess;  // the reader has gone
         }

@@ -8,6 +8,7 @@
 namespace quivra::ctl {
 
 void PrintTable(Session& session, const std::vector<std::vector<std::string>>& rows) {
+    // Widths are those of what is shown: an escape takes more cells than the byte it stands for.
     std::vector<std::size_t> widths;
     for (const std::vector<std::string>& row : rows) {
         widths.resize(std::max(widths.size(), row.size()), 0);

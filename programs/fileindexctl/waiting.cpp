@@ -122,6 +122,8 @@ void TellWaiting(const Session& session) {
 
 void WaitFor(Session& session, Needs needs, std::function<void()> body) {
     const auto call = std::make_shared<Call>();
+    // A child process would be easier to end; but its changes of what this process knows (the
+    // services' state, a test's fakes) would be lost with it.
     std::thread thread([call, body = std::move(body)] { Make(call, body); });
     const Clock::time_point begin = Clock::now();
     bool told = false;
@@ -129,6 +131,7 @@ void WaitFor(Session& session, Needs needs, std::function<void()> body) {
     Lasting search_away;
     bool search_was_there = false;  // else the library finds out by itself
     std::unique_lock lock(call->mutex);
+    // Nearly all calls end within the first look: they pay for a thread, some tens of microseconds.
     while (!call->ended.wait_for(lock, kLook, [&] { return call->has_ended; })) {
         lock.unlock();
         const bool indexer_gone = indexer_closed.Holds(HasClosed(kIndexer));

@@ -29,7 +29,7 @@ namespace field = fileindex::elastic::field;
 
 namespace {
 
-/// A question that may have no answer: then the reason why.
+/// A question that perhaps cannot be answered: then the reason why.
 struct Answer {
     std::optional<bool> yes;
     std::string reason;
@@ -39,7 +39,7 @@ struct Answer {
     Json::Value AsJson() const { return yes ? Json::Value(*yes) : Json::Value(); }
 };
 
-/// A daemon that is away, or a damaged queue, makes one answer unknown and leaves the others.
+/// A daemon that is away, or a damaged queue, makes one reply unknown and leaves the others.
 template <typename Question>
 Answer Ask(Question question) {
     try {
@@ -80,7 +80,7 @@ bool IsPending(const Place& place) {
 bool FindDocument(Json::Value& document, const Place& place) {
     Json::Value query(Json::objectValue);
     query["qsl"]["term"][field::kPath] = place.full_path;
-    query["limit"] = 1;
+    query["limit"] = 1;  // the path is the document's id
     for (const char* name : kFields) {
         query["fields"].append(name);
     }
@@ -101,6 +101,7 @@ bool IsOutdated(const Json::Value& document, const Place& place) {
     if (!read.isInt64() || lstat(place.full_path.c_str(), &status) != 0) {
         return false;
     }
+    // Nanoseconds: a file exchanged for another one of the same second counts as changed.
     return read.asInt64() != status.st_mtim.tv_sec * 1'000'000'000LL + status.st_mtim.tv_nsec;
 }
 
@@ -119,6 +120,8 @@ void AskDaemons(Report& report) {
     report.share = TakeShareLine(
         report.place.share, report.folder == nullptr || report.folder->GetPaused(), report.system);
     if (!report.is_share_indexed) {
+        // The indexer works by shares: a covering folder of an outer share does not count, and
+        // there is no index that could be asked.
         report.in_index = {false, ""};
         return;
     }
@@ -153,6 +156,7 @@ std::string WithRemedy(const std::string& text, const std::string& remedy) {
     return text + (remedy.empty() ? "" : "; " + remedy) + ".";
 }
 
+/// The names by which `folder set` switches them.
 std::string FileTypeName(const std::string& path) {
     constexpr std::array kNames = {"document", "audio", "video", "photo", "other"};
     return kNames.at(static_cast<std::size_t>(fileindex::GetFileTypeByFullPath(path)));
@@ -268,6 +272,8 @@ std::string VerdictOfDocument(const Report& report) {
 
 /// One sentence that says how it stands and what to do.
 std::string Verdict(const Report& report) {
+    // From what concerns all to what concerns this document alone: whoever mends the first thing
+    // may find the rest mended.
     for (const auto& verdict : {VerdictOfRules, VerdictOfShare, VerdictOfQueue}) {
         std::string sentence = verdict(report);
         if (!sentence.empty()) {

@@ -34,6 +34,10 @@ TEST_F(WordingTest, ErrorsAreOneSentence) {
         DescribeError("add /photo", Error(901, "Duplicated ID: /photo")),
         "cannot add /photo: it is already indexed; use 'fileindexctl folder set' to change it "
         "[901]");
+    EXPECT_EQ(Reworded("Quivra error, code=800, reason=[music]"),
+              "no share has that name or holds that path [800]");
+    EXPECT_EQ(Reworded("Quivra error, code=1012"), "kestoelasticd refused it [1012]");
+    EXPECT_EQ(Reworded("the disk is on fire"), "the disk is on fire");
     // What an error is about may be hostile; the sentence stays one line.
     for (const char* path : {"/tmp/no\nsuch\x1b[2J", "/tmp"}) {
         const Result result = Piped({"queue", "show", path});
