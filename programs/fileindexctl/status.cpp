@@ -15,7 +15,6 @@
 #include "fileindex/folder_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "programs/fileindexctl/error_text.h"
-#include "programs/fileindexctl/search.h"
 #include "programs/fileindexctl/shares.h"
 #include "sdk/share.h"
 
@@ -111,18 +110,11 @@ void TakeFromIndexer(ShareLine& share, bool is_paused, const DaemonState& indexe
     }
 }
 
-/// An older daemon does not count its documents; then the index itself is asked.
 void TakeFromSearch(ShareLine& share, const DaemonState& search) {
-    if (!search.IsUp()) {
-        return;
-    }
     const Json::Value told = Find(search.data["indexes"], "id", "fileindex_" + share.name);
     share.made_anew = told["fresh"] == true;
-    AddProblem(share, Reworded(Text(told, "problem")));
     share.documents = Number(told, "documents", -1);
-    if (share.documents < 0) {
-        share.documents = static_cast<std::int64_t>(CountDocuments(share.name, share.path));
-    }
+    AddProblem(share, Reworded(Text(told, "problem")));
 }
 
 std::string UnwatchedText(const ShareLine& share) {
@@ -183,9 +175,7 @@ void TakeProblems(Status& status) {
          {&kIndexer, &status.indexer},
          {&kMonitor, &status.monitor}}};
     for (const auto& [daemon, state] : daemons) {
-        const bool is_old =
-            daemon == &kSearchDaemon && state->reach == DaemonState::Reach::kRefused;
-        std::string problem = is_old ? "" : DescribeProblem(*daemon, *state);
+        std::string problem = DescribeProblem(*daemon, *state);
         if (problem.empty()) {
             problem = Text(state->data, "problem");
         }
@@ -245,6 +235,7 @@ ShareLine TakeShareLine(const std::string& name, bool is_paused, const Status& s
                                 name + " PATH'"
                           : ProblemOfPlace(name));
     TakeFromIndexer(share, is_paused, status.indexer);
+    TakeFromSearch(share, status.search);
     try {
         const std::string queue = sdk::SDKShare(name).GetQueuePath();
         share.queue_lines = CountLines(queue);
@@ -252,7 +243,6 @@ ShareLine TakeShareLine(const std::string& name, bool is_paused, const Status& s
         if (!is_paused) {
             TakeFromMonitor(share, queue, status.monitor);
         }
-        TakeFromSearch(share, status.search);
     } catch (const Error& error) {
         // What was found above is the cause, and says it better.
         if (share.problems.empty()) {
