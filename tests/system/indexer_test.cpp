@@ -86,6 +86,30 @@ TEST_F(IndexerTest, WhatIsPlantedIsReportedAndTheShareHeals) {
     }
 }
 
+TEST_F(IndexerTest, WhatIsLostIsMadeAnewWithoutACommand) {
+    MakeDirectory(kRoot + "/album", 30);
+    ExpectSettled();
+    for (const char* lost :
+         {"/@eaDir/fileindex/db", "/@eaDir/fileindex/queue.backlog", "/@eaDir"}) {
+        SCOPED_TRACE(lost);
+        fs::remove_all(kRoot + lost);
+        WriteFile(kRoot + "/album/since.txt", lost);
+        ExpectSettled();
+    }
+    for (const auto& file : fs::recursive_directory_iterator(kPlace + "/db")) {
+        if (file.is_regular_file()) {
+            WriteFile(file.path(), "garbage");
+        }
+    }
+    WriteFile(kRoot + "/album/since.txt", "damaged");
+    ExpectSettled();
+
+    fs::remove_all(kRoot);
+    fs::create_directory(kRoot);
+    WriteFile(kRoot + "/new.txt", "the share was made again");
+    ExpectSettled();
+}
+
 // A lease makes a file unreadable for as long as its holder likes, up to 45 seconds.
 TEST_F(IndexerTest, ALeasedFileIsListedAndTriedAgain) {
     std::signal(SIGIO, SIG_IGN);
