@@ -21,7 +21,7 @@ namespace {
 constexpr const char* kUnit = "catch_up";
 
 constexpr std::size_t kListPage = 2000;   // documents looked at between two commits
-constexpr std::size_t kFindChunk = 500;   // entries compared and committed together
+constexpr std::size_t kFindChunk = 200;   // entries compared and committed together
 constexpr std::size_t kDirectories = 64;  // taken from the store at once
 
 }  // namespace

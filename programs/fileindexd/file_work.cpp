@@ -14,13 +14,15 @@ using quivra::base::IsAtOrBelow;
 
 namespace {
 
-constexpr std::size_t kFiles = 500;  // between two commits
+// Between two commits. Names are not begun against the clock, so few at a time.
+constexpr std::size_t kFiles = 500;
+constexpr std::size_t kNames = 200;
 
 }  // namespace
 
 /// Files of a pass that had too many. False when none is waiting for its name.
 bool FileWork::Name() {
-    const std::vector<Backlog::File> files = backlog_.UnnamedFiles(kFiles);
+    const std::vector<Backlog::File> files = backlog_.UnnamedFiles(kNames);
     std::vector<Extraction> jobs;
     std::vector<std::string> paths;
     for (const Backlog::File& file : files) {
