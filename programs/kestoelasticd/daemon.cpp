@@ -7,8 +7,9 @@
 namespace elasticd {
 namespace {
 
-/// Clients of one index wait for each other; enough workers keep the others' requests moving.
-constexpr unsigned int kWorkers = 16;
+/// Clients that change one index wait for each other, and a search may take seconds: enough workers
+/// keep the others' requests moving.
+constexpr unsigned int kWorkers = 32;
 
 /// An index in use takes some thirty descriptors; shares may be many.
 void RaiseDescriptorLimit() {

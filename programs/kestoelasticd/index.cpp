@@ -295,6 +295,7 @@ void Index::CommitAndClose() {
 void Index::Close() {
     const std::unique_lock lock(use_);
     CloseFiles();
+    batch_lost_ = false;
 }
 
 void Index::CloseFiles() {

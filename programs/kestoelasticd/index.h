@@ -63,7 +63,7 @@ class Index {
     /// After BeginMove: waits for those who still use the index, commits the batch and closes all
     /// files. A batch that cannot be committed is lost, and the next commit will say so.
     void CommitAndClose();
-    /// The same without the commit; a batch that there was is lost.
+    /// The same for an index that goes, or is made anew: nobody misses the batch.
     void Close();
     /// Continues, in the directory that it was moved to.
     void EndMove(std::string path);

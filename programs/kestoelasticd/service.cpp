@@ -1,5 +1,6 @@
 #include "programs/kestoelasticd/service.h"
 
+#include <malloc.h>
 #include <sodium.h>
 
 #include <condition_variable>
@@ -29,6 +30,8 @@ constexpr std::chrono::milliseconds kMemoryCheckInterval{250};
 constexpr char kSuccess[] = "{\"success\":true}";
 constexpr char kSuccessWithData[] = "{\"success\":true,\"data\":";
 constexpr std::chrono::seconds kMaintenanceInterval{2};
+/// Bytes of request and reply from which on memory is given back afterwards.
+constexpr std::size_t kLargeExchange = 1 << 20;
 
 std::string ErrorReply(int code, const std::string& message) {
     std::string reply =
@@ -114,7 +117,7 @@ Service::Service(const ServiceOptions& options)
       maintenance_([this](const std::stop_token& stop) { MaintainIndexes(stop); }) {}
 
 std::string Service::Handle(const std::string& request_text) {
-    return Reply([&] {
+    std::string reply = Reply([&] {
         CheckMemory();
         Json::Value request;
         if (!quivra::fromString(request, request_text) || !request.isObject()) {
@@ -123,6 +126,10 @@ std::string Service::Handle(const std::string& request_text) {
         return request.isMember("compound") ? Compound(request["compound"])
                                             : RunCommand(request, false);
     });
+    if (request_text.size() + reply.size() > kLargeExchange) {
+        had_large_exchange_ = true;
+    }
+    return reply;
 }
 
 void Service::CheckMemory() {
@@ -238,6 +245,10 @@ void Service::MaintainIndexes(const std::stop_token& stop) {
         wake.wait_for(lock, stop, kMaintenanceInterval, [] { return false; });
         if (!stop.stop_requested()) {
             catalog_.Maintain();
+            // The allocator keeps what one large request took, in each thread that helped.
+            if (had_large_exchange_.exchange(false)) {
+                malloc_trim(0);
+            }
         }
     }
 }

@@ -48,6 +48,7 @@ class Service {
     quivra::base::UniqueFd lock_;
     Catalog catalog_;
     std::atomic<std::chrono::steady_clock::rep> memory_checked_ = 0;
+    std::atomic<bool> had_large_exchange_ = false;
     std::jthread maintenance_;
 };
 

@@ -176,6 +176,33 @@ TEST_F(QueryTest, OrdersAndPages) {
     EXPECT_EQ(client->Query(R"({"qsl": {"all": []}, "limit": 0})")["total"].asInt(), 6);
 }
 
+TEST_F(QueryTest, PagesByCursorWithoutCounting) {
+    Ids all;
+    std::string after;
+    do {
+        const Json::Value reply =
+            client->Query(R"({"qsl": {"all": []}, "limit": 4, "count": false)" + after + "}");
+        EXPECT_FALSE(reply.isMember("total"));
+        for (const Json::Value& hit : reply["data"]) {
+            all.push_back(hit["path"].asString());
+        }
+        after = reply.isMember("next") ? R"(, "after": ")" + reply["next"].asString() + "\"" : "";
+    } while (!after.empty());
+    EXPECT_EQ(all, client->All());
+    EXPECT_EQ(client->Ids(R"({"qsl": {"match": {"_all": "quick"}}, "after": "00"})"),
+              Ids{"error 1410"});
+}
+
+TEST_F(QueryTest, AsManyWordsAsAreAllowedAndADeadline) {
+    std::string words = "quick";
+    for (int i = 0; i < 500; ++i) {
+        words += " w" + std::to_string(i);
+    }
+    const std::string query = R"({"qsl": {"match": {"_all": {"operator": "or", "text": ")" + words;
+    EXPECT_EQ(client->Ids(query + "\"}}}}").size(), 2U);
+    EXPECT_EQ(client->Ids(query + R"("}}}, "timeout": 0})"), Ids{"error 1418"});
+}
+
 TEST_F(QueryTest, HitsCarryTheTextOnRequestOnly) {
     const std::string report = R"({"qsl": {"term": {"size": 2020}})";
     Json::Value hit = client->Query(report + "}")["data"][0];

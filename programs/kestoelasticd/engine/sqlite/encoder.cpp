@@ -82,9 +82,6 @@ Encoded Encode(Record record, Value text, const FieldTable& fields) {
     encoded.text = std::move(text);
     DocumentEncoder encoder(encoded);
     for (const auto& [number, value] : encoded.record) {
-        if (number >= fields.Size()) {
-            throw Damaged("a document has a field without a name");
-        }
         if (const FieldTable::Entry& field = fields.Of(number); field.searched) {
             encoder.Add(number, field, value);
         }

@@ -144,6 +144,13 @@ std::optional<unsigned int> FieldTable::Find(const std::string& name) const {
     return found == numbers_.end() ? std::nullopt : std::optional(found->second);
 }
 
+const FieldTable::Entry& FieldTable::Of(unsigned int number) const {
+    if (number >= entries_.size()) {
+        throw Damaged("a document has a field without a name");
+    }
+    return entries_[number];
+}
+
 unsigned int FieldTable::FindOrAdd(const std::string& name) {
     if (const std::optional<unsigned int> number = Find(name)) {
         return *number;

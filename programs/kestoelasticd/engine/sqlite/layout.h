@@ -76,7 +76,8 @@ class FieldTable {
     std::optional<unsigned int> Find(const std::string& name) const;
     /// Throws Error 1409 when the name is too long or the table is full.
     unsigned int FindOrAdd(const std::string& name);
-    const Entry& Of(unsigned int number) const { return entries_.at(number); }
+    /// Throws Damaged for a number that no field has.
+    const Entry& Of(unsigned int number) const;
     std::size_t Size() const { return entries_.size(); }
     /// Numbers of the fields with a typed column, in the order of the columns.
     const std::vector<unsigned int>& Typed() const { return typed_; }

@@ -121,6 +121,7 @@ bool Searcher::Emit(std::int64_t id, std::string id_path, std::string cursor) {
     hit.id = std::move(id_path);
     hit.cursor = std::move(cursor);
     take_(std::move(hit));
+    deadline_.AllowForHit();
     --left_;
     return left_ > 0;
 }
