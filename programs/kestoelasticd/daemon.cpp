@@ -1,5 +1,6 @@
 #include "programs/kestoelasticd/daemon.h"
 
+#include <malloc.h>
 #include <sys/resource.h>
 
 #include "programs/daemon/frame_server.h"
@@ -26,6 +27,8 @@ int RunDaemon(const DaemonOptions& options) {
     const quivra::daemon::Signals signals;
     quivra::daemon::ServiceManager manager;
     RaiseDescriptorLimit();
+    // Any worker may get the next request: an arena for each would keep as many times the memory.
+    mallopt(M_ARENA_MAX, 2);
     Service service(options.service);
     quivra::daemon::FrameServerOptions server_options;
     server_options.path = options.socket;
