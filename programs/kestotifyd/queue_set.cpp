@@ -150,9 +150,9 @@ void QueueSet::Apply(const Change& change, Time now) {
     for (Queue* const queue : Concerned(change)) {
         queue->translator->Apply(change, now);
         if (queue->translator->LineCount() > 0 || MovesQueue(change, *queue)) {
-            Schedule(*queue, now + kBatchTime);
+            Schedule(*queue, BatchDue(*queue, now));
         } else if (const std::optional<Time> due = queue->translator->NextDue()) {
-            Schedule(*queue, std::max(*due, now + kBatchTime));
+            Schedule(*queue, std::max(*due, BatchDue(*queue, now)));
         }
         if (queue->translator->LineCount() > kMaxBatchLines) {
             FlushQueue(*queue, now, now);
@@ -170,6 +170,10 @@ bool QueueSet::MovesQueue(const Change& change, const Queue& queue) {
     return is_move && (quivra::base::IsAtOrBelow(directory, change.path) ||
                        (change.kind == Kind::kRenamed &&
                         quivra::base::IsAtOrBelow(directory, change.path_old)));
+}
+
+Time QueueSet::BatchDue(const Queue& queue, Time now) {
+    return std::max(now + kCalmBatchTime, queue.written + kBatchTime);
 }
 
 void QueueSet::Schedule(Queue& queue, Time due) {
@@ -255,6 +259,7 @@ void QueueSet::FlushQueue(Queue& queue, Time now, Time held_until) {
     switch (queue.writer->Write(MayMake(queue))) {
         case QueueWriter::Result::kDone:
             queue.translator->OnWritten(queue.writer->HasBegunFile());
+            queue.written = now;
             queue.flush_due = queue.translator->NextDue();
             break;
         case QueueWriter::Result::kBusy:

@@ -20,8 +20,11 @@ namespace kestotifyd {
 /// folder is owed for the time in which it was not watched, and writes the lines in batches.
 class QueueSet {
   public:
-    /// Lines wait at most this long for others to share the queue's lock with.
+    /// Lines of a busy queue wait this long after the batch before for others to share its lock
+    /// with.
     static constexpr std::chrono::milliseconds kBatchTime{100};
+    /// The first lines of a calm queue wait no longer than one change's events take to arrive.
+    static constexpr std::chrono::milliseconds kCalmBatchTime{10};
 
     QueueSet(WatchedFolders& watched, QueueTranslator::NameTest is_hidden);
 
@@ -70,6 +73,7 @@ class QueueSet {
         std::unique_ptr<QueueWriter> writer;
         std::map<std::string, Folder> folders{};
         std::optional<Time> flush_due{};
+        Time written{};  ///< when its last batch was
     };
 
     void UpdateQueue(const Registration& registration, bool is_start, Time now);
@@ -79,6 +83,7 @@ class QueueSet {
     std::set<Queue*> Concerned(const Change& change) const;
     void AddConcerned(const std::string& path, std::set<Queue*>& concerned) const;
     void RebuildIndex();
+    static Time BatchDue(const Queue& queue, Time now);
     void Schedule(Queue& queue, Time due);
     void FlushQueue(Queue& queue, Time now, Time held_until);
 
