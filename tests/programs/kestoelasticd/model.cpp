@@ -125,8 +125,11 @@ bool Model::Matches(const std::string& id, const Query& query) const {
             return std::any_of(query.parts.begin(), query.parts.end(), part_matches);
         case Form::kNot:
             return !Matches(id, query.parts[0]);
-        case Form::kBelow:
-            return IsBelow(id, query.text) || (query.inclusive && id == query.text);
+        case Form::kBelow: {
+            // "/" stands for the root, although it is an id, too.
+            const std::string directory = query.text == "/" ? "" : query.text;
+            return IsBelow(id, directory) || (query.inclusive && id == directory);
+        }
         case Form::kRange: {
             const Value value = ValueOf(id, query.field);
             return !IsNone(value) && Within(*ToNumber(schema_.Of(query.field).type, value), query);
