@@ -65,8 +65,9 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
         const elasticd::Search search(query, *fixture.schema);
         const elasticd::SearchResult found =
             elasticd::RunSearch(search, *fixture.schema, *fixture.index);
-        Json::Value hits;
-        if (!quivra::fromString(hits, found.data) || !hits.isArray() || hits.size() > found.total) {
+        Json::Value reply;
+        if (!quivra::fromString(reply, found.reply) || !reply["data"].isArray() ||
+            reply["data"].size() > found.total) {
             __builtin_trap();
         }
     } catch (const quivra::Error& error) {

@@ -72,7 +72,7 @@ class HitWriter {
         : search_(search), schema_(schema), out_(out) {}
 
     void Append(const engine::Hit& hit) {
-        out_ += out_.size() > 1 ? ",{" : "{";
+        out_ += out_.back() == '[' ? "{" : ",{";
         start_ = out_.size();
         marked_.clear();
         if (search_.with_id) {
@@ -233,30 +233,30 @@ void Search::ReadHighlight(const Json::Value& highlight, ParsedQuery& parsed,
     }
 }
 
-std::string SearchResult::Members() const {
-    std::string members = ",\"data\":" + data;
-    if (counted) {
-        members = ",\"total\":" + std::to_string(total) + members;
-    }
-    return next.empty() ? members : members + ",\"next\":\"" + ToHex(next) + "\"";
-}
-
 SearchResult RunSearch(const Search& search, const engine::Schema& schema, engine::Index& index) {
     SearchResult result;
-    HitWriter writer(search, schema, result.data);
+    result.reply = R"({"success":true,"data":[)";
+    HitWriter writer(search, schema, result.reply);
     std::size_t hits = 0;
+    std::string next;
     engine::SearchRequest request = search.request;
     request.deadline = engine::SearchRequest::Clock::now() + search.timeout;
     const engine::SearchResult found = index.Search(request, [&](engine::Hit&& hit) {
         writer.Append(hit);
-        result.next = ++hits == request.limit ? std::move(hit.cursor) : std::string();
-        if (result.data.size() > kMaxData) {
+        next = ++hits == request.limit ? std::move(hit.cursor) : std::string();
+        if (result.reply.size() > kMaxData) {
             throw quivra::Error(kReplyTooLarge, "Too many hits for one reply; use \"limit\"");
         }
     });
-    result.data += ']';
     result.total = found.total;
-    result.counted = request.count;
+    result.reply += ']';
+    if (request.count) {
+        result.reply += ",\"total\":" + std::to_string(result.total);
+    }
+    if (!next.empty()) {
+        result.reply += ",\"next\":\"" + ToHex(next) + "\"";
+    }
+    result.reply += '}';
     return result;
 }
 

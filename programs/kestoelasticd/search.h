@@ -33,14 +33,10 @@ struct Search {
                        const engine::Schema& schema);
 };
 
-/// What one query found, as the JSON text of the reply's members behind "success".
+/// What one query found.
 struct SearchResult {
-    std::string data = "[";  ///< an array of hits
+    std::string reply;  ///< the JSON text of the whole reply: it may be large, so there is one copy
     std::uint64_t total = 0;
-    bool counted = true;
-    std::string next;  ///< the cursor behind the last hit, where there may be more
-
-    std::string Members() const;
 };
 
 /// Carries it out. Throws Error 1416 for a result that no reply can hold, 1418 at the deadline, and

@@ -192,10 +192,10 @@ void Service::UseIndex(const std::string& id, const std::function<void(Index&)>&
 std::string Service::RunDocumentCommand(const std::string& command, const std::string& id,
                                         const Json::Value& data) {
     if (command == command::kDocumentGetByQuery) {
-        std::string reply = "{\"success\":true";
+        std::string reply;
         const Json::Value& query = ObjectMember(data, "query");
-        UseIndex(id, [&](Index& index) { reply += index.Query(query).Members(); });
-        return reply + "}";
+        UseIndex(id, [&](Index& index) { reply = std::move(index.Query(query).reply); });
+        return reply;
     }
     if (command == command::kDocumentUpsertById || command == command::kDocumentSetById) {
         const bool whole = command == command::kDocumentUpsertById;
