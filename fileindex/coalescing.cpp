@@ -5,17 +5,7 @@
 namespace quivra::fileindex {
 namespace {
 
-/// What an incoming op does with an existing one on the same node. Everything but kKeep drops the
-/// incoming op.
-enum Action {
-    kKeep,         ///< nothing: both stay
-    kDrop,         ///< the existing op covers the incoming one
-    kToDelete,     ///< the existing op becomes OP_DELETE
-    kToUpsert,     ///< the existing op becomes OP_UPSERT
-    kToReindex,    ///< the existing op becomes OP_REINDEX
-    kToUpdateCfg,  ///< the existing op becomes OP_UPDATE_CFG with the incoming data
-    kMerge,        ///< the existing op merges the incoming data
-};
+using enum Action;
 
 /// Rows are the kinds of the existing op. The asymmetries are deliberate: a modify does not revive
 /// what is to be deleted, a create does; a delete waits behind a reindex or changed settings; a
@@ -33,7 +23,15 @@ constexpr Action kCoalescing[][6] = {
 };
 // clang-format on
 
-void Apply(Action action, OP& existing, const OP& incoming) {
+}  // namespace
+
+Action CoalescingRule(FileIndexOP existing, Incoming incoming) {
+    const auto row = static_cast<std::size_t>(existing);
+    return row < std::size(kCoalescing) ? kCoalescing[row][static_cast<std::size_t>(incoming)]
+                                        : kKeep;
+}
+
+void Apply(Action action, OP& existing, const OP& incoming_op) {
     switch (action) {
         case kKeep:
         case kDrop:
@@ -49,15 +47,13 @@ void Apply(Action action, OP& existing, const OP& incoming) {
             break;
         case kToUpdateCfg:
             SetKind(existing, OP_UPDATE_CFG);
-            existing.data = incoming.data;
+            existing.data = incoming_op.data;
             break;
         case kMerge:
-            existing.MergeData(incoming.data);
+            existing.MergeData(incoming_op.data);
             break;
     }
 }
-
-}  // namespace
 
 void SetKind(OP& op, FileIndexOP kind) {
     op.op = kind;
@@ -69,13 +65,12 @@ void SetKind(OP& op, FileIndexOP kind) {
     }
 }
 
-bool CoalesceInto(OP& existing, const OP& incoming, Incoming handler) {
-    if (static_cast<std::size_t>(existing.op) >= std::size(kCoalescing)) {
+bool IsSwitchedOn(const Json::Value& settings, const char* key) {
+    if (!settings.isObject()) {
         return false;
     }
-    const Action action = kCoalescing[existing.op][static_cast<std::size_t>(handler)];
-    Apply(action, existing, incoming);
-    return action != kKeep;
+    const Json::Value& member = settings[key];
+    return member.isBool() && member.asBool();
 }
 
 }  // namespace quivra::fileindex

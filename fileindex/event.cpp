@@ -6,6 +6,7 @@
 
 #include "common/json.h"
 #include "common/log.h"
+#include "fileindex/queue_line.h"
 
 namespace quivra::fileindex {
 namespace {
@@ -55,37 +56,69 @@ class PlainLine : public rapidjson::BaseReaderHandler<rapidjson::UTF8<>, PlainLi
     bool has_path_ = false;
 };
 
-/// Reads a plain line several times as fast as the JSON library, which decides on every line that
-/// is refused here. A refused event is unspecified.
-bool ReadPlainLine(Event& event, const std::string& line) {
-    if (line.find('\\') != std::string::npos) {
-        return false;  // only one library interprets escapes
+/// How much of a line beyond the limit is told.
+constexpr std::size_t kShownSize = 1024;
+
+[[noreturn]] void FailMalformed(const char* condition, const std::string& text) {
+    Fail({"optree", 50}, condition,
+         Error(Error::kMalformedEvent, "Malformed event_raw: " + ShownLine(text)));
+}
+
+bool IsWithinLimits(const Event& event) {
+    return event.path.size() <= kMaxPathSize && event.path_old.size() <= kMaxPathSize;
+}
+
+void ClearOptional(Event& event) {
+    event.is_dir = false;
+    event.path_old.clear();
+    if (!event.data.isNull()) {
+        event.data = Json::Value();
     }
-    static thread_local rapidjson::Reader reader;
-    rapidjson::StringStream stream(line.c_str());
-    PlainLine handler(event);
-    return !reader.Parse(stream, handler).IsError() && handler.IsComplete() &&
-           stream.Tell() == line.size();  // a NUL byte does not end the line
 }
 
 }  // namespace
 
-Event::Event(const std::string& event_raw) {
-    if (ReadPlainLine(*this, event_raw)) {
-        return;
+// Several times as fast as the JSON library, which decides on every line that is refused here.
+bool ParsePlainLine(Event& event, const std::string& text) {
+    // Only one library interprets escapes.
+    if (text.size() > kMaxLineSize || text.find('\\') != std::string::npos) {
+        return false;
     }
+    ClearOptional(event);
+    // It keeps a stack as large as the longest line, which the limit bounds.
+    static thread_local rapidjson::Reader reader;
+    rapidjson::StringStream stream(text.c_str());
+    PlainLine handler(event);
+    return !reader.Parse(stream, handler).IsError() && handler.IsComplete() &&
+           stream.Tell() == text.size() &&  // a NUL byte does not end the line
+           IsWithinLimits(event);
+}
+
+void ParseLine(Event& event, const std::string& text) {
+    event.event = 0;
+    ClearOptional(event);
     Json::Value json;
-    if (!fromString(json, event_raw)) {
-        Fail({"optree", 50}, "!data.fromString(event_raw)",
-             Error(Error::kMalformedEvent, "Malformed event_raw: " + event_raw));
+    if (text.size() > kMaxLineSize || !fromString(json, text)) {
+        FailMalformed("!data.fromString(event_raw)", text);
     }
-    is_dir = false;
-    path_old.clear();
-    GetJsonValue(event, json, "event", true);
-    GetJsonValue(is_dir, json, "is_dir", false);
-    GetJsonValue(path, json, "path", true);
-    GetJsonValue(path_old, json, "path_old", false);
-    GetJsonValue(data, json, "data", false);
+    GetJsonValue(event.event, json, "event", true);
+    GetJsonValue(event.is_dir, json, "is_dir", false);
+    GetJsonValue(event.path, json, "path", true);
+    GetJsonValue(event.path_old, json, "path_old", false);
+    GetJsonValue(event.data, json, "data", false);
+    if (!IsWithinLimits(event)) {
+        FailMalformed("!IsWithinLimits(event)", text);
+    }
+}
+
+std::string ShownLine(const std::string& text) {
+    return text.size() <= kMaxLineSize ? text : text.substr(0, kShownSize) + "...";
+}
+
+Event::Event(const std::string& event_raw) {
+    if (!ParsePlainLine(*this, event_raw)) {
+        ParseLine(*this, event_raw);
+    }
 }
 
 }  // namespace quivra::fileindex

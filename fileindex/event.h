@@ -27,8 +27,9 @@ enum : std::uint32_t {
 /// false), "path_old" (for a rename), "data" (for changed settings). Members that may be missing
 /// are ignored when they have the wrong type.
 struct QUIVRA_EXPORT Event {
-    /// Throws Error 906 ("Malformed event_raw: " and the line) when the line is no JSON, and Error
-    /// 120 when a required member is missing or has the wrong type.
+    /// Throws Error 906 ("Malformed event_raw: " and the line, logged) when the line is not JSON,
+    /// is longer than 1 MiB (the beginning of the line is given then) or has a path of more than
+    /// 64 KiB, and Error 120 when a required member is missing or has the wrong type.
     explicit Event(const std::string& event_raw);
 
     std::uint32_t event = 0;  ///< EVENT_* bits; each is acted upon separately
@@ -36,6 +37,10 @@ struct QUIVRA_EXPORT Event {
     std::string path;      ///< full path; of a rename, the new one
     std::string path_old;  ///< of a rename, the old full path; else empty
     Json::Value data;      ///< of changed settings, the new ones; else null
+
+  private:
+    friend struct QueueLine;
+    Event() = default;
 };
 
 }  // namespace quivra::fileindex

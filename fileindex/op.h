@@ -35,6 +35,7 @@ struct QUIVRA_EXPORT OP {
     OP(std::shared_ptr<OPNode> node, FileIndexOP op, std::string path, Json::Value data);
     OP(const OP&) = delete;  // an op is known by its identity: it sits in two lists
     OP& operator=(const OP&) = delete;
+    ~OP();
 
     /// Merges newer settings into this op's: each of "document", "audio", "video" and "photo"
     /// becomes true if it is true on either side, else false. Once switched on within one batch, a
@@ -48,6 +49,11 @@ struct QUIVRA_EXPORT OP {
 
   private:
     friend class OPTree;
+    friend class LiveOps;
+    struct Group;
+    std::unique_ptr<Group> group_;  ///< of a leader (see LiveOps), its followers
+    OP* link_ = nullptr;            ///< of a leader, the node's next one; of a follower, its leader
+    bool follows_ = false;
     bool attached_ = false;  ///< it is on the lists of a tree and of a node
     bool counted_ = false;   ///< it is part of the tree's count of consumed ops
 };
@@ -83,9 +89,18 @@ struct QUIVRA_EXPORT OPNode : std::enable_shared_from_this<OPNode> {
 
   private:
     friend class OPTree;
-    class ChildIndex;
-    std::unique_ptr<ChildIndex> index_;  ///< beside `children`, once these are many
-    std::size_t settled_ = 0;            ///< how many leading `ops` will never coalesce again
+    friend class LiveOps;
+    friend class PendingBelow;
+    struct Extra;
+    Extra& NeedExtra();
+    /// Most likely the child of that name, or null; touches no child.
+    const OPNode* GuessChild(std::string_view name) const;
+    std::unique_ptr<Extra> extra_;  ///< what most nodes, the files, do without
+    OP* live_ = nullptr;            ///< the ops that can still change: see LiveOps
+    std::uint32_t position_ = 0;    ///< among the parent's children
+    std::uint32_t dead_ = 0;        ///< so many leading `ops` are cancelled for good
+    std::uint8_t listed_ = 0;       ///< on which lists of its parent it is: see PendingBelow
+    bool stale_ = false;            ///< its public fields wait for OPTree::Settle
 };
 
 /// "Node[NAME]: " and a line end; then each of its ops on a line of its own, indented by two.

@@ -8,6 +8,7 @@
 #include "common/error.h"
 #include "common/log.h"
 #include "fileindex/coalescing.h"
+#include "fileindex/queue_line.h"
 #include "fileindex/queue_reader.h"
 
 namespace quivra::fileindex {
@@ -16,37 +17,16 @@ namespace {
 /// How many directories a tree remembers, so that their paths take no noteworthy memory.
 constexpr std::size_t kMaxRemembered = 4096;
 
+/// How many lines are parsed before the first of them is inserted: enough to hide how slow the
+/// memory is, few enough to stay in the cache.
+constexpr std::size_t kLinesAhead = 32;
+
 using NodePtr = std::shared_ptr<OPNode>;
 using OPPtr = std::shared_ptr<OP>;
-
-/// The nodes of a subtree, parents before children, children in the order of their creation.
-std::vector<NodePtr> Subtree(const NodePtr& top) {
-    std::vector<NodePtr> nodes;
-    std::vector<NodePtr> pending{top};
-    while (!pending.empty()) {
-        nodes.push_back(std::move(pending.back()));
-        pending.pop_back();
-        const auto& children = nodes.back()->children;
-        pending.insert(pending.end(), children.rbegin(), children.rend());
-    }
-    return nodes;
-}
 
 bool IsCanonical(std::string_view path) {
     return path.size() > 1 && path.front() == '/' && path.back() != '/' &&
            path.find("//") == std::string_view::npos;
-}
-
-/// The work that a rename takes over from the object's old place, if any: the last one queued. It
-/// is cancelled there.
-FileIndexOP TakeOverWork(const OPNode& old_node) {
-    FileIndexOP work = OP_NONE;
-    for (const OPPtr& op : old_node.ops) {
-        if (op->op == OP_UPSERT || op->op == OP_ATTR || op->op == OP_REINDEX) {
-            work = std::exchange(op->op, OP_NONE);
-        }
-    }
-    return work;
 }
 
 }  // namespace
@@ -74,16 +54,66 @@ OPTree::~OPTree() {
 void OPTree::BuildTree() {
     QueueReader reader(queue_path);
     reader.RequireOpen({"optree", 190});
-    std::string line;
-    while (reader.ReadLine(line)) {
-        if (log_level == kLogLevelDebug) {
-            LogTrace({"optree", 194}, "Got event: %s", line.c_str());
+    building_ = true;
+    std::vector<QueueLine> lines;
+    while (ReadAhead(reader, lines)) {
+        LookAhead(lines);
+        for (QueueLine& line : lines) {
+            Insert(line);
         }
-        try {
-            Insert(Event(line));
-        } catch (const Error& error) {
-            LogError({"optree", 198}, "InsertEvent failed, event_raw=%s, code=%d, reason=%s",
-                     line.c_str(), error.code, error.reason.c_str());
+    }
+    building_ = false;
+    Settle();
+}
+
+bool OPTree::ReadAhead(QueueReader& reader, std::vector<QueueLine>& lines) {
+    lines.resize(kLinesAhead);
+    std::size_t count = 0;
+    while (count < kLinesAhead && reader.ReadLine(lines[count].text)) {
+        lines[count].is_plain = ParsePlainLine(lines[count].event, lines[count].text);
+        ++count;
+    }
+    lines.resize(count);
+    return count > 0;
+}
+
+void OPTree::Insert(QueueLine& line) {
+    if (log_level == kLogLevelDebug) {
+        LogTrace({"optree", 194}, "Got event: %s", ShownLine(line.text).c_str());
+    }
+    try {
+        if (!line.is_plain) {
+            ParseLine(line.event, line.text);
+        }
+        Insert(line.event);
+    } catch (const Error& error) {
+        // A marker whose line is bad tells of lost events as well as any other.
+        crashed = crashed || (line.event.event & EVENT_QUEUE_CRASH) != 0;
+        LogError({"optree", 198}, "InsertEvent failed, event_raw=%s, code=%d, reason=%s",
+                 ShownLine(line.text).c_str(), error.code, error.reason.c_str());
+    }
+}
+
+// A queue in random order finds every node out of the cache. To ask for those of several lines at
+// once takes half of the time that asking for one after the other does.
+void OPTree::LookAhead(const std::vector<QueueLine>& lines) {
+    const OPNode* nodes[kLinesAhead] = {};
+    for (std::size_t i = 0; i < lines.size(); ++i) {
+        const std::string_view path = lines[i].event.path;
+        const std::size_t slash = path.rfind('/');
+        if (!lines[i].is_plain || slash == std::string_view::npos) {
+            continue;
+        }
+        if (const NodePtr* directory = FindDirectory(path.substr(0, slash))) {
+            nodes[i] = (*directory)->GuessChild(path.substr(slash + 1));
+            __builtin_prefetch(nodes[i]);
+            __builtin_prefetch(reinterpret_cast<const char*>(nodes[i]) + 64);
+        }
+    }
+    for (const OPNode* node : nodes) {
+        if (node != nullptr) {
+            __builtin_prefetch(node->name.data());
+            __builtin_prefetch(node->live_);
         }
     }
 }
@@ -135,35 +165,44 @@ void OPTree::InsertEvent(const std::shared_ptr<Event>& event) {
 }
 
 void OPTree::Insert(const Event& event) {
+    crashed = crashed || (event.event & EVENT_QUEUE_CRASH) != 0;
     const NodePtr node = GetNodeByPath(event.path);
     const OPPtr op = NewOP(node);
+    try {
+        Dispatch(event, node, op);
+    } catch (const Error&) {
+        Finish(node, op);  // what an earlier bit of the line has done stays
+        throw;
+    }
+    Finish(node, op);
+}
+
+void OPTree::Dispatch(const Event& event, const NodePtr& node, const OPPtr& op) {
     const auto has = [&](std::uint32_t bit) { return (event.event & bit) != 0; };
     if (has(EVENT_CREATE)) {
-        event.is_dir ? HandleReindex(node, op) : HandleCreate(node, op);
+        event.is_dir ? Reindex(node, op) : Fold(node, op, OP_UPSERT, Incoming::kCreate);
     }
     if (has(EVENT_ATTR)) {
-        HandleAttr(node, op);
+        Fold(node, op, OP_ATTR, Incoming::kAttr);
     }
     if (has(EVENT_MODIFY)) {
-        HandleModify(node, op);
+        Fold(node, op, OP_UPSERT, Incoming::kModify);
     }
     if (has(EVENT_DELETE)) {
         // What became of everything below a directory is settled by looking at the disk.
-        event.is_dir ? HandleReindex(node, op) : HandleDelete(node, op);
+        event.is_dir ? Reindex(node, op) : Fold(node, op, OP_DELETE, Incoming::kDelete);
     }
     if (has(EVENT_RENAME)) {
+        const NodePtr old_node = GetNodeByPath(event.path_old);
         op->path = event.path_old;
-        HandleRename(node, op);
+        Rename(node, op, old_node);
     }
     if (has(EVENT_REINDEX)) {
-        HandleReindex(node, op);
+        Reindex(node, op);
     }
     if (has(EVENT_UPDATE_CFG)) {
         op->data = event.data;
-        HandleUpdateCfg(node, op);
-    }
-    if (has(EVENT_QUEUE_CRASH)) {
-        crashed = true;
+        Fold(node, op, OP_UPDATE_CFG, Incoming::kUpdateCfg);
     }
 }
 
@@ -176,63 +215,6 @@ OPPtr OPTree::NewOP(const NodePtr& node) {
         unused_op_ = std::make_shared<OP>(node, OP_NONE, std::string(), Json::Value());
     }
     return unused_op_;
-}
-
-void OPTree::HandleCreate(const NodePtr& node, const OPPtr& op) {
-    Coalesce(*node, *op, OP_UPSERT, Incoming::kCreate);
-    Attach(node, op);
-}
-
-void OPTree::HandleModify(const NodePtr& node, const OPPtr& op) {
-    Coalesce(*node, *op, OP_UPSERT, Incoming::kModify);
-    Attach(node, op);
-}
-
-void OPTree::HandleDelete(const NodePtr& node, const OPPtr& op) {
-    Coalesce(*node, *op, OP_DELETE, Incoming::kDelete);
-    Attach(node, op);
-}
-
-void OPTree::HandleAttr(const NodePtr& node, const OPPtr& op) {
-    Coalesce(*node, *op, OP_ATTR, Incoming::kAttr);
-    Attach(node, op);
-}
-
-void OPTree::HandleUpdateCfg(const NodePtr& node, const OPPtr& op) {
-    Coalesce(*node, *op, OP_UPDATE_CFG, Incoming::kUpdateCfg);
-    Attach(node, op);
-}
-
-void OPTree::HandleReindex(const NodePtr& node, const OPPtr& op) {
-    Coalesce(*node, *op, OP_REINDEX, Incoming::kReindex);
-    const auto cancel = [](const NodePtr& below) {
-        for (const OPPtr& pending : below->ops) {
-            if (pending->op != OP_RENAME) {
-                pending->op = OP_NONE;
-            }
-        }
-    };
-    TraverseNodeDescendant(node, cancel, true);
-    Attach(node, op);
-}
-
-void OPTree::HandleRename(const NodePtr& node, const OPPtr& op) {
-    const NodePtr old_node = GetNodeByPath(op->path);
-    SetKind(*op, OP_RENAME);
-    // What was at the new place is replaced.
-    for (std::size_t i = SkipSettled(*node, *op); i < node->ops.size(); ++i) {
-        OP& replaced = *node->ops[i];
-        if (replaced.op == OP_DELETE || replaced.op == OP_UPSERT || replaced.op == OP_ATTR) {
-            replaced.op = OP_NONE;
-        }
-    }
-    const FileIndexOP work = TakeOverWork(*old_node);
-    MoveOPs(*old_node, node, [](const OP&) { return true; });
-    MoveDescendants(old_node, op->path.size(), node->GetPath(), *op);
-    Attach(node, op);
-    if (work != OP_NONE) {
-        Attach(node, std::make_shared<OP>(node, work, std::string(), Json::Value()));
-    }
 }
 
 int OPTree::ProcessOP(const std::function<void(OPPtr)>& fn) {
@@ -251,75 +233,17 @@ int OPTree::ProcessOP(const std::function<void(OPPtr)>& fn) {
 
 void OPTree::TraverseNodeDescendant(const NodePtr& node, const std::function<void(NodePtr)>& fn,
                                     bool skip_self) {
-    const std::vector<NodePtr> nodes = Subtree(node);
+    std::vector<NodePtr> nodes;
+    std::vector<NodePtr> pending{node};
+    while (!pending.empty()) {
+        nodes.push_back(std::move(pending.back()));
+        pending.pop_back();
+        const auto& children = nodes.back()->children;
+        pending.insert(pending.end(), children.rbegin(), children.rend());
+    }
     for (std::size_t i = skip_self ? 1 : 0; i < nodes.size(); ++i) {
         fn(nodes[i]);
     }
-}
-
-void OPTree::Coalesce(OPNode& node, OP& op, FileIndexOP kind, Incoming incoming) {
-    SetKind(op, kind);
-    for (std::size_t i = SkipSettled(node, op); i < node.ops.size(); ++i) {
-        OP& existing = *node.ops[i];
-        // The remaining ops are treated all the same, also once the incoming op was dropped.
-        if (&existing != &op && CoalesceInto(existing, op, incoming)) {
-            op.op = OP_NONE;
-        }
-    }
-}
-
-std::size_t OPTree::SkipSettled(OPNode& node, const OP& incoming) {
-    std::size_t& settled = node.settled_;
-    settled = std::min(settled, node.ops.size());
-    while (settled < node.ops.size()) {
-        const OP& op = *node.ops[settled];
-        if (&op == &incoming || (op.op != OP_NONE && op.op != OP_RENAME)) {
-            break;
-        }
-        ++settled;
-    }
-    return settled;
-}
-
-void OPTree::Attach(const NodePtr& node, const OPPtr& op) {
-    if (!op->counted_) {
-        op->counted_ = true;
-        ++consumed_;
-    }
-    if (op->op != OP_NONE && !op->attached_) {
-        op->attached_ = true;
-        ops.push_back(op);
-        node->ops.push_back(op);
-    }
-}
-
-template <typename Predicate>
-void OPTree::MoveOPs(OPNode& from, const NodePtr& to, const Predicate& moves) {
-    const auto stays = [&](const OPPtr& op) { return !moves(*op); };
-    const auto first = std::stable_partition(from.ops.begin(), from.ops.end(), stays);
-    from.settled_ = 0;
-    if (&from == to.get()) {
-        return;  // a rename onto itself: what moves is behind what stays now
-    }
-    for (auto op = first; op != from.ops.end(); ++op) {
-        (*op)->node = to;
-        to->ops.push_back(std::move(*op));
-    }
-    from.ops.erase(first, from.ops.end());
-}
-
-void OPTree::MoveDescendants(const NodePtr& old_top, std::size_t old_length,
-                             const std::string& new_path, const OP& rename) {
-    const auto moves = [&](const OP& op) { return op.op >= OP_UPSERT && &op != &rename; };
-    const auto move = [&](const NodePtr& node) {
-        // Only where there is work: a copy of every node would let a few hostile renames of a
-        // directory into itself double the tree again and again.
-        if (std::any_of(node->ops.begin(), node->ops.end(),
-                        [&](const OPPtr& op) { return moves(*op); })) {
-            MoveOPs(*node, GetNodeByPath(new_path + node->GetPath().substr(old_length)), moves);
-        }
-    };
-    TraverseNodeDescendant(old_top, move, true);
 }
 
 }  // namespace quivra::fileindex

@@ -16,6 +16,8 @@
 namespace quivra::fileindex {
 
 enum class Incoming;
+class QueueReader;
+struct QueueLine;
 
 /// Folds the events of one queue file into the shortest list of operations that brings the index
 /// up to date: a file that was created and modified twice is indexed once, a directory that is
@@ -38,7 +40,7 @@ class QUIVRA_EXPORT OPTree {
     void BuildTree();
 
     /// Inserts one event, which is not kept. Throws Error 9999 when its path, or the old path of a
-    /// rename, is not a canonical absolute path.
+    /// rename, is not a canonical absolute path; a crash marker counts all the same.
     void InsertEvent(const std::shared_ptr<Event>& event);
 
     /// The node of a full path, created with its ancestors. Throws Error 9999 unless the path has
@@ -86,37 +88,55 @@ class QUIVRA_EXPORT OPTree {
     std::vector<std::shared_ptr<OP>> ops;  ///< every op ever attached, in that order
 
   private:
+    using NodePtr = std::shared_ptr<OPNode>;
+    using OPPtr = std::shared_ptr<OP>;
     struct Empty {};
     struct PathHash : std::hash<std::string_view> {
         using is_transparent = void;
     };
     OPTree(Empty, const std::string& queue_path);
 
+    /// Reads some lines ahead of their insertion. False at the end of the queue.
+    bool ReadAhead(QueueReader& reader, std::vector<QueueLine>& lines);
+    void Insert(QueueLine& line);
     void Insert(const Event& event);
+    void Dispatch(const Event& event, const NodePtr& node, const OPPtr& op);
     /// The node of a directory that was looked up lately, else null.
-    const std::shared_ptr<OPNode>* FindDirectory(std::string_view path);
-    void RememberDirectory(std::string_view path, std::shared_ptr<OPNode> node);
+    const NodePtr* FindDirectory(std::string_view path);
+    void RememberDirectory(std::string_view path, NodePtr node);
+    void LookAhead(const std::vector<QueueLine>& lines);
     /// The op of the last event once more, when no list took it: most events of a busy file add
     /// none.
-    std::shared_ptr<OP> NewOP(const std::shared_ptr<OPNode>& node);
-    /// Sets the incoming op's kind; makes it OP_NONE when a pending op covers it.
-    void Coalesce(OPNode& node, OP& op, FileIndexOP kind, Incoming incoming);
-    /// The position of the first op on the node that can still coalesce. What comes before it is
-    /// cancelled or a rename for good, and never looked at again: a file that is saved by renaming
-    /// gathers renames.
-    static std::size_t SkipSettled(OPNode& node, const OP& incoming);
-    void Attach(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
-    template <typename Predicate>
-    static void MoveOPs(OPNode& from, const std::shared_ptr<OPNode>& to, const Predicate& moves);
-    void MoveDescendants(const std::shared_ptr<OPNode>& old_top, std::size_t old_length,
-                         const std::string& new_path, const OP& rename);
+    OPPtr NewOP(const NodePtr& node);
+
+    /// Makes the op one of that kind, or OP_NONE when a pending op covers it, and attaches it.
+    void Fold(const NodePtr& node, const OPPtr& op, FileIndexOP kind, Incoming incoming);
+    void Reindex(const NodePtr& node, const OPPtr& op);
+    void Rename(const NodePtr& node, const OPPtr& op, const NodePtr& old_node);
+    void Attach(const NodePtr& node, const OPPtr& op);
+    /// The event's op can coalesce from now on.
+    void Finish(const NodePtr& node, const OPPtr& op);
+    static void MarkPending(OPNode& node);
+    void MoveAllOPs(OPNode& from, const NodePtr& to);
+    void MoveOPsBelow(const NodePtr& old_top, const NodePtr& new_top, const OP& rename);
+    static std::vector<OPPtr> DetachMoving(OPNode& node, const OP& rename);
+    void AttachMoved(std::vector<OPPtr>& moved, OPNode& from, OPNode& to);
+    static void Consolidate(OPNode& node);
+
+    /// Brings the public fields up to date that a cheap step has left behind.
+    void Settle();
+    void SetStale(OPNode& node);
+    /// Learns anew what is pending, from the public fields: they may have been changed.
+    static void TakeStock(OPNode& node, const OP& incoming_op);
+    void TakeStockBelow(const NodePtr& top, const OP& incoming_op);
 
     std::size_t consumed_ = 0;
-    std::shared_ptr<OP> unused_op_;
+    OPPtr unused_op_;
+    bool building_ = false;       ///< nobody can look at the fields before the last line is in
+    std::vector<OPNode*> stale_;  ///< what Settle has to do
     /// Directories that were looked up lately: queues name many files of few of them.
-    std::unordered_map<std::string, std::shared_ptr<OPNode>, PathHash, std::equal_to<>>
-        directories_;
-    const std::pair<const std::string, std::shared_ptr<OPNode>>* last_directory_ = nullptr;
+    std::unordered_map<std::string, NodePtr, PathHash, std::equal_to<>> directories_;
+    const std::pair<const std::string, NodePtr>* last_directory_ = nullptr;
 };
 
 }  // namespace quivra::fileindex

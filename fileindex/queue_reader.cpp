@@ -2,10 +2,12 @@
 
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 
 #include "fileindex/queue_directory.h"
+#include "fileindex/queue_line.h"
 
 namespace quivra::fileindex {
 namespace {
@@ -30,12 +32,13 @@ bool QueueReader::ReadLine(std::string& line) {
         found_text = true;
         const std::size_t available = static_cast<std::size_t>(end_ - next_);
         const auto* newline = static_cast<const char*>(std::memchr(next_, '\n', available));
+        const char* const stop = newline != nullptr ? newline : end_;
+        const std::size_t room = kMaxLineSize + 1 - line.size();
+        line.append(next_, std::min(room, static_cast<std::size_t>(stop - next_)));
         if (newline != nullptr) {
-            line.append(next_, newline);
             next_ = newline + 1;
             return true;
         }
-        line.append(next_, end_);
         next_ = end_;
     }
     return found_text;

@@ -21,8 +21,10 @@ class QueueReader {
     /// errno changes.
     void RequireOpen(LogSite site) const;
 
-    /// Reads the next line without its "\n", which the last line need not have. False at the end
-    /// of the file. Throws Error 502 when reading fails: that must not pass for an end.
+    /// Reads the next line without its "\n", which the last line need not have. Of a line beyond
+    /// kMaxLineSize only the beginning is returned, so much that it is beyond the limit still.
+    /// False at the end of the file. Throws Error 502 when reading fails: that must not pass for
+    /// an end.
     bool ReadLine(std::string& line);
 
   private:

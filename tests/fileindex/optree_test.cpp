@@ -48,6 +48,10 @@ TEST(OPTreeTest, FoldsSequences) {
     }
 }
 
+std::shared_ptr<OP> NewOP(const std::shared_ptr<OPNode>& node, const std::string& old = "") {
+    return std::make_shared<OP>(node, OP_NONE, old, Json::Value());
+}
+
 TEST(OPTreeTest, NoDepthOverflowsTheStackAndNothingLeaks) {
     std::string deep;
     for (int i = 0; i < 1000000; ++i) {
@@ -56,14 +60,36 @@ TEST(OPTreeTest, NoDepthOverflowsTheStackAndNothingLeaks) {
     std::shared_ptr<OP> kept;
     std::weak_ptr<OPNode> neighbour;
     {
-        const auto tree = TreeOf({Line(kModify, deep), Line(kRename, "/b", "/a"),
-                                  Line(kReindex, "/b"), Line(kModify, deep)});
+        const auto tree = EmptyTree();
+        const auto node = tree->GetNodeByPath(deep);
+        const auto target = tree->GetNodeByPath("/b");
+        tree->HandleModify(node, NewOP(node));
+        tree->HandleRename(target, NewOP(target, "/a"));
+        tree->HandleReindex(target, NewOP(target));
+        tree->HandleModify(node, NewOP(node));
         EXPECT_EQ(Surviving(*tree).size(), 3U);
         neighbour = tree->GetNodeByPath(deep + "b");
         kept = tree->ops.back();
     }
     EXPECT_EQ(kept->node->GetPath(), deep);
     EXPECT_TRUE(neighbour.expired());
+}
+
+// The fields are public, so a handler believes them more than what it knows of them.
+TEST(OPTreeTest, HandlersSeeOpsThatWereAttachedByHand) {
+    const auto tree = EmptyTree();
+    const auto file = tree->GetNodeByPath("/d/f");
+    const auto directory = tree->GetNodeByPath("/d");
+    const auto pending = std::make_shared<OP>(file, OP_ATTR, "", Json::Value());
+    file->ops.push_back(pending);
+    tree->HandleModify(file, NewOP(file));
+    EXPECT_EQ(pending->op, OP_UPSERT);
+    const auto target = tree->GetNodeByPath("/e");
+    tree->HandleRename(target, NewOP(target, "/d"));
+    EXPECT_EQ(pending->node, tree->GetNodeByPath("/e/f"));
+    pending->op = OP_DELETE;
+    tree->HandleReindex(target, NewOP(target));
+    EXPECT_EQ(pending->op, OP_NONE);
 }
 
 TEST(OPTreeTest, RepeatedRenamesIntoItselfStaySmall) {
@@ -93,20 +119,27 @@ TEST(OPTreeTest, FindsEachChildInDirectoriesOfAnySize) {
 class OPTreeFileTest : public QueueTest {};
 
 TEST_F(OPTreeFileTest, BadLinesAreLoggedAndSkipped) {
-    const std::string huge(10 * 1024 * 1024, 'x');
+    const std::string longest = "/" + std::string(64 * 1024 - 1, 'x');
+    const std::string nul(1, '\0');
+    const std::string good = R"({"event":64,"path":"/f"})";
     std::vector<std::string> bad = {"",
                                     "{",
                                     "[]",
                                     std::string(5000, '['),
-                                    std::string("\0", 1),
+                                    nul,
                                     "{\"event\":64}",
                                     Line(kRename, "/new", ""),
                                     Line(kRename, "/new", "/old/"),
+                                    Line(kRename, "/new", longest + "x"),
                                     R"({"event":-64,"path":"/f"})",
                                     R"({"event":1e400,"path":"/f"})",
                                     R"({"event":64,"path":{"a":1}})",
-                                    R"({"event":64,"path":"/f"} {})"};
-    for (const char* path : {"", "/", "//", "a/b", "/a/", "//a", "/a//b"}) {
+                                    good + " {}",
+                                    good + std::string(1024 * 1024, ' '),
+                                    std::string(1024 * 1024 + 1, '{')};
+    for (const std::string& path : {std::string(), std::string("/"), std::string("//"),
+                                    std::string("a/b"), std::string("/a/"), std::string("//a"),
+                                    std::string("/a//b"), longest + "x", longest + "\t"}) {
         bad.push_back(Line(kCreate, path));
     }
     std::vector<std::string> lines;
@@ -116,11 +149,11 @@ TEST_F(OPTreeFileTest, BadLinesAreLoggedAndSkipped) {
         expected.push_back("[02] /good" + std::to_string(i));
     }
     lines.push_back("{\"event\":64,\"path\":\"/\xff\xfe\"}");
-    lines.push_back(Line(kCreate, "/" + huge));
+    lines.push_back(Line(kCreate, longest) + std::string(900 * 1024, ' '));
     for (const char* data : {"1", "\"text\"", "[]", "null", R"({"audio":true,"photo":1})"}) {
         lines.push_back(Line(kUpdateCfg, "/cfg", "", false, data));
     }
-    expected.insert(expected.end(), {"[02] /\xff\xfe", "[02] /" + huge,
+    expected.insert(expected.end(), {"[02] /\xff\xfe", "[02] " + longest,
                                      R"([04] /cfg, data={"audio":true,"document":false,)"
                                      R"("photo":false,"video":false})"});
     Write(queue_, lines);
@@ -136,12 +169,48 @@ TEST_F(OPTreeFileTest, BadLinesAreLoggedAndSkipped) {
     EXPECT_TRUE(line[0].ends_with(", reason=Malformed event_raw: {")) << line[0];
 }
 
-TEST_F(OPTreeFileTest, ACrashMarkerReplacesEverythingAndAnUnreadableQueueIsNoEmptyOne) {
-    EXPECT_EQ(ErrorOf([&] { OPTree tree(queue_); }).first, 502);
-    Write(queue_, {Line(kCreate, "/a"), Line(EVENT_QUEUE_CRASH, "/b"), Line(kCreate, "/c")});
+TEST_F(OPTreeFileTest, ALineBeyondTheLimitCostsLittle) {
+    Write(queue_, {std::string(100 * 1024 * 1024, 'x'),
+                   Line(kCreate, "/" + std::string(40 * 1024 * 1024, '/')), Line(kCreate, "/f")});
     OPTree tree(queue_);
-    EXPECT_EQ(Surviving(tree), Ops{"[07] "});
-    EXPECT_EQ(tree.ProcessOP([](auto) {}), 1);
+    EXPECT_EQ(Surviving(tree), Ops{"[02] /f"});
+    for (const std::string& line : fake::LogLinesWith("")) {
+        EXPECT_LT(line.size(), 10000U) << line.substr(0, 100);
+    }
+}
+
+TEST_F(OPTreeFileTest, ACrashMarkerReplacesEverythingAndAnUnreadableQueueIsNotAnEmptyOne) {
+    EXPECT_EQ(ErrorOf([&] { OPTree tree(queue_); }).first, 502);
+    const std::vector<std::string> markers = {
+        Line(EVENT_QUEUE_CRASH, "/b"),
+        Line(EVENT_QUEUE_CRASH | kCreate, "/b"),
+        Line(EVENT_QUEUE_CRASH, ""),
+        Line(EVENT_QUEUE_CRASH, "no path"),
+        Line(EVENT_QUEUE_CRASH, "/" + std::string(70000, 'x')),
+        Line(EVENT_QUEUE_CRASH | kRename, "/b", "old/"),
+        R"({"event":512})",
+        R"({"event":512,"path":[]})",
+    };
+    for (const std::string& marker : markers) {
+        Write(queue_, {Line(kCreate, "/a"), marker, Line(kCreate, "/c")});
+        OPTree tree(queue_);
+        EXPECT_EQ(Surviving(tree), Ops{"[07] "}) << marker;
+        EXPECT_EQ(tree.ProcessOP([](auto) {}), 1);
+    }
+    // What cannot be read does not count, nor does what the line before it has said.
+    Write(queue_, {Line(kCreate, "/a"), R"({"event":512,"path":"/b")", "512"});
+    OPTree tree(queue_);
+    EXPECT_EQ(Surviving(tree), Ops{"[02] /a"});
+}
+
+TEST_F(OPTreeFileTest, OnlyARenameHasAnOldPath) {
+    Write(queue_, {Line(kCreate | kRename, "/f", "bad"), Line(kCreate, "/g", "bad"),
+                   Line(kCreate | kRename, "/h", "/old"), Line(kRename | kReindex, "/r", "/old")});
+    OPTree tree(queue_);
+    EXPECT_EQ(Surviving(tree), (Ops{"[02] /f", "[02] /g", "[05] /old -> /h", "[06] /r"}));
+    tree.ProcessOP([](const std::shared_ptr<OP>& op) {
+        EXPECT_EQ(op->path, op->op == OP_RENAME ? "/old" : "");
+    });
 }
 
 }  // namespace
