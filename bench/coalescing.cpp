@@ -213,6 +213,19 @@ const Loop kLoops[] = {
      Nothing},
 };
 
+/// The first needs a change in the directory between any two renames of it, the second no file
+/// system allows.
+const Loop kHardLoops[] = {
+    {"a directory to and fro, a file written to",
+     [](Lines& lines, std::size_t) {
+         lines.insert(lines.end(), {Moved("/v/d", "/v/e"), Line(0x2, "/v/e/0"),
+                                    Moved("/v/e", "/v/d"), Line(0x2, "/v/d/0")});
+     },
+     HalfInD},
+    {"a directory into its own subtree",
+     [](Lines& lines, std::size_t) { lines.push_back(Moved("/v/d", "/v/d/d")); }, Nothing},
+};
+
 /// Processor time: all work is done by this thread, and other processes must not count.
 double Seconds(const std::function<void()>& work) {
     const std::clock_t start = std::clock();
@@ -327,6 +340,10 @@ int main(int argc, char** argv) {
     std::printf("\nloops: ratio below 4 and exponent at most 1.1 wanted\n");
     for (const Loop& loop : kLoops) {
         ReportLoop(loop, count);
+    }
+    std::printf("\nloops that are not linear, over a hundredth of the lines\n");
+    for (const Loop& loop : kHardLoops) {
+        ReportLoop(loop, count / 100);
     }
     return 0;
 }

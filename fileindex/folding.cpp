@@ -10,71 +10,12 @@
 #include "fileindex/node_extra.h"
 #include "fileindex/optree.h"
 #include "fileindex/pending_below.h"
+#include "fileindex/subtree_move.h"
 
 namespace quivra::fileindex {
-namespace {
 
 using NodePtr = std::shared_ptr<OPNode>;
 using OPPtr = std::shared_ptr<OP>;
-
-bool IsAtOrBelow(const OPNode* node, const OPNode& top) {
-    while (node != nullptr && node != &top) {
-        node = node->parent.get();
-    }
-    return node != nullptr;
-}
-
-/// A subtree, parents before children, and where its nodes' ops go.
-class Move {
-  public:
-    Move(OPNode& from, OPNode& to) : places_{{&from, 0, &to}} {}
-
-    void Add(OPNode& node, std::size_t parent) { places_.push_back({&node, parent, nullptr}); }
-    std::size_t Size() const { return places_.size(); }
-    OPNode& From(std::size_t i) const { return *places_[i].from; }
-
-    /// Creates the node, and those above it, only when it is asked for: a copy of every node would
-    /// let a few hostile renames of a directory into itself double the tree again and again.
-    OPNode& To(std::size_t i) {
-        std::vector<std::size_t> missing;  // no recursion: a path may be deep
-        for (; places_[i].to == nullptr; i = places_[i].parent) {
-            missing.push_back(i);
-        }
-        OPNode* to = places_[i].to;
-        for (; !missing.empty(); missing.pop_back()) {
-            to = to->GetChild(places_[missing.back()].from->name).get();
-            places_[missing.back()].to = to;
-        }
-        return *to;
-    }
-
-  private:
-    struct Place {
-        OPNode* from;
-        std::size_t parent;
-        OPNode* to;
-    };
-    std::vector<Place> places_;
-};
-
-/// Adds what `children` returns for each node, at any depth.
-template <typename Children>
-void AddDescendants(Move& move, const Children& children) {
-    std::vector<std::pair<OPNode*, std::size_t>> pending;  // with the parent's place
-    for (std::size_t parent = 0;; parent = move.Size() - 1) {
-        const auto nodes = children(move.From(parent));
-        for (auto node = nodes.rbegin(); node != nodes.rend(); ++node) {
-            pending.push_back({&**node, parent});
-        }
-        if (pending.empty()) {
-            return;
-        }
-        move.Add(*pending.back().first, pending.back().second);
-        pending.pop_back();
-    }
-}
-
-}  // namespace
 
 void OPTree::HandleCreate(const NodePtr& node, const OPPtr& op) {
     TakeStock(*node, *op);
@@ -121,6 +62,7 @@ void OPTree::HandleRename(const NodePtr& node, const OPPtr& op) {
 }
 
 void OPTree::Fold(const NodePtr& node, const OPPtr& op, FileIndexOP kind, Incoming incoming) {
+    ForgetLoadsAbove(*node);
     SetKind(*op, kind);
     LiveOps live(*node);
     if (live.Coalesce(*op, incoming)) {
@@ -134,13 +76,13 @@ void OPTree::Fold(const NodePtr& node, const OPPtr& op, FileIndexOP kind, Incomi
 }
 
 void OPTree::Reindex(const NodePtr& node, const OPPtr& op) {
+    ForgetLoadsNear(*node);
     Fold(node, op, OP_REINDEX, Incoming::kReindex);
     std::vector<OPNode*> pending{node.get()};
     while (!pending.empty()) {
         OPNode& top = *pending.back();
         pending.pop_back();
-        for (OPNode* child :
-             PendingBelow::Take(top, PendingBelow::kCancelled, PendingBelow::kBoth)) {
+        for (OPNode* child : PendingBelow::TakeCancelled(top)) {
             LiveOps(*child).CancelAll();
             pending.push_back(child);
         }
@@ -148,14 +90,17 @@ void OPTree::Reindex(const NodePtr& node, const OPPtr& op) {
 }
 
 void OPTree::Rename(const NodePtr& node, const OPPtr& op, const NodePtr& old_node) {
+    ForgetLoadsAbove(*node);
+    ForgetLoadsAbove(*old_node);
     SetKind(*op, OP_RENAME);
     // What was at the new place is replaced.
     LiveOps(*node).Cancel({OP_DELETE, OP_UPSERT, OP_ATTR});
     const FileIndexOP work = LiveOps(*old_node).Cancel({OP_UPSERT, OP_ATTR, OP_REINDEX});
     MoveAllOPs(*old_node, node);
+    // For this rename and those that came along; before the walk, which may meet the node.
+    PendingBelow::Mark(*node, PendingBelow::kMoved);
     MoveOPsBelow(old_node, node, *op);
     Attach(node, op);
-    PendingBelow::Mark(*node, PendingBelow::kMoved);
     if (work != OP_NONE) {
         const OPPtr again = std::make_shared<OP>(node, work, std::string(), Json::Value());
         Attach(node, again);
@@ -233,30 +178,46 @@ void OPTree::MoveAllOPs(OPNode& from, const NodePtr& to) {
 }
 
 void OPTree::MoveOPsBelow(const NodePtr& old_top, const NodePtr& new_top, const OP& rename) {
-    Move move(*old_top, *new_top);
-    const bool overlap = old_top != new_top && (IsAtOrBelow(old_top.get(), *new_top) ||
-                                                IsAtOrBelow(new_top.get(), *old_top));
-    if (overlap) {
+    if (!HasMovingBelow(*old_top) || MoveLoad(*old_top, *new_top)) {
+        return;
+    }
+    std::vector<OPNode*> homes = HomesOfLoad(*old_top);
+    ForgetLoadsNear(*old_top);
+    ForgetLoadsNear(*new_top);
+    SubtreeMove move(*old_top, *new_top);
+    if (old_top != new_top && IsRelated(*old_top, *new_top)) {
         // An op may move several times then, from node to node of the subtree. No file system
         // renames a directory into itself, so that it may take its time.
-        AddDescendants(move, [](const OPNode& node) { return node.children; });
-    } else {
-        AddDescendants(move, [](OPNode& node) {
-            return PendingBelow::Take(node, PendingBelow::kBoth, PendingBelow::kMoved);
-        });
+        AddDescendants(
+            move, [](const OPNode& node) -> const auto& { return node.children; });
+        MoveOPs(move, &rename);
+        return;
     }
+    const bool alone = old_top == new_top || !PendingBelow::HasMoving(*new_top);
+    AddDescendants(move, PendingBelow::TakeMoving);
+    if (MoveOPs(move, &rename) && alone && building_) {
+        homes.push_back(old_top.get());
+        homes.push_back(new_top.get());
+        AddLoad(*new_top, std::move(homes));
+    }
+}
+
+bool OPTree::MoveOPs(SubtreeMove& move, const OP* rename) {
+    bool moved = false;
     for (std::size_t i = 1; i < move.Size(); ++i) {
         OPNode& from = move.From(i);
         std::vector<OPPtr> moving = DetachMoving(from, rename);
         if (!moving.empty()) {
             AttachMoved(moving, from, move.To(i));
+            moved = true;
         }
     }
+    return moved;
 }
 
 /// Takes those ops off a node that follow the rename of an ancestor. Cancelled ops and deletes
 /// stay.
-std::vector<OPPtr> OPTree::DetachMoving(OPNode& node, const OP& rename) {
+std::vector<OPPtr> OPTree::DetachMoving(OPNode& node, const OP* rename) {
     Consolidate(node);
     while (node.dead_ < node.ops.size() && node.ops[node.dead_]->op == OP_NONE) {
         ++node.dead_;
@@ -264,7 +225,7 @@ std::vector<OPPtr> OPTree::DetachMoving(OPNode& node, const OP& rename) {
     std::vector<OPPtr> moving;
     auto kept = node.ops.begin() + node.dead_;
     for (auto op = kept; op != node.ops.end(); ++op) {
-        if (LiveOps::KindOf(**op) >= OP_UPSERT && op->get() != &rename) {
+        if (LiveOps::KindOf(**op) >= OP_UPSERT && op->get() != rename) {
             moving.push_back(std::move(*op));
         } else {
             if (kept != op) {

@@ -8,6 +8,7 @@
 #include "common/error.h"
 #include "common/log.h"
 #include "fileindex/coalescing.h"
+#include "fileindex/node_extra.h"
 #include "fileindex/queue_line.h"
 #include "fileindex/queue_reader.h"
 
@@ -42,12 +43,16 @@ OPTree::OPTree(const std::string& path) : OPTree(Empty(), path) {
 OPTree::~OPTree() {
     ops.clear();
     std::vector<NodePtr> pending{std::move(root)};
+    if (limbo_ != nullptr) {
+        pending.push_back(std::move(limbo_));
+    }
     while (!pending.empty()) {
         const NodePtr node = std::move(pending.back());
         pending.pop_back();
         std::move(node->children.begin(), node->children.end(), std::back_inserter(pending));
         node->children.clear();
         node->ops.clear();
+        node->extra_.reset();  // it may hold ops, when reading failed
     }
 }
 
@@ -55,13 +60,24 @@ void OPTree::BuildTree() {
     QueueReader reader(queue_path);
     reader.RequireOpen({"optree", 190});
     building_ = true;
-    std::vector<QueueLine> lines;
-    while (ReadAhead(reader, lines)) {
-        LookAhead(lines);
-        for (QueueLine& line : lines) {
-            Insert(line);
+    try {
+        std::vector<QueueLine> lines;
+        while (ReadAhead(reader, lines)) {
+            LookAhead(lines);
+            for (QueueLine& line : lines) {
+                Insert(line);
+            }
         }
+    } catch (const Error&) {
+        FinishBuilding();
+        throw;
     }
+    FinishBuilding();
+}
+
+void OPTree::FinishBuilding() {
+    SettleLoads();
+    loads_.clear();
     building_ = false;
     Settle();
 }

@@ -16,6 +16,7 @@
 namespace quivra::fileindex {
 
 enum class Incoming;
+class SubtreeMove;
 class QueueReader;
 struct QueueLine;
 
@@ -98,6 +99,7 @@ class QUIVRA_EXPORT OPTree {
 
     /// Reads some lines ahead of their insertion. False at the end of the queue.
     bool ReadAhead(QueueReader& reader, std::vector<QueueLine>& lines);
+    void FinishBuilding();
     void Insert(QueueLine& line);
     void Insert(const Event& event);
     void Dispatch(const Event& event, const NodePtr& node, const OPPtr& op);
@@ -119,9 +121,31 @@ class QUIVRA_EXPORT OPTree {
     static void MarkPending(OPNode& node);
     void MoveAllOPs(OPNode& from, const NodePtr& to);
     void MoveOPsBelow(const NodePtr& old_top, const NodePtr& new_top, const OP& rename);
-    static std::vector<OPPtr> DetachMoving(OPNode& node, const OP& rename);
+    /// Whether there was something to move.
+    bool MoveOPs(SubtreeMove& move, const OP* rename);
+    static std::vector<OPPtr> DetachMoving(OPNode& node, const OP* rename);
     void AttachMoved(std::vector<OPPtr>& moved, OPNode& from, OPNode& to);
     static void Consolidate(OPNode& node);
+
+    /// What the last renames have moved below a directory, and nothing has come near since. When
+    /// it is renamed again to where all these nodes exist, only `place` changes: a directory that
+    /// goes to and fro over a million pending files must not move a million ops each time.
+    struct Load {
+        OPNode* stored;              ///< the ops are below here,
+        OPNode* place;               ///< but belong below here;
+        std::vector<OPNode*> homes;  ///< and they have been below these
+    };
+    bool MoveLoad(const OPNode& from, OPNode& to);
+    /// Whether the rename of a directory can have anything to move below it.
+    bool HasMovingBelow(const OPNode& top) const;
+    std::vector<OPNode*> HomesOfLoad(const OPNode& place) const;
+    void AddLoad(OPNode& place, std::vector<OPNode*> homes);
+    /// Forget the loads in which the node lies; the loads that it is part of, or that lie in it.
+    void ForgetLoadsAbove(const OPNode& node);
+    void ForgetLoadsNear(const OPNode& node);
+    template <typename Touched>
+    void ForgetLoads(const Touched& touched);
+    void SettleLoads();
 
     /// Brings the public fields up to date that a cheap step has left behind.
     void Settle();
@@ -133,6 +157,8 @@ class QUIVRA_EXPORT OPTree {
     std::size_t consumed_ = 0;
     OPPtr unused_op_;
     bool building_ = false;       ///< nobody can look at the fields before the last line is in
+    std::vector<Load> loads_;     ///< few, the oldest first; none when somebody can look
+    NodePtr limbo_;               ///< below it loads wait while they change places
     std::vector<OPNode*> stale_;  ///< what Settle has to do
     /// Directories that were looked up lately: queues name many files of few of them.
     std::unordered_map<std::string, NodePtr, PathHash, std::equal_to<>> directories_;

@@ -27,6 +27,19 @@ void PendingBelow::Mark(OPNode& node, Behaviour behaviour) {
     }
 }
 
+std::vector<OPNode*> PendingBelow::TakeCancelled(OPNode& node) {
+    return Take(node, kCancelled, kBoth);
+}
+
+std::vector<OPNode*> PendingBelow::TakeMoving(OPNode& node) {
+    return Take(node, kBoth, kMoved);
+}
+
+bool PendingBelow::HasMoving(const OPNode& node) {
+    return node.extra_ != nullptr &&
+           !(node.extra_->pending[kBoth].empty() && node.extra_->pending[kMoved].empty());
+}
+
 std::vector<OPNode*> PendingBelow::Take(OPNode& node, Behaviour first, Behaviour second) {
     std::vector<OPNode*> taken;
     if (node.extra_ == nullptr) {

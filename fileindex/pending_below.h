@@ -26,7 +26,14 @@ class PendingBelow {
     /// Lists the node at its parent, the parent at its own and so on, as far as they are not.
     static void Mark(OPNode& node, Behaviour behaviour);
 
-    /// The listed children, in the order of their creation; they are not listed any more.
+    /// The children listed for what a reindex cancels, in the order of their creation; they are
+    /// not listed any more.
+    static std::vector<OPNode*> TakeCancelled(OPNode& node);
+    /// The same for what a rename moves.
+    static std::vector<OPNode*> TakeMoving(OPNode& node);
+    static bool HasMoving(const OPNode& node);
+
+  private:
     static std::vector<OPNode*> Take(OPNode& node, Behaviour first, Behaviour second);
 };
 

@@ -286,7 +286,7 @@ TEST_F(OPTreeModelTest, AgreesOnRandomSequencesAndLoops) {
     const std::vector<Step> alphabets[] = {StepsOver(few, false), StepsOver(many, false),
                                            StepsOver(few, true)};
     std::mt19937 random(Seed());
-    for (unsigned int run = 0; run < kRandomRuns; ++run) {
+    for (unsigned int run = 0; run < kRandomRuns / 2; ++run) {
         const std::vector<Step>& steps = alphabets[run % 3];
         const auto some = [&](std::size_t count) {
             std::vector<const Step*> chosen(count);

@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include <ctime>
+
 #include "common/log.h"
 #include "tests/fileindex/queue_support.h"
 
@@ -177,6 +179,69 @@ TEST_F(OPTreeFileTest, ALineBeyondTheLimitCostsLittle) {
     for (const std::string& line : fake::LogLinesWith("")) {
         EXPECT_LT(line.size(), 10000U) << line.substr(0, 100);
     }
+}
+
+/// Processor time: other processes must not count.
+double Seconds(const std::function<void()>& work) {
+    const std::clock_t start = std::clock();
+    work();
+    return static_cast<double>(std::clock() - start) / CLOCKS_PER_SEC;
+}
+
+// A step that walks what earlier lines have left takes hundreds of times as long as the parse here.
+TEST_F(OPTreeFileTest, WhatIsDoneOverAndOverTakesLinearTime) {
+    constexpr std::size_t kFiles = 20000;
+    const bool dir = true;
+    std::vector<std::string> files;
+    std::vector<std::string> gone;
+    for (std::size_t i = 0; i < kFiles; ++i) {
+        files.push_back(Line(kCreate, "/d/" + std::to_string(i)));
+        gone.insert(gone.end(), {files.back(), Line(kDelete, "/d/" + std::to_string(i))});
+    }
+    const struct {
+        const char* name;
+        std::vector<std::string> begin;
+        std::vector<std::string> loop;
+    } rows[] = {
+        {"rmdir, mkdir", gone, {Line(kDelete, "/d", "", dir), Line(kCreate, "/d", "", dir)}},
+        {"one file, reindex above many", gone, {Line(kCreate, "/d/f"), Line(kReindex, "/d")}},
+        {"swap of two names",
+         {},
+         {Line(kRename, "/t", "/a"), Line(kRename, "/a", "/b"), Line(kRename, "/b", "/t")}},
+        {"to and fro, written to",
+         {},
+         {Line(kModify, "/a"), Line(kRename, "/a", "/b"), Line(kModify, "/b"),
+          Line(kRename, "/b", "/a")}},
+        {"directory to and fro", files, {Line(kRename, "/e", "/d"), Line(kRename, "/d", "/e")}},
+        {"directory swapped",
+         files,
+         {Line(kRename, "/t", "/d"), Line(kRename, "/d", "/e"), Line(kRename, "/e", "/t")}},
+        {"directory onto itself", files, {Line(kRename, "/d", "/d")}},
+        {"piles of settings",
+         {},
+         {Line(kUpdateCfg, "/a", "", false, "{}"), Line(kRename, "/b", "/a"),
+          Line(kUpdateCfg, "/b", "", false, "{}")}},
+        {"piles of upserts",
+         {},
+         {Line(kCreate, "/d/f"), Line(kRename, "/e", "/d"), Line(kDelete, "/e/f"),
+          Line(kCreate, "/e/f")}},
+    };
+    log_level = 0;
+    for (const auto& row : rows) {
+        std::vector<std::string> lines = row.begin;
+        while (lines.size() < 3 * kFiles) {
+            lines.insert(lines.end(), row.loop.begin(), row.loop.end());
+        }
+        Write(queue_, lines);
+        const double parse = Seconds([&] {
+            for (const std::string& line : lines) {
+                Json::Value json;
+                fromString(json, line);
+            }
+        });
+        EXPECT_LT(Seconds([&] { OPTree tree(queue_); }), 20 * parse) << row.name;
+    }
+    log_level = kLogLevelDebug;
 }
 
 TEST_F(OPTreeFileTest, ACrashMarkerReplacesEverythingAndAnUnreadableQueueIsNotAnEmptyOne) {
