@@ -224,18 +224,22 @@ void Catalog::CheckIsThere(std::unique_lock<std::mutex>& lock, const std::string
     if (entry.path != path) {
         throw Error(kIndexExists, "The index has another path: " + entry.path);
     }
-    Use(id);  // busy?
+    const std::uint64_t generation = Use(id)->Generation();
     if (!entry.move && !IsIndexDirectory(path, entry.uuid)) {
         lock.unlock();
-        MakeAnew(id, path + " is gone");
+        MakeAnew(id, path + " is gone", generation);
     }
 }
 
-void Catalog::MakeAnew(const std::string& id, const std::string& why) {
+void Catalog::MakeAnew(const std::string& id, const std::string& why, std::uint64_t generation) {
     std::unique_lock lock(mutex_);
     const std::shared_ptr<Index> index = Use(id);
+    if (index->Generation() != generation) {
+        return;
+    }
     if (!index->BeginMove()) {
-        throw Error(kBusy, "The index is being moved: " + id);
+        lock.unlock();
+        return index->AwaitMove();
     }
     const IndexEntry entry = registry_.entries.at(id);
     lock.unlock();
@@ -301,15 +305,18 @@ Json::Value Catalog::GetState(const std::string& id) {
     json["id"] = id;
     json["problem"] = "";
     for (int attempt = 0; attempt < 2; ++attempt) {
+        std::uint64_t generation = 0;
         try {
-            const engine::State state = Find(id)->GetState();
+            const std::shared_ptr<Index> index = Find(id);
+            generation = index->Generation();
+            const engine::State state = index->GetState();
             json["documents"] = Json::UInt64{state.documents};
             json["bytes"] = Json::UInt64{state.bytes};
             json["reclaimable"] = Json::UInt64{state.reclaimable};
             break;
         } catch (const engine::Damaged& damage) {
             try {
-                MakeAnew(id, damage.reason);
+                MakeAnew(id, damage.reason, generation);
             } catch (const Error& error) {
                 json["problem"] = error.reason;
                 break;

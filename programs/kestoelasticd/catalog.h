@@ -37,8 +37,10 @@ class Catalog {
     void Accept(const std::string& id);
 
     /// Sets aside what is left of an index that was found damaged or missing, and makes it anew,
-    /// empty and fresh. Throws Error 1401 while it is being moved, 1413 where its place is missing.
-    void MakeAnew(const std::string& id, const std::string& why);
+    /// empty and fresh. Does nothing when that, or a move, has happened since the `generation` that
+    /// the damage was found in: several clients may meet it at once. Throws Error 1401 when it is
+    /// being moved for long, 1413 where its place is missing.
+    void MakeAnew(const std::string& id, const std::string& why, std::uint64_t generation);
     /// How each index is; opens those that are not in use. One that is damaged is made anew.
     Json::Value GetStates();
     /// Gives space back where nothing happens.

@@ -55,15 +55,21 @@ Index::Index(Place place, std::shared_ptr<const engine::Schema> schema, bool pau
       place_(std::move(place)),
       paused_(paused) {}
 
-std::shared_lock<std::shared_mutex> Index::Use() {
-    std::shared_lock lock(use_, std::defer_lock);
-    if (!moving_) {
-        lock.lock();
-    }
-    if (moving_) {
+void Index::AwaitMove() {
+    std::unique_lock lock(move_mutex_);
+    if (!moved_.wait_for(lock, kMovePatience, [&] { return !moving_; })) {
         throw Error(kBusy, "The index is being moved");
     }
-    return lock;
+}
+
+std::shared_lock<std::shared_mutex> Index::Use() {
+    while (true) {
+        AwaitMove();
+        std::shared_lock lock(use_);
+        if (!moving_) {  // the next move may have begun before the lock was taken
+            return lock;
+        }
+    }
 }
 
 std::unique_ptr<engine::Index> Index::Open(quivra::base::PrivateDirectory& directory) const {
@@ -305,9 +311,14 @@ void Index::CloseFiles() {
 }
 
 void Index::EndMove(std::string path) {
-    const std::unique_lock lock(use_);
-    place_.path = std::move(path);
+    {
+        const std::unique_lock lock(use_);
+        place_.path = std::move(path);
+        ++generation_;
+    }
+    const std::lock_guard lock(move_mutex_);
     moving_ = false;
+    moved_.notify_all();
 }
 
 }  // namespace elasticd

@@ -4,6 +4,8 @@
 
 #include <atomic>
 #include <chrono>
+#include <condition_variable>
+#include <cstdint>
 #include <functional>
 #include <memory>
 #include <mutex>
@@ -36,10 +38,14 @@ class Index {
     Index(Place place, std::shared_ptr<const engine::Schema> schema, bool paused, bool fresh,
           std::uint64_t min_free);
 
-    /// Each throws Error 1401 while the index is being moved, 1413 when its place is missing, and
-    /// engine::Damaged when what is there is not the index any more: it is to be made anew. Those
-    /// that change also throw 1407 while paused, 1417 while fresh; all but deletes and commits 1412
-    /// without space.
+    /// The library's clients sleep for a quarter of an hour after a 1401, and nearly all moves take
+    /// moments.
+    static constexpr std::chrono::seconds kMovePatience{30};
+
+    /// Each throws Error 1401 when the index is being moved for so long, 1413 when its place is
+    /// missing, and engine::Damaged when what is there is not the index any more: it is to be made
+    /// anew. Those that change also throw 1407 while paused, 1417 while fresh; all but deletes and
+    /// commits 1412 without space.
     void Upsert(const std::string& id, const Json::Value& data);
     void Set(const std::string& id, const Json::Value& changes);
     void Delete(const std::string& id);
@@ -57,9 +63,13 @@ class Index {
     /// Gives space back, in short steps, when nothing has changed for a while.
     void Maintain();
 
-    /// From now on, everybody is told to come back later. False when that is so already.
+    /// From now on, everybody waits for EndMove. False when that is so already.
     bool BeginMove() { return !moving_.exchange(true); }
     bool IsMoving() const { return moving_; }
+    /// Waits for the end of a move. Throws Error 1401 when that takes longer than kMovePatience.
+    void AwaitMove();
+    /// How many moves, or makings anew, have ended: tells which files a failure was about.
+    std::uint64_t Generation() const { return generation_; }
     /// After BeginMove: waits for those who still use the index, commits the batch and closes all
     /// files. A batch that cannot be committed is lost, and the next commit will say so.
     void CommitAndClose();
@@ -85,6 +95,9 @@ class Index {
     const std::shared_ptr<const engine::Schema> schema_;
     const std::uint64_t min_free_;
     std::atomic<bool> moving_ = false;
+    std::atomic<std::uint64_t> generation_ = 0;
+    std::mutex move_mutex_;
+    std::condition_variable moved_;  ///< moving_ has become false
     std::atomic<bool> want_paused_;
     std::atomic<bool> fresh_;
 

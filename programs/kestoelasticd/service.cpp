@@ -180,11 +180,12 @@ std::string Service::RunCommand(const Json::Value& request, bool in_compound) {
 /// An index that turns out to be damaged or missing is made anew. Then a change is refused, because
 /// it is fresh, and a query finds nothing.
 void Service::UseIndex(const std::string& id, const std::function<void(Index&)>& use) {
+    const std::shared_ptr<Index> index = catalog_.Find(id);
+    const std::uint64_t generation = index->Generation();
     try {
-        use(*catalog_.Find(id));
-        return;
+        return use(*index);
     } catch (const engine::Damaged& damage) {
-        catalog_.MakeAnew(id, damage.reason);
+        catalog_.MakeAnew(id, damage.reason, generation);
     }
     use(*catalog_.Find(id));
 }
