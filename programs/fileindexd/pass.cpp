@@ -82,7 +82,7 @@ PassResult Pass::Run() {
 
 void Pass::CarryOut(const ShareTree& tree, const std::vector<std::shared_ptr<OP>>& ops) {
     batch_ = std::make_unique<Batch>(index_, tree, scope_, listener_);
-    settler_ = std::make_unique<Settler>(*batch_, index_, tree, scope_);
+    settler_ = std::make_unique<Settler>(*batch_, index_, scope_);
     steps_ = share_.backlog.Steps(copy_);
     Sort(ops);
     RunRenames(tree);

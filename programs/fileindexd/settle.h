@@ -15,8 +15,8 @@ bool IsCurrent(const Attributes& indexed, const Attributes& there);
 /// so commit first what should be taken into account.
 class Settler {
   public:
-    Settler(Batch& batch, Index& index, const ShareTree& tree, const Scope& scope)
-        : batch_(batch), index_(index), tree_(tree), scope_(scope) {}
+    Settler(Batch& batch, Index& index, const Scope& scope)
+        : batch_(batch), index_(index), scope_(scope) {}
 
     enum class Found {
         kNothing,    ///< its documents were dropped, with all below it
@@ -37,7 +37,6 @@ class Settler {
 
     Batch& batch_;
     Index& index_;
-    const ShareTree& tree_;
     const Scope& scope_;
 };
 
