@@ -6,7 +6,7 @@
 #include <cerrno>
 #include <cstdarg>
 #include <cstdio>
-#include <system_error>
+#include <cstring>
 
 #include "base/text.h"
 
@@ -68,8 +68,9 @@ void Fail(LogSite site, const char* condition, const Error& error) {
 }
 
 std::string SystemErrorText(int error_number) {
-    // strerror is not safe for threads, and strerror_r exists in two kinds.
-    return std::generic_category().message(error_number);
+    // Unlike strerror, safe for threads, and the same in every locale.
+    const char* const text = strerrordesc_np(error_number);
+    return text != nullptr ? text : "Unknown error " + std::to_string(error_number);
 }
 
 }  // namespace quivra

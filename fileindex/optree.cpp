@@ -122,8 +122,10 @@ void OPTree::LookAhead(const std::vector<QueueLine>& lines) {
         }
         if (const NodePtr* directory = FindDirectory(path.substr(0, slash))) {
             nodes[i] = (*directory)->GuessChild(path.substr(slash + 1));
-            __builtin_prefetch(nodes[i]);
-            __builtin_prefetch(reinterpret_cast<const char*>(nodes[i]) + 64);
+            if (nodes[i] != nullptr) {
+                __builtin_prefetch(nodes[i]);
+                __builtin_prefetch(reinterpret_cast<const char*>(nodes[i]) + 64);
+            }
         }
     }
     for (const OPNode* node : nodes) {
