@@ -9,8 +9,8 @@ namespace quivra::fileindex {
 
 /// A longer line, and a line with a longer path, is a bad line. No file system gives such a path;
 /// what a line may cost in time and memory has to end somewhere.
-inline constexpr std::size_t kMaxLineSize = 1024 * 1024;
-inline constexpr std::size_t kMaxPathSize = 64 * 1024;
+inline constexpr std::size_t kMaxLineSize = std::size_t{1} << 20;
+inline constexpr std::size_t kMaxPathSize = std::size_t{64} << 10;
 
 /// Parses a line in the way of monitors: an object of known members of their usual types, within
 /// the limits. False for everything else, and `event` is unspecified then.

@@ -133,12 +133,12 @@ class PassTest : public testing::Test {
     PassResult RunPass(PassListener listener = {}) {
         Pass pass({directory_, directory_.Path() + "/queue", Root(), *backlog_, files_time_},
                   *index_, scope_, std::move(listener));
-        const PassResult result = pass.Run();
+        PassResult result = pass.Run();
         catch_up_->Forget(result.left);
         return result;
     }
     /// As short a slice as there is.
-    void RunSlice(PassListener listener = {}, std::int64_t now = time(nullptr),
+    void RunSlice(const PassListener& listener = {}, std::int64_t now = time(nullptr),
                   CatchUp::Clock::time_point until = {}) {
         const ShareTree tree(Root());
         catch_up_->Run({*index_, tree, scope_}, listener, until, now);

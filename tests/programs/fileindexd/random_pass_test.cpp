@@ -23,7 +23,7 @@ extern "C" int sqlite3_step(sqlite3_stmt* statement) {
 
 // The exception passes through sqlite3_exec, which then frees its statement as little as a killed
 // process would.
-extern "C" const char* __lsan_default_suppressions() {
+extern "C" const char* __lsan_default_suppressions() {  // NOLINT(bugprone-reserved-identifier)
     return "leak:libsqlite3";
 }
 
