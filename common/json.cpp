@@ -7,8 +7,9 @@
 #include <sys/stat.h>
 
 #include <cerrno>
+#include <charconv>
 #include <cmath>
-#include <limits>
+#include <string_view>
 #include <vector>
 
 #include "base/file.h"
@@ -34,18 +35,35 @@ class Builder {
 
     bool Null() { return Put(Json::Value()); }
     bool Bool(bool value) { return Put(value); }
-    bool Int(int value) { return Put(value); }
-    // Members come in any order and any number; of equal keys the last counts, as everywhere.
-    bool Int64(std::int64_t value) { return Put(Json::Int64{value}); }
-    bool Uint(unsigned int value) { return Put(Json::Int64{value}); }
-    bool Uint64(std::uint64_t value) {
-        // Signed where it fits, as the values' own reader does: equality looks at the type.
-        return value <= static_cast<std::uint64_t>(std::numeric_limits<Json::Int64>::max())
-                   ? Put(static_cast<Json::Int64>(value))
-                   : Put(Json::UInt64{value});
+    // Numbers come as their text (RawNumber).
+    bool Int(int) { return false; }
+    bool Int64(std::int64_t) { return false; }
+    bool Uint(unsigned int) { return false; }
+    bool Uint64(std::uint64_t) { return false; }
+    bool Double(double) { return false; }
+    bool RawNumber(const char* text, rapidjson::SizeType size, bool) {
+        const std::string_view number(text, size);
+        if (number.find_first_of(".eE") == number.npos) {
+            // Signed where it fits, as the values' own reader does: equality looks at the type.
+            Json::Int64 value = 0;
+            if (std::from_chars(text, text + size, value).ec == std::errc()) {
+                return Put(value);
+            }
+            Json::UInt64 large = 0;
+            if (std::from_chars(text, text + size, large).ec == std::errc()) {
+                return Put(large);
+            }
+        }
+        double value = 0;
+        if (std::from_chars(text, text + size, value).ec == std::errc()) {
+            return Put(value);
+        }
+        // Out of range: what is too small is zero, what is too large is refused.
+        const bool is_small = number.find("e-") != number.npos ||
+                              number.find("E-") != number.npos || number.starts_with("0.") ||
+                              number.starts_with("-0.");
+        return is_small && Put(0.0);
     }
-    bool Double(double value) { return Put(value); }
-    bool RawNumber(const char*, rapidjson::SizeType, bool) { return false; }
     bool String(const char* text, rapidjson::SizeType size, bool) {
         return Put(Json::Value(text, text + size));
     }
@@ -158,9 +176,10 @@ mode_t ModeForReplacement(const std::string& path) {
 }  // namespace
 
 bool fromString(Json::Value& value, const std::string& text) {
-    // Not recursive, so that no text overflows the stack.
+    // Not recursive, so that no text overflows the stack. The parser's own conversion of numbers is
+    // either not exact or not defined for every zero.
     constexpr unsigned int kFlags =
-        rapidjson::kParseIterativeFlag | rapidjson::kParseFullPrecisionFlag;
+        rapidjson::kParseIterativeFlag | rapidjson::kParseNumbersAsStringsFlag;
     value = Json::Value();
     Builder builder(value);
     rapidjson::StringStream stream(text.c_str());
